@@ -1,0 +1,87 @@
+#include "support/clean_test.h"
+
+#include <dirent.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+namespace {
+
+const uid_t startUid = geteuid();
+const gid_t startGid = getegid();
+
+}  // namespace
+
+std::set<int> OpenDescriptors() {
+  std::set<int> result;
+  DIR* dir = opendir("/proc/self/fd");
+  if (dir == nullptr) return result;
+  while (const dirent* entry = readdir(dir)) {
+    const int fd = atoi(entry->d_name);
+    if (entry->d_name[0] != '.' && fd != dirfd(dir)) result.insert(fd);
+  }
+  closedir(dir);
+  return result;
+}
+
+std::vector<std::string> NamesIn(const std::string& dir) {
+  std::set<std::string> names;
+  std::error_code error;
+  for (const auto& entry : std::filesystem::directory_iterator(dir, error)) {
+    names.insert(entry.path().filename().string());
+  }
+  return {names.begin(), names.end()};
+}
+
+std::string ReadText(const std::string& path) {
+  std::ifstream in(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(in), {}};
+}
+
+void WriteText(const std::string& path, const std::string& text) {
+  std::ofstream(path, std::ios::binary) << text;
+}
+
+int RunInChild(const std::function<void()>& body) {
+  fflush(nullptr);
+  const pid_t child = fork();
+  if (child == 0) {
+    body();
+    fflush(nullptr);
+    _exit(testing::Test::HasFailure() ? 99 : 0);
+  }
+  int status = -1;
+  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
+  }
+  return status;
+}
+
+void CleanTest::SetUp() {
+  std::string pattern =
+      (std::filesystem::temp_directory_path() / "kelodrcore-test-XXXXXX").string();
+  ASSERT_NE(mkdtemp(pattern.data()), nullptr);
+  dir = pattern;
+  LogCapture::Clear();
+  descriptorsBefore = OpenDescriptors();
+}
+
+void CleanTest::TearDown() {
+  EXPECT_EQ(OpenDescriptors(), descriptorsBefore) << "descriptors left open or closed";
+  EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1) << "a child was left behind";
+  EXPECT_EQ(errno, ECHILD);
+  EXPECT_EQ(geteuid(), startUid) << "effective uid not restored";
+  EXPECT_EQ(getegid(), startGid) << "effective gid not restored";
+  EXPECT_EQ(LogCapture::Take(), std::vector<LogLine>{}) << "log lines nobody looked at";
+  LogCapture::MirrorTo("");
+  std::error_code error;
+  std::filesystem::remove_all(dir, error);
+}
+
+void CleanTest::ExpectLog(const std::vector<LogLine>& expected) {
+  EXPECT_EQ(LogCapture::Take(), expected);
+}

@@ -1,0 +1,49 @@
+// The fixture of every test: a directory of its own, and a teardown that finds what was left
+// behind.
+
+#ifndef KELODRCORE_TESTS_SUPPORT_CLEAN_TEST_H_
+#define KELODRCORE_TESTS_SUPPORT_CLEAN_TEST_H_
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "support/log_capture.h"
+
+// The descriptors open in this process.
+std::set<int> OpenDescriptors();
+
+// The names in a directory, "." and ".." left out, sorted; empty for a missing one.
+std::vector<std::string> NamesIn(const std::string& dir);
+
+std::string ReadText(const std::string& path);
+void WriteText(const std::string& path, const std::string& text);
+
+// Runs `body` in a forked child and returns its wait status: 0 when it returned and no expectation
+// of it failed. Failed expectations of the child are printed by the child.
+int RunInChild(const std::function<void()>& body);
+
+// Each test has an empty directory and an empty log record. Teardown fails when the test left a
+// descriptor open, a child (running or zombie) behind, other effective ids, or a log line that it
+// did not Take().
+class CleanTest : public testing::Test {
+ protected:
+  void SetUp() override;
+  void TearDown() override;
+
+  // The path of `name` in the test's own directory, which is removed at the end.
+  std::string Path(const std::string& name) const { return dir + "/" + name; }
+
+  // Expects exactly these lines since the last look at the log.
+  static void ExpectLog(const std::vector<LogLine>& expected);
+
+  std::string dir;
+
+ private:
+  std::set<int> descriptorsBefore;
+};
+
+#endif  // KELODRCORE_TESTS_SUPPORT_CLEAN_TEST_H_
