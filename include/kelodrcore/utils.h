@@ -1,0 +1,34 @@
+/// @file
+/// Small helpers: a random back-off, UUIDs, and the test for paths on a data volume.
+
+#ifndef KELODRCORE_UTILS_H_
+#define KELODRCORE_UTILS_H_
+
+#include <string>
+
+#include "kelodrcore/export.h"
+
+namespace KeloDRCore {
+
+/// Sleeps for a random number of milliseconds, drawn uniformly from the closed range [min, max].
+/// Blocks the calling thread; a signal may end the sleep early.
+///
+/// False, at once and with a line at ERR, unless 0 < min < max: equal bounds and a period that
+/// starts at 0 are refused on purpose.
+KELODR_EXPORT bool RandomSleepInMSec(unsigned int min, unsigned int max);
+
+/// A new UUID as "/usr/bin/uuidgen" prints it, without surrounding white space. Empty when the tool
+/// cannot be started (a line at ERR) or prints nothing (no line).
+KELODR_EXPORT std::string GenerateUUID();
+
+/// Tests of texts.
+namespace Validator {
+
+/// True when `path` begins with "/volume". A bare prefix test, deliberately: nothing is normalised
+/// and nothing looked up.
+[[nodiscard]] KELODR_EXPORT bool IsVolPath(const std::string& path);
+
+}  // namespace Validator
+}  // namespace KeloDRCore
+
+#endif  // KELODRCORE_UTILS_H_

@@ -1,0 +1,157 @@
+#include "kelodrcore/sqlite_condition.h"
+
+#include <utility>
+
+#include "log.h"
+
+namespace KeloDRCore {
+namespace {
+
+const char* const kIn = "IN";
+const char* const kNotIn = "NOT IN";
+
+// Every setter builds its text aside before it touches the old one: an operand may be that text.
+
+bool SetComparison(std::string& text, const std::string& lvalue, const char* comparison,
+                   const SqliteValue& value) {
+  if (lvalue.empty() || !value.IsValid()) {
+    KELODR_LOG(ERR, "SetValue", "Bad lvalue[%s] or rvalue[%s]", lvalue.c_str(),
+               value.ToFormatedValue().c_str());
+    return false;
+  }
+  std::string rendered = lvalue + comparison;
+  value.AppendFormatedValue(rendered);
+  text = std::move(rendered);
+  return true;
+}
+
+bool AppendGroup(std::string& text, const std::string& left, const char* keyword,
+                 const std::string& right) {
+  if (left.empty() || right.empty()) {
+    KELODR_LOG(ERR, "SetValue", "Bad lvalue[%s] or rvalue[%s]", left.c_str(), right.c_str());
+    return false;
+  }
+  text += "(" + left + ") " + keyword + " (" + right + ")";
+  return true;
+}
+
+}  // namespace
+
+SqliteCondition::SqliteCondition() = default;
+SqliteCondition::SqliteCondition(const std::string& conditionText) : text(conditionText) {}
+
+bool SqliteCondition::IsValid() const { return !text.empty(); }
+
+SqliteEqual::SqliteEqual() = default;
+SqliteEqual::SqliteEqual(const std::string& lvalue, const SqliteValue& value) {
+  SetValue(lvalue, value);
+}
+
+bool SqliteEqual::SetValue(const std::string& lvalue, const SqliteValue& value) {
+  return SetComparison(text, lvalue, "=", value);
+}
+
+SqliteNotEqual::SqliteNotEqual() = default;
+SqliteNotEqual::SqliteNotEqual(const std::string& lvalue, const SqliteValue& value) {
+  SetValue(lvalue, value);
+}
+
+bool SqliteNotEqual::SetValue(const std::string& lvalue, const SqliteValue& value) {
+  return SetComparison(text, lvalue, "!=", value);
+}
+
+SqliteAnd::SqliteAnd() = default;
+SqliteAnd::SqliteAnd(const std::string& left, const std::string& right) { SetValue(left, right); }
+SqliteAnd::SqliteAnd(const SqliteCondition& left, const SqliteCondition& right)
+    : SqliteAnd(left.GetText(), right.GetText()) {}
+
+bool SqliteAnd::SetValue(const std::string& left, const std::string& right) {
+  return AppendGroup(text, left, "AND", right);
+}
+
+SqliteOr::SqliteOr() = default;
+SqliteOr::SqliteOr(const std::string& left, const std::string& right) { SetValue(left, right); }
+SqliteOr::SqliteOr(const SqliteCondition& left, const SqliteCondition& right)
+    : SqliteOr(left.GetText(), right.GetText()) {}
+
+bool SqliteOr::SetValue(const std::string& left, const std::string& right) {
+  return AppendGroup(text, left, "OR", right);
+}
+
+SqliteIsNull::SqliteIsNull() = default;
+SqliteIsNull::SqliteIsNull(const std::string& lvalue) { SetValue(lvalue); }
+
+bool SqliteIsNull::SetValue(const std::string& lvalue) {
+  if (lvalue.empty()) {
+    KELODR_LOG(ERR, __func__, "Bad lvalue[%s]", lvalue.c_str());
+  } else {
+    text = lvalue + " IS NULL";
+  }
+  return false;
+}
+
+SqliteInFamily::SqliteInFamily(const std::string& listKeyword) : keyword(listKeyword) {}
+SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+                               const std::vector<SqliteValue>& values)
+    : keyword(listKeyword) {
+  SetValue(lvalue, values);
+}
+SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+                               const std::string& value)
+    : keyword(listKeyword) {
+  SetValue(lvalue, value);
+}
+
+bool SqliteInFamily::IsValid() const { return keyword == kIn || keyword == kNotIn; }
+
+bool SqliteInFamily::SetValue(const std::string& lvalue, const std::vector<SqliteValue>& values) {
+  if (!IsValid()) {
+    KELODR_LOG(ERR, __func__, "Bad keyword [%s]", keyword.c_str());
+    return false;
+  }
+  if (lvalue.empty()) {
+    KELODR_LOG(ERR, __func__, "Bad lvalue[%s]", lvalue.c_str());
+    return false;
+  }
+  std::string rendered = lvalue + " " + keyword + " ( ";
+  bool isFirst = true;
+  for (const SqliteValue& value : values) {
+    if (!value.IsValid()) {
+      text.clear();
+      KELODR_LOG(ERR, __func__, "Invalid rvalue [%s]", value.ToFormatedValue().c_str());
+      return false;
+    }
+    if (!isFirst) rendered += ',';
+    isFirst = false;
+    value.AppendFormatedValue(rendered);
+  }
+  text = std::move(rendered += " )");
+  return true;
+}
+
+bool SqliteInFamily::SetValue(const std::string& lvalue, const std::string& value) {
+  if (!IsValid()) {
+    KELODR_LOG(ERR, __func__, "Bad keyword [%s]", keyword.c_str());
+    return false;
+  }
+  if (lvalue.empty() || value.empty()) {
+    KELODR_LOG(ERR, __func__, "Bad lvalue[%s] or value[%s]", lvalue.c_str(), value.c_str());
+    return false;
+  }
+  text = lvalue + " " + keyword + " ( " + value + " )";
+  return true;
+}
+
+SqliteIn::SqliteIn() : SqliteInFamily(kIn) {}
+SqliteIn::SqliteIn(const std::string& lvalue, const std::vector<SqliteValue>& values)
+    : SqliteInFamily(kIn, lvalue, values) {}
+SqliteIn::SqliteIn(const std::string& lvalue, const std::string& value)
+    : SqliteInFamily(kIn, lvalue, value) {}
+
+SqliteNotIn::SqliteNotIn() : SqliteInFamily(kNotIn) {}
+SqliteNotIn::SqliteNotIn(const std::string& lvalue, const std::vector<SqliteValue>& values)
+    : SqliteInFamily(kNotIn, lvalue, values) {}
+SqliteNotIn::SqliteNotIn(const std::string& lvalue, const std::string& value)
+    : SqliteInFamily(kNotIn, lvalue, value) {}
+
+}  // namespace KeloDRCore

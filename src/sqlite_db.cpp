@@ -1,0 +1,390 @@
+#include "kelodrcore/sqlite_db.h"
+
+#include <sqlite3.h>
+
+#include <memory>
+#include <new>
+#include <utility>
+
+#include "kelocore.h"
+#include "kelodrcore/err.h"
+#include "kelodrcore/json_value.h"
+#include "kelodrcore/utils.h"
+#include "log.h"
+
+namespace KeloDRCore {
+namespace {
+
+constexpr int kBusyTimeoutInMSec = 1000;
+
+struct Finalizer {
+  void operator()(sqlite3_stmt* stmt) const { sqlite3_finalize(stmt); }
+};
+using Statement = std::unique_ptr<sqlite3_stmt, Finalizer>;
+
+Statement Prepare(sqlite3* db, const std::string& sql, int& code) {
+  sqlite3_stmt* stmt = nullptr;
+  code = sqlite3_prepare_v2(db, sql.c_str(), -1, &stmt, nullptr);
+  return Statement(stmt);
+}
+
+bool IsBusyOrLocked(int code) { return code == SQLITE_BUSY || code == SQLITE_LOCKED; }
+
+// JsonCpp reports memory that it cannot get as an error of its own.
+template <typename Action>
+auto ThrowOnlyBadAlloc(const Action& action) {
+  try {
+    return action();
+  } catch (const Json::Exception&) {
+    throw std::bad_alloc();
+  }
+}
+
+const char* OrEmpty(const char* text) { return text != nullptr ? text : ""; }
+
+void AddColumn(sqlite3_stmt* stmt, int column, SqliteValueList& record, const char* function) {
+  const char* const name = OrEmpty(sqlite3_column_name(stmt, column));
+  const int type = sqlite3_column_type(stmt, column);
+  switch (type) {
+    case SQLITE_INTEGER:
+      record.AddValue(name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
+      break;
+    case SQLITE_TEXT:
+      record.AddValue(name,
+                      OrEmpty(reinterpret_cast<const char*>(sqlite3_column_text(stmt, column))));
+      break;
+    case SQLITE_NULL:
+      KELODR_LOG(WARN, function, "field [%s] has null value", name);
+      break;
+    default:
+      KELODR_LOG(WARN, function, "Not supported type [%d] with field [%s]", type, name);
+  }
+}
+
+SqliteValueList ParseRecord(sqlite3_stmt* stmt, const char* function) {
+  return ThrowOnlyBadAlloc([&] {
+    SqliteValueList record;
+    const int columns = sqlite3_column_count(stmt);
+    for (int column = 0; column < columns; ++column) AddColumn(stmt, column, record, function);
+    return record;
+  });
+}
+
+}  // namespace
+
+ErrRecorder::ErrRecorder() : errCode(0) {}
+
+Json::Value ErrRecorder::GetErr() const {
+  return ThrowOnlyBadAlloc([this] {
+    Json::Value err;
+    err["err_code"] = errCode;
+    const std::string name = GetErrCodeStr(errCode);
+    if (!name.empty()) err["err_code_str"] = name;
+    if (!errMsg.isNull()) err["err_msg"] = errMsg;
+    return err;
+  });
+}
+
+std::string ErrRecorder::GetErrCodeStr(int /*code*/) const { return ""; }
+
+SqliteDB::SqliteDB(const std::string& path, unsigned int retries, const std::string& label)
+    : dbHandle(nullptr), dbPath(path), retryLimit(retries), logLabel(label) {}
+
+SqliteDB::~SqliteDB() { Close(); }
+
+bool SqliteDB::Open() {
+  if (dbHandle != nullptr) return true;
+  if (sqlite3_open(dbPath.c_str(), &dbHandle) != SQLITE_OK) {
+    Close();
+    KELODR_LOG(WARN, __func__, "Failed to open db[%s]", dbPath.c_str());
+    return false;
+  }
+  if (sqlite3_busy_timeout(dbHandle, kBusyTimeoutInMSec) != SQLITE_OK) {
+    KELODR_LOG(WARN, __func__, "%s", "Failed to set busy timeout with error");
+    return false;
+  }
+  return true;
+}
+
+void SqliteDB::Close() {
+  if (dbHandle == nullptr) return;
+  sqlite3_close(dbHandle);
+  dbHandle = nullptr;
+}
+
+bool SqliteDB::IsExisted() const { return KLIBCFileExist(dbPath.c_str()) == 1; }
+
+void SqliteDB::SetErr(int code) const {
+  errCode = code;
+  errMsg = Json::Value();
+}
+
+void SqliteDB::SetDBErr(int code, const char* msg) const {
+  if (code == SQLITE_OK) return;
+  ThrowOnlyBadAlloc([&] { errMsg = Json::Value(msg != nullptr ? msg : sqlite3_errmsg(dbHandle)); });
+  errCode = code;
+}
+
+void SqliteDB::SetDBErr(const ErrRecorder& raw) const {
+  Json::Value details = ThrowOnlyBadAlloc([&] {
+    Json::Value value;
+    if (raw.errCode != 0) value["sqlite_errcode"] = raw.errCode;
+    if (!raw.errMsg.isNull()) value["sqlite_errmsg"] = raw.errMsg;
+    return value;
+  });
+  errCode = IsBusyOrLocked(raw.errCode) ? ERR::ERR_DATABASE_LOCK : ERR::ERR_DATABASE_OPERATION;
+  errMsg = std::move(details);
+}
+
+bool SqliteDB::DoExecSqliteCommand(const std::string& sql) {
+  char* errText = nullptr;
+  const int code = sqlite3_exec(dbHandle, sql.c_str(), nullptr, nullptr, &errText);
+  const std::unique_ptr<char, void (*)(void*)> owner(errText, sqlite3_free);
+  SetDBErr(code, errText);
+  return code == SQLITE_OK;
+}
+
+// Hands each row to `takeRow` until that answers false or no row is left.
+template <typename TakeRow>
+bool SqliteDB::Select(const std::string& sql, const TakeRow& takeRow) {
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  int code = SQLITE_OK;
+  const Statement stmt = Prepare(dbHandle, sql, code);
+  if (code == SQLITE_OK) code = sqlite3_step(stmt.get());
+  while (code == SQLITE_ROW && takeRow(stmt.get())) code = sqlite3_step(stmt.get());
+  if (code != SQLITE_ROW && code != SQLITE_DONE) {
+    SetDBErr(code, nullptr);
+    return false;
+  }
+  SetErr(0);
+  return true;
+}
+
+bool SqliteDB::SelectFirst(const std::string& sql, SqliteValueList& record, const char* function) {
+  return Select(sql, [&](sqlite3_stmt* stmt) {
+    record = ParseRecord(stmt, function);
+    return false;
+  });
+}
+
+bool SqliteDB::SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
+                         const char* function) {
+  return Select(sql, [&](sqlite3_stmt* stmt) {
+    records.push_back(ParseRecord(stmt, function));
+    return true;
+  });
+}
+
+bool SqliteDB::DoSelectSqliteRecord(const std::string& sql, SqliteValueList& record) {
+  return SelectFirst(sql, record, __func__);
+}
+
+bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
+                                     std::vector<SqliteValueList>& records) {
+  return SelectAll(sql, records, __func__);
+}
+
+// Leaves the classified error of the last attempt behind. `retries` counts one past the limit when
+// the limit ends the loop, and is what the callers' messages show.
+template <typename Attempt>
+bool SqliteDB::Retry(const Attempt& attempt, unsigned int& retries) {
+  retries = 0;
+  while (!attempt()) {
+    const ErrRecorder raw = ThrowOnlyBadAlloc([this] { return ErrRecorder(*this); });
+    SetDBErr(raw);
+    if (!IsBusyOrLocked(raw.errCode) || ++retries > retryLimit) return false;
+    RandomSleepInMSec(1000, 2000);
+  }
+  return true;
+}
+
+bool SqliteDB::Exec(const std::string& sql) {
+  SetErr(ERR::ERR_UNKNOWN);
+  if (sql.empty()) {
+    SetErr(ERR::BAD_PARAMETER);
+    KELODR_LOG(ERR, __func__, "empty command to exec db[%s]", dbPath.c_str());
+    return false;
+  }
+  if (!Open()) {
+    SetErr(ERR::ERR_DATABASE_OPERATION);
+    KELODR_LOG(ERR, __func__, "Failed to open db [%s]", dbPath.c_str());
+    return false;
+  }
+  if (dbHandle == nullptr) {
+    SetErr(ERR::ERR_NULL_POINTER);
+    KELODR_LOG(ERR, __func__, "DB[%s] is not opened", dbPath.c_str());
+    return false;
+  }
+  unsigned int retries = 0;
+  if (!Retry([&] { return DoExecSqliteCommand(sql); }, retries)) {
+    KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
+               retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
+    return false;
+  }
+  SetErr(0);
+  if (retries > 0) {
+    KELODR_LOG(INFO, __func__, "After retry [%u] times, success to exec command [%s]", retries,
+               sql.c_str());
+  }
+  return true;
+}
+
+bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) {
+  if (sql.empty()) {
+    SetErr(ERR::BAD_PARAMETER);
+    KELODR_LOG(ERR, __func__, "%s", "Empty command to select record");
+    return false;
+  }
+  if (!Open()) {
+    KELODR_LOG(ERR, __func__, "Failed to open db [%s]", dbPath.c_str());
+    return false;
+  }
+  unsigned int retries = 0;
+  if (!Retry([&] { return SelectFirst(sql, record, "SelectByCommand"); }, retries)) {
+    KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to select command[%s] with err [%s]",
+               retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
+    return false;
+  }
+  if (retries > 0) {
+    KELODR_LOG(INFO, __func__, "After retry [%u] times, success to exec command [%s]", retries,
+               sql.c_str());
+  }
+  return true;
+}
+
+bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records) {
+  if (sql.empty()) {
+    SetErr(ERR::BAD_PARAMETER);
+    KELODR_LOG(ERR, __func__, "%s", "Empty command to select records");
+    return false;
+  }
+  if (!Open()) {
+    KELODR_LOG(ERR, __func__, "Failed to open db [%s]", dbPath.c_str());
+    return false;
+  }
+  unsigned int retries = 0;
+  if (!Retry([&] { return SelectAll(sql, records, "SelectByCommand"); }, retries)) {
+    KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
+               retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
+    return false;
+  }
+  if (retries > 0) {
+    KELODR_LOG(INFO, __func__, "After retry [%u] times, success to select command", retries);
+  }
+  return true;
+}
+
+bool SqliteDB::IsTableExisted(const std::string& tableName) {
+  std::vector<SqliteValueList> rows;
+  SelectByCommand("SELECT 1 FROM sqlite_master WHERE type='table' AND name='" + tableName + "';",
+                  rows);
+  return !rows.empty();
+}
+
+bool SqliteDB::GetCount(const SqliteTableHandler& table, int& count) {
+  const std::string sql = "SELECT count() as count FROM '" + table.tableName + "';";
+  std::vector<SqliteValueList> rows;
+  SelectByCommand(sql, rows);
+  if (rows.empty()) {
+    KELODR_LOG(ERR, __func__, "Record is empty on command [%s]", sql.c_str());
+    return false;
+  }
+  if (!rows.front().GetValue("count", count)) {
+    KELODR_LOG(ERR, __func__, "Record error [%s]", rows.front().ToStr().c_str());
+    return false;
+  }
+  return true;
+}
+
+bool SqliteDB::CreateTable(const SqliteTableHandler& table) {
+  if (table.columnDefs.empty()) return true;
+  if (table.tableName.empty()) {
+    KELODR_LOG(ERR, __func__, "Invalid table [%s]", table.tableName.c_str());
+    return false;
+  }
+  if (IsTableExisted(table.tableName)) return true;
+  if (!Exec("CREATE TABLE IF NOT EXISTS " + table.tableName + " (" + table.columnDefs + ")")) {
+    KELODR_LOG(ERR, __func__, "Failed to create table [%s] with cmd[%s]", table.tableName.c_str(),
+               table.columnDefs.c_str());
+    return false;
+  }
+  return true;
+}
+
+bool SqliteDB::Exec(const SqliteCommand& cmd) {
+  SetErr(ERR::ERR_UNKNOWN);
+  KELODR_LOG(INFO, __func__, "%s Exec cmd: %s", logLabel.c_str(), cmd.GetCommand().c_str());
+  if (!cmd.IsValid()) {
+    SetErr(ERR::BAD_PARAMETER);
+    return false;
+  }
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  if (!CreateTable(cmd.GetTable())) {
+    KELODR_LOG(ERR, __func__, "Failed to create table [%s]", cmd.GetTable().tableName.c_str());
+    return false;
+  }
+  const std::string sql = cmd.GetCommand();
+  if (!Exec(sql)) {
+    KELODR_LOG(ERR, __func__, "Failed to exec [%s] in db[%s]", sql.c_str(), dbPath.c_str());
+    return false;
+  }
+  KELODR_LOG(INFO, __func__, "%s Exec cmd success", logLabel.c_str());
+  SetErr(0);
+  return true;
+}
+
+bool SqliteDB::InsertRecord(const InsertCommand& cmd) { return Exec(cmd); }
+
+bool SqliteDB::UpdateRecord(const UpdateCommand& cmd) { return Exec(cmd); }
+
+bool SqliteDB::DeleteRecord(const DeleteCommand& cmd) {
+  if (!IsExisted()) return true;
+  return Exec(cmd);
+}
+
+bool SqliteDB::DeleteRecord(const std::string& condition, const SqliteTableHandler& table) {
+  if (condition.empty()) {
+    SetErr(ERR::BAD_PARAMETER);
+    KELODR_LOG(ERR, __func__, "invalid delete command: condition[%s]", condition.c_str());
+    return false;
+  }
+  DeleteCommand cmd;
+  cmd.SetTable(table);
+  cmd.SetCondition(condition);
+  return DeleteRecord(cmd);
+}
+
+bool SqliteDB::DeleteAllRecords(const SqliteTableHandler& table) {
+  DeleteCommand cmd;
+  cmd.SetTable(table);
+  cmd.DeleteAll();
+  return DeleteRecord(cmd);
+}
+
+template <typename Rows>
+bool SqliteDB::SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function) {
+  if (!cmd.IsValid()) {
+    SetErr(ERR::BAD_PARAMETER);
+    KELODR_LOG(ERR, function, "invalid select command [%s]", cmd.ToStr().c_str());
+    return false;
+  }
+  if (!IsExisted()) return false;
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  if (!CreateTable(cmd.GetTable())) {
+    KELODR_LOG(ERR, function, "%s", "Failed to create table");
+    return false;
+  }
+  if (!SelectByCommand(cmd.GetCommand(), rows)) return false;
+  SetErr(0);
+  return true;
+}
+
+bool SqliteDB::SelectRecord(const SelectCommand& cmd, SqliteValueList& record) {
+  return SelectWithCommand(cmd, record, __func__);
+}
+
+bool SqliteDB::SelectRecords(const SelectCommand& cmd, std::vector<SqliteValueList>& records) {
+  return SelectWithCommand(cmd, records, __func__);
+}
+
+}  // namespace KeloDRCore

@@ -1,0 +1,275 @@
+#include "kelodrcore/sqlite_value.h"
+
+#include <algorithm>
+#include <charconv>
+#include <cstdint>
+#include <cstring>
+#include <utility>
+
+#include "kelodrcore/json_value.h"
+#include "log.h"
+
+namespace KeloDRCore {
+namespace {
+
+// The one place where integers become JSON: Json::Value has no unambiguous constructor for long or
+// long long across 32 and 64 bits.
+Json::Value ToJson(long long number) { return Json::Value(static_cast<Json::Int64>(number)); }
+Json::Value ToJson(unsigned long long number) {
+  return Json::Value(static_cast<Json::UInt64>(number));
+}
+
+// Doubles each quote, byte for byte as a regular expression would; a pass over the bytes costs a
+// hundredth of it.
+void AppendQuoted(std::string& text, const char* begin, const char* end) {
+  const auto quotes = static_cast<size_t>(std::count(begin, end, '\''));
+  text.reserve(text.size() + static_cast<size_t>(end - begin) + quotes + 2);
+  text += '\'';
+  while (const void* found = std::memchr(begin, '\'', static_cast<size_t>(end - begin))) {
+    const char* const next = static_cast<const char*>(found) + 1;
+    text.append(begin, next);
+    text += '\'';
+    begin = next;
+  }
+  text.append(begin, end);
+  text += '\'';
+}
+
+template <typename Integer>
+void AppendDecimal(std::string& text, Integer number) {
+  char digits[24];
+  text.append(digits, std::to_chars(digits, digits + sizeof(digits), number).ptr);
+}
+
+// Convert: true and `out` written when the payload can be read as that type.
+
+bool Convert(const Json::Value& value, int& out) {
+  if (!value.isInt()) return false;
+  out = value.asInt();
+  return true;
+}
+
+bool Convert(const Json::Value& value, unsigned int& out) {
+  if (!value.isUInt()) return false;
+  out = value.asUInt();
+  return true;
+}
+
+bool Convert(const Json::Value& value, long long& out) {
+  if (!value.isInt64()) return false;
+  out = value.asLargestInt();
+  return true;
+}
+
+bool Convert(const Json::Value& value, unsigned long long& out) {
+  if (!value.isUInt64()) return false;
+  out = value.asLargestUInt();
+  return true;
+}
+
+bool Convert(const Json::Value& value, long& out) {
+  if (!value.isInt64()) return false;
+  out = static_cast<int32_t>(value.asLargestInt());
+  return true;
+}
+
+bool Convert(const Json::Value& value, unsigned long& out) {
+  if (!value.isUInt64()) return false;
+  out = static_cast<uint32_t>(value.asLargestUInt());
+  return true;
+}
+
+bool Convert(const Json::Value& value, bool& out) {
+  if (!value.isBool() && !(value.isInt() && (value.asInt() == 0 || value.asInt() == 1))) {
+    return false;
+  }
+  out = value.asBool();
+  return true;
+}
+
+bool Convert(const Json::Value& value, std::string& out) {
+  if (!value.isString()) return false;
+  out = value.asString();
+  return true;
+}
+
+template <typename T>
+constexpr const char* TypeName() {
+  if (std::is_same_v<T, bool>) return "bool";
+  return std::is_integral_v<T> ? "int" : "string";
+}
+
+}  // namespace
+
+SqliteValue::SqliteValue() : valid(false) {}
+SqliteValue::SqliteValue(int number) : valid(true), value(number) {}
+SqliteValue::SqliteValue(bool truth) : valid(true), value(truth) {}
+SqliteValue::SqliteValue(unsigned int number) : valid(true), value(number) {}
+SqliteValue::SqliteValue(long number)
+    : valid(true), value(ToJson(static_cast<long long>(number))) {}
+SqliteValue::SqliteValue(unsigned long number)
+    : valid(true), value(ToJson(static_cast<unsigned long long>(number))) {}
+SqliteValue::SqliteValue(long long number) : valid(true), value(ToJson(number)) {}
+SqliteValue::SqliteValue(unsigned long long number) : valid(true), value(ToJson(number)) {}
+SqliteValue::SqliteValue(const std::string& text) : valid(true), value(text) {}
+SqliteValue::SqliteValue(const char* text)
+    : valid(text != nullptr), value(valid ? Json::Value(text) : Json::Value()) {}
+
+SqliteValue::SqliteValue(const SqliteValue& other) = default;
+SqliteValue::SqliteValue(SqliteValue&& other) noexcept = default;
+SqliteValue::~SqliteValue() = default;
+
+SqliteValue& SqliteValue::operator=(const SqliteValue& other) {
+  value = other.value;
+  return *this;
+}
+
+SqliteValue& SqliteValue::operator=(SqliteValue&& other) noexcept {
+  value = std::move(other.value);
+  return *this;
+}
+
+bool SqliteValue::IsValid() const {
+  return valid && (value.isString() || value.isBool() || value.isIntegral());
+}
+
+std::string SqliteValue::ToFormatedValue() const {
+  std::string text;
+  AppendFormatedValue(text);
+  return text;
+}
+
+void SqliteValue::AppendFormatedValue(std::string& text) const {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  if (value.getString(&begin, &end)) {
+    AppendQuoted(text, begin, end);
+  } else if (value.isBool()) {
+    text += value.asBool() ? '1' : '0';
+  } else if (value.isInt()) {
+    AppendDecimal(text, value.asInt64());
+  } else if (value.isUInt()) {
+    AppendDecimal(text, value.asUInt64());
+  }
+}
+
+template <typename T>
+bool SqliteValue::GetValue(T& out) const {
+  if (Convert(value, out)) return true;
+  KELODR_LOG(WARN, __func__, "[%s] is not %s", JsonValue::toString(value).c_str(), TypeName<T>());
+  return false;
+}
+
+SqliteValueList::SqliteValueList() = default;
+SqliteValueList::SqliteValueList(const SqliteValueList& other) = default;
+SqliteValueList::SqliteValueList(SqliteValueList&& other) noexcept = default;
+SqliteValueList::~SqliteValueList() = default;
+
+SqliteValueList& SqliteValueList::operator=(const SqliteValueList& other) {
+  values = other.values;
+  return *this;
+}
+
+SqliteValueList& SqliteValueList::operator=(SqliteValueList&& other) noexcept {
+  values = std::move(other.values);
+  return *this;
+}
+
+template <typename Value>
+bool SqliteValueList::SetField(const std::string& field, Value&& fieldValue) {
+  if (field.empty() || !fieldValue.IsValid()) {
+    KELODR_LOG(ERR, "AddValue", "Bad Field[%s] or value [%s]", field.c_str(),
+               fieldValue.ToFormatedValue().c_str());
+    return false;
+  }
+  const auto [place, isNew] = values.try_emplace(field, std::forward<Value>(fieldValue));
+  // A failed try_emplace has not moved from its argument.
+  if (!isNew) place->second = std::forward<Value>(fieldValue);
+  return true;
+}
+
+bool SqliteValueList::AddValue(const std::string& field, const SqliteValue& fieldValue) {
+  return SetField(field, fieldValue);
+}
+
+bool SqliteValueList::AddValue(const std::string& field, SqliteValue&& fieldValue) {
+  return SetField(field, std::move(fieldValue));
+}
+
+SqliteValueList& SqliteValueList::operator+=(const SqliteValueList& other) {
+  for (const auto& [field, fieldValue] : other.values) AddValue(field, fieldValue);
+  return *this;
+}
+
+const SqliteValue& SqliteValueList::GetValue(const std::string& field) const {
+  if (field.empty()) {
+    KELODR_LOG(ERR, __func__, "Invalid field [%s]", field.c_str());
+    return nullValue;
+  }
+  const auto found = values.find(field);
+  if (found == values.end()) {
+    KELODR_LOG(WARN, __func__, "Failed to find field [%s]", field.c_str());
+    return nullValue;
+  }
+  return found->second;
+}
+
+template <typename T>
+bool SqliteValueList::GetValue(const std::string& field, T& out) const {
+  if (field.empty()) {
+    KELODR_LOG(ERR, __func__, "Invalid field [%s]", field.c_str());
+    return false;
+  }
+  const auto found = values.find(field);
+  if (found == values.end()) {
+    KELODR_LOG(DEBUG, __func__, "field [%s] is not existed", field.c_str());
+    return false;
+  }
+  return found->second.GetValue(out);
+}
+
+bool SqliteValueList::HasField(const std::string& field) const {
+  if (field.empty()) {
+    KELODR_LOG(ERR, __func__, "Invalid field [%s]", field.c_str());
+    return false;
+  }
+  return values.count(field) != 0;
+}
+
+std::string SqliteValueList::ToStr() const {
+  std::string text;
+  for (const auto& [field, fieldValue] : values) {
+    if (!text.empty()) text += ", ";
+    text += field;
+    text += ':';
+    fieldValue.AppendFormatedValue(text);
+  }
+  return text;
+}
+
+SqliteValueList SqliteRecord::ToSqliteRecord() const { return ConvertColumns(GetColumns()); }
+
+template KELODR_EXPORT bool SqliteValue::GetValue(bool& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(int& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(unsigned int& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(long& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(unsigned long& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(long long& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(unsigned long long& out) const;
+template KELODR_EXPORT bool SqliteValue::GetValue(std::string& out) const;
+
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field, bool& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field, int& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
+                                                      unsigned int& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field, long& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
+                                                      unsigned long& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
+                                                      long long& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
+                                                      unsigned long long& out) const;
+template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
+                                                      std::string& out) const;
+
+}  // namespace KeloDRCore
