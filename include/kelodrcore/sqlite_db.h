@@ -1,0 +1,186 @@
+/// @file
+/// The handle on one SQLite database file, and its error holder.
+
+#ifndef KELODRCORE_SQLITE_DB_H_
+#define KELODRCORE_SQLITE_DB_H_
+
+#include <json/json.h>
+
+#include <string>
+#include <vector>
+
+#include "kelodrcore/export.h"
+#include "kelodrcore/sqlite_command.h"
+#include "kelodrcore/sqlite_table_handler.h"
+#include "kelodrcore/sqlite_value.h"
+
+struct sqlite3;
+
+namespace KeloDRCore {
+
+/// Holds the last error: a code of `ERR` (0 for none) and its details. Not deleted through this
+/// base.
+class KELODR_EXPORT ErrRecorder {
+ public:
+  /// No error.
+  ErrRecorder();
+
+  /// The current error as an object: "err_code" (int); "err_code_str" when `GetErrCodeStr` gives a
+  /// text; "err_msg" when there are details.
+  [[nodiscard]] virtual Json::Value GetErr() const;
+
+  /// The name of a code for "err_code_str". Empty here; a recorder that wants names overrides it,
+  /// for instance with `ERR::ToString`.
+  [[nodiscard]] virtual std::string GetErrCodeStr(int code) const;
+
+ protected:
+  friend class SqliteDB;  // copies a recorder and classifies what the copy holds
+
+  mutable int errCode;         ///< 0, a code of `ERR`, or for a moment a raw SQLite result code.
+  mutable Json::Value errMsg;  ///< Null, SQLite's message, or an object with the details.
+};
+
+/// The handle on one SQLite database file.
+///
+/// Opened by the first statement and kept open until `Close` or destruction. A statement that finds
+/// the database busy or locked is tried again, at most `retries` times, after a random pause of 1
+/// to 2 s each, on top of SQLite's own wait of up to 1 s in each attempt; any other failure ends at
+/// once.
+///
+/// Failure is a false result, a line in the log, and the error in `GetErr()`: 401 for a bad
+/// argument, 404 for a failed operation and 405 for a database that stayed busy or locked, the last
+/// two with "sqlite_errcode" and "sqlite_errmsg" in "err_msg". Nothing is thrown but
+/// `std::bad_alloc`.
+///
+/// One handle is used by one thread at a time; `const` operations write the error too.
+class KELODR_EXPORT SqliteDB : public ErrRecorder {
+ public:
+  /// Stores the arguments; opens nothing. `label` stands in front of the lines that commands log.
+  SqliteDB(const std::string& path, unsigned int retries, const std::string& label);
+
+  SqliteDB(const SqliteDB&) = delete;
+  SqliteDB& operator=(const SqliteDB&) = delete;
+
+  /// Closes the connection.
+  virtual ~SqliteDB();
+
+  /// Opens the connection if it is closed, creating a missing file, and sets the busy time-out of
+  /// 1000 ms. False with a line at WARN when either fails; after a failed time-out the connection
+  /// stays open, deliberately. The error in `GetErr()` is not touched.
+  bool Open();
+
+  /// Closes the connection if it is open.
+  void Close();
+
+  /// True when the database file exists.
+  [[nodiscard]] bool IsExisted() const;
+
+  /// @name One attempt on the open connection.
+  /// No check of the statement, no retry. A failure is recorded raw: SQLite's own result code and
+  /// message.
+  /// @{
+
+  /// Runs the statements and discards their rows. Success leaves the recorded error as it was.
+  bool DoExecSqliteCommand(const std::string& sql);
+
+  /// Puts the first row into `record`, in place of what it held; with no row it succeeds and leaves
+  /// `record` alone.
+  bool DoSelectSqliteRecord(const std::string& sql, SqliteValueList& record);
+
+  /// Appends all rows to `records`, also those read before a failure.
+  bool DoSelectSqliteRecords(const std::string& sql, std::vector<SqliteValueList>& records);
+  /// @}
+
+  /// Opens the database and runs the statements, discarding their rows. Fails with 401 for an empty
+  /// text, without opening the file.
+  bool Exec(const std::string& sql);
+
+  /// @name Opens the database and reads the rows of a query.
+  /// Integers and texts become fields under their column names; a NULL, a real or a blob is left
+  /// out with a line at WARN. Fails with 401 for an empty text; when the file cannot be opened the
+  /// recorded error stays as it was.
+  /// @{
+
+  /// Reads the first row into `record`, as `DoSelectSqliteRecord` does.
+  bool SelectByCommand(const std::string& sql, SqliteValueList& record);
+
+  /// Appends the rows to `records`, which is never emptied: rows of an attempt that failed stay,
+  /// deliberately, also when it is tried again.
+  bool SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records);
+  /// @}
+
+  /// Records a raw SQLite failure; a null `msg` stands for the connection's own message. Nothing
+  /// for code 0.
+  void SetDBErr(int code, const char* msg) const;
+
+  /// Records `raw` classified: 405 when its code is SQLite's busy (5) or locked (6), else 404, with
+  /// code and message as details.
+  void SetDBErr(const ErrRecorder& raw) const;
+
+  /// True when the table exists. A failure reads as an absent table; its error stays recorded. The
+  /// name is not escaped.
+  bool IsTableExisted(const std::string& tableName);
+
+  /// Counts the rows of a table. False, with `count` untouched and a line at ERR, when it cannot be
+  /// counted, for instance because it is missing. Creates nothing.
+  bool GetCount(const SqliteTableHandler& table, int& count);
+
+  /// Creates the table if it is missing. Without column definitions this is a successful no-op.
+  bool CreateTable(const SqliteTableHandler& table);
+
+  /// Creates the command's table if it is missing, then runs the command. Logs the statement, and
+  /// its success, at INFO. Fails with 401 for an invalid command.
+  bool Exec(const SqliteCommand& cmd);
+
+  /// `Exec`: a missing file is created.
+  bool InsertRecord(const InsertCommand& cmd);
+
+  /// `Exec`: a missing file is created.
+  bool UpdateRecord(const UpdateCommand& cmd);
+
+  /// `Exec`, but a missing file is a success that touches nothing.
+  bool DeleteRecord(const DeleteCommand& cmd);
+
+  /// Deletes the rows that meet the condition. An empty condition fails with 401: it never deletes
+  /// every row.
+  bool DeleteRecord(const std::string& condition, const SqliteTableHandler& table);
+
+  /// Deletes every row.
+  bool DeleteAllRecords(const SqliteTableHandler& table);
+
+  /// @name Creates the command's table if it is missing, then reads the selected rows.
+  /// Fails with 401 for an invalid command. A missing file fails without a line and without
+  /// touching the recorded error, deliberately: nothing is selected.
+  /// @{
+
+  /// Reads the first row, as `SelectByCommand` does.
+  bool SelectRecord(const SelectCommand& cmd, SqliteValueList& record);
+
+  /// Appends the rows, as `SelectByCommand` does.
+  bool SelectRecords(const SelectCommand& cmd, std::vector<SqliteValueList>& records);
+  /// @}
+
+ private:
+  void SetErr(int code) const;
+
+  template <typename TakeRow>
+  bool Select(const std::string& sql, const TakeRow& takeRow);
+  bool SelectFirst(const std::string& sql, SqliteValueList& record, const char* function);
+  bool SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
+                 const char* function);
+
+  template <typename Attempt>
+  bool Retry(const Attempt& attempt, unsigned int& retries);
+
+  template <typename Rows>
+  bool SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function);
+
+  sqlite3* dbHandle;
+  std::string dbPath;
+  unsigned int retryLimit;
+  std::string logLabel;
+};
+
+}  // namespace KeloDRCore
+
+#endif  // KELODRCORE_SQLITE_DB_H_
