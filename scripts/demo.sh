@@ -16,5 +16,18 @@ show() {
   build/release/examples/drctl/drctl --db "$scratch/registry.db" "${@:2}"
 }
 
-show "Stores this machine's mounted volumes, one row a mount point" volume scan
-show "Lists them" volume list
+show "Adds a node: the file and its table are made on first use" \
+  node add nas1 --address 192.0.2.10 --port 5566
+show "Adds another; data is quoted where it becomes SQL" \
+  node add "o'brien's nas" --address nas.example --port 5566 --state online
+show "The state changes" node set nas1 --state syncing
+show "Lists what is online, as a table" node list --filter state=online
+show "Lists all, as JSON, last name first" node list --order name --desc --json
+show "Counts them" node count
+show "Stores this machine's mounts, one row a mount point" volume scan
+show "The largest ones" volume list --order size_mib --desc --limit 5
+show "With --verbose, the library's own log lines" --verbose node remove nas1
+
+printf '\n# A failure prints the error document and exits with 1\n'
+show "A name that is taken" node add "o'brien's nas" --address nas.example --port 1 ||
+  echo "exit status $?"

@@ -1,0 +1,84 @@
+#include "output.h"
+
+#include <kelodrcore/json_value.h>
+
+#include <algorithm>
+#include <iostream>
+
+namespace drctl {
+
+using KeloDRCore::SqliteValueList;
+namespace JsonValue = KeloDRCore::JsonValue;
+
+namespace {
+
+// Control characters in a name must not reach the terminal as such.
+std::string Printable(std::string text) {
+  std::replace_if(
+      text.begin(), text.end(),
+      [](char c) { return static_cast<unsigned char>(c) < 0x20 || c == 0x7f; }, '?');
+  return text;
+}
+
+std::vector<std::string> Cells(const SqliteValueList& row, const std::vector<Column>& columns) {
+  const Json::Value json = ToJson(row, columns);
+  std::vector<std::string> cells;
+  for (const Column& column : columns) cells.push_back(Printable(json[column.name].asString()));
+  return cells;
+}
+
+void PrintTable(const std::vector<std::vector<std::string>>& lines,
+                const std::vector<Column>& columns) {
+  for (const auto& line : lines) {
+    std::string text;
+    for (size_t i = 0; i < columns.size(); ++i) {
+      size_t width = 0;
+      for (const auto& other : lines) width = std::max(width, other[i].size());
+      const std::string padding(width - line[i].size(), ' ');
+      if (i > 0) text += "  ";
+      text += columns[i].isNumber ? padding + line[i] : line[i] + padding;
+    }
+    text.erase(text.find_last_not_of(' ') + 1);
+    std::cout << text << '\n';
+  }
+}
+
+}  // namespace
+
+Json::Value ToJson(const SqliteValueList& row, const std::vector<Column>& columns) {
+  Json::Value object(Json::objectValue);
+  for (const Column& column : columns) {
+    if (!row.HasField(column.name)) continue;
+    long long number = 0;
+    std::string text;
+    if (column.isNumber && row.GetValue(column.name, number)) {
+      object[column.name] = static_cast<Json::Int64>(number);
+    } else if (!column.isNumber && row.GetValue(column.name, text)) {
+      object[column.name] = text;
+    }
+  }
+  return object;
+}
+
+Json::Value ToJson(const Rows& rows, const std::vector<Column>& columns) {
+  Json::Value array(Json::arrayValue);
+  for (const SqliteValueList& row : rows) array.append(ToJson(row, columns));
+  return array;
+}
+
+void Print(const Rows& rows, const std::vector<Column>& columns, bool asJson) {
+  if (asJson) return PrintJson(ToJson(rows, columns));
+  std::vector<std::vector<std::string>> lines(1);
+  for (const Column& column : columns) lines.front().push_back(column.name);
+  for (const SqliteValueList& row : rows) lines.push_back(Cells(row, columns));
+  PrintTable(lines, columns);
+}
+
+void PrintJson(const Json::Value& value) { std::cout << JsonValue::toString(value) << '\n'; }
+
+int Complain(const std::string& what, const Json::Value& err) {
+  std::cerr << "drctl: " << what << ": " << JsonValue::toString(err) << '\n';
+  return 1;
+}
+
+}  // namespace drctl

@@ -1,0 +1,79 @@
+// The registry: the replication nodes and this machine's volumes, in one SQLite file.
+
+#ifndef DRCTL_REGISTRY_H_
+#define DRCTL_REGISTRY_H_
+
+#include <kelodrcore/sqlite_command.h>
+#include <kelodrcore/sqlite_db.h>
+
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace drctl {
+
+using Rows = std::vector<KeloDRCore::SqliteValueList>;
+
+// A column, as commands and output name it.
+struct Column {
+  std::string name;
+  bool isNumber;
+};
+
+const std::vector<Column>& NodeColumns();
+const std::vector<Column>& VolumeColumns();
+
+// What a list shows: rows that meet every filter, sorted, a part of them.
+struct Query {
+  std::vector<std::string> filters;  // FIELD=VALUE or FIELD!=VALUE
+  std::vector<std::string> order;
+  bool ascending = true;
+  int offset = 0;
+  int limit = 0;  // 0: all
+};
+
+// Every operation answers false on failure and leaves the reason in GetErr(), with the code's name.
+class Registry : public KeloDRCore::SqliteDB {
+ public:
+  explicit Registry(const std::string& path);
+
+  std::string GetErrCodeStr(int code) const override;
+
+  // `node` holds name, address, port and state. Fails for a bad field or a name that is taken.
+  bool AddNode(const KeloDRCore::SqliteValueList& node);
+
+  // Changes the given fields of a node that exists.
+  bool SetNode(const std::string& name, const KeloDRCore::SqliteValueList& changes);
+
+  bool RemoveNode(const std::string& name);
+  bool GetNode(const std::string& name, KeloDRCore::SqliteValueList& node);
+  bool ListNodes(const Query& query, Rows& rows);
+  bool CountNodes(int& count);
+
+  // Stores one row a mount point, and forgets the mount points that are not among them.
+  bool ReplaceVolumes(const Rows& volumes);
+  bool ListVolumes(const Query& query, Rows& rows);
+
+  // Replaces nodes and volumes at once, or changes nothing.
+  bool ReplaceAll(const Rows& nodes, const Rows& volumes);
+
+  // Empty when the fields of a node are good, else what is wrong with them. `isWhole`: all fields
+  // must be there.
+  static std::string CheckNode(const KeloDRCore::SqliteValueList& node, bool isWhole);
+
+ private:
+  bool Fail(int code, const std::string& message);
+  bool InTransaction(const std::function<bool()>& steps);
+  bool RequireNode(const std::string& name);
+  bool InsertAll(const KeloDRCore::SqliteTableHandler& table, const Rows& rows);
+  bool List(const KeloDRCore::SqliteTableHandler& table, const std::vector<Column>& columns,
+            const Query& query, Rows& rows);
+  bool SetFilters(KeloDRCore::SelectCommand& command, const std::vector<Column>& columns,
+                  const std::vector<std::string>& filters);
+  bool SetOrder(KeloDRCore::SelectCommand& command, const std::vector<Column>& columns,
+                const std::vector<std::string>& order);
+};
+
+}  // namespace drctl
+
+#endif  // DRCTL_REGISTRY_H_
