@@ -1,8 +1,8 @@
 #include "kelodrcore/json_value.h"
 
-#include <cstdio>
 #include <memory>
-#include <utility>
+
+#include "document_file.h"
 
 namespace KeloDRCore::JsonValue {
 namespace {
@@ -42,14 +42,12 @@ bool fromString(Json::Value& value, const std::string& text) {
 }
 
 bool fromFile(Json::Value& value, const std::string& path) {
-  const std::unique_ptr<std::FILE, int (*)(std::FILE*)> file(std::fopen(path.c_str(), "re"),
-                                                             &std::fclose);
-  if (!file) return false;
   std::string text;
-  char chunk[4096];
-  size_t size;
-  while ((size = std::fread(chunk, 1, sizeof chunk, file.get())) > 0) text.append(chunk, size);
-  return std::ferror(file.get()) == 0 && fromString(value, text);
+  return ReadDocumentFile(path, text) && fromString(value, text);
+}
+
+bool toFile(const Json::Value& value, const std::string& path) {
+  return ReplaceDocumentFile(path, toString(value));
 }
 
 }  // namespace KeloDRCore::JsonValue

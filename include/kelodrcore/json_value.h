@@ -32,6 +32,25 @@ KELODR_EXPORT bool fromString(Json::Value& value, const std::string& text);
 /// unchanged, when the file is missing, is not a regular file, cannot be read or does not parse.
 KELODR_EXPORT bool fromFile(Json::Value& value, const std::string& path);
 
+/// Replaces the file at `path` by the text of `value` in one step: a reader sees the old document
+/// or the new one, whole, even when the writer is killed or the disk is full.
+///
+/// The new document goes to a temporary beside the file, which is synced, renamed over the file and
+/// made durable with a sync of the directory. A file that was there keeps its mode, set-id bits
+/// included, and its owner; a new one gets its mode from the umask. A symbolic link is followed:
+/// the file that it names is replaced, or created, and the link stays.
+///
+/// Writers of one file wait for each other, a minute at most (`EBUSY`); each leaves its whole
+/// document. Killed writers leave at most one temporary (".NAME.kelodr-UID", a long NAME cut; UID
+/// is the writer's effective user id), which the next write removes.
+///
+/// True once the document is on the disk. False with `errno` telling why, and with the old document
+/// in place: no such directory, a path that names something other than a regular file, an owner
+/// that this process may not give the file, any failed call. The one exception: when only a step
+/// after the rename fails (the sync of the directory), the new document is in place and the result
+/// is false all the same.
+KELODR_EXPORT bool toFile(const Json::Value& value, const std::string& path);
+
 }  // namespace KeloDRCore::JsonValue
 
 #endif  // KELODRCORE_JSON_VALUE_H_
