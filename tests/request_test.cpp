@@ -1,0 +1,640 @@
+#include "kelodrcore/request.h"
+
+#include <json/json.h>
+
+#include <cstdint>
+#include <memory>
+#include <random>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include "support/clean_test.h"
+
+namespace {
+
+using KeloDRCore::Request;
+using KeloDRCore::UploadFileDescription;
+
+using RequestTest = CleanTest;
+
+const char* const kReserved[] = {"api", "method", "version"};
+
+// A key that a C string would cut off at "a".
+const std::string kKeyWithNul("a\0b", 3);
+
+Json::Value Parse(const std::string& text) {
+  Json::Value value;
+  std::string errors;
+  const char* const end = text.data() + text.size();
+  const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
+  EXPECT_TRUE(reader->parse(text.data(), end, &value, &errors)) << text << errors;
+  return value;
+}
+
+// Values that can hold no members by key, other than null.
+std::vector<Json::Value> ValuesWithoutMembers() {
+  return {Parse("[]"), Parse(R"([{"api": "A"}, 2])"), 7, 2.5, true, "text", ""};
+}
+
+Request WithParams(const Json::Value& params) { return Request("A", 1, "list", params); }
+
+// Every field away from its default.
+Request Filled() {
+  Request request("A", 3, "get", Parse(R"({"id": 7})"));
+  request.setTimeout(5);
+  request.setEncryptRequired(true);
+  request.setUploadFile({"/tmp/local", "remote"});
+  return request;
+}
+
+void ExpectClientSettings(const Request& request, int timeout, bool encrypt,
+                          const std::string& path, const std::string& name) {
+  EXPECT_EQ(request.getTimeout(), timeout);
+  EXPECT_EQ(request.isEncryptRequired(), encrypt);
+  EXPECT_EQ(request.getUploadFile().path, path);
+  EXPECT_EQ(request.getUploadFile().name, name);
+}
+
+TEST_F(RequestTest, StartsWithTheDefaults) {
+  const Request request;
+  EXPECT_EQ(request.getVersion(), -1);
+  EXPECT_EQ(request.getAPI(), "");
+  EXPECT_EQ(request.getMethod(), "");
+  EXPECT_TRUE(request.getParams().isNull());
+  ExpectClientSettings(request, 120, false, "", "");
+}
+
+TEST_F(RequestTest, TakesApiVersionMethodAndParamsInThisOrder) {
+  const Request request("A", 2, "list", Parse(R"({"id": 7})"));
+  EXPECT_EQ(request.getAPI(), "A");
+  EXPECT_EQ(request.getVersion(), 2);
+  EXPECT_EQ(request.getMethod(), "list");
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+  ExpectClientSettings(request, 120, false, "", "");
+}
+
+TEST_F(RequestTest, ConstructorKeepsReservedKeysOfParams) {
+  const Json::Value params = Parse(R"({"api": "B", "method": "m", "version": 9, "id": 7})");
+  const Request request = WithParams(params);
+  EXPECT_EQ(request.getParams(), params);
+  EXPECT_EQ(request.getAPI(), "A");
+  EXPECT_EQ(request.getMethod(), "list");
+  EXPECT_EQ(request.getVersion(), 1);
+}
+
+TEST_F(RequestTest, ConstructorKeepsParamsOfAnyType) {
+  for (const Json::Value& params : ValuesWithoutMembers()) {
+    EXPECT_EQ(WithParams(params).getParams(), params);
+  }
+}
+
+TEST_F(RequestTest, ConstructorLoadsACall) {
+  const Request request(Parse(R"({"api": "A", "method": "get", "version": 2, "id": 7})"));
+  EXPECT_EQ(request.toStr(), "A/get/2");
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+  ExpectClientSettings(request, 120, false, "", "");
+}
+
+TEST_F(RequestTest, ConstructorFromAnEmptyCallKeepsTheDefaults) {
+  const Request request{Json::Value(Json::objectValue)};
+  EXPECT_EQ(request.toStr(), "//-1");
+  EXPECT_EQ(request.getParams(), Json::Value(Json::objectValue));
+}
+
+TEST_F(RequestTest, AJsonCallGoesWhereARequestIsExpected) {
+  static_assert(std::is_convertible_v<Json::Value, Request>);
+  const Request request = Parse(R"({"api": "A"})");
+  EXPECT_EQ(request.getAPI(), "A");
+}
+
+TEST_F(RequestTest, OnlyTheDestructorIsVirtual) {
+  static_assert(std::has_virtual_destructor_v<Request>);
+  struct Derived : Request {
+    explicit Derived(bool* destroyed) : gone(destroyed) {}
+    ~Derived() override { *gone = true; }
+    bool* gone;
+  };
+  bool gone = false;
+  const Request* request = new Derived(&gone);
+  delete request;
+  EXPECT_TRUE(gone);
+}
+
+TEST_F(RequestTest, ACopyIsIndependent) {
+  Request request = Filled();
+  const Request copy = request;
+  request.clear();
+  request.setEncryptRequired(false);
+  EXPECT_EQ(copy.toStr(), "A/get/3");
+  EXPECT_EQ(copy.getParams(), Parse(R"({"id": 7})"));
+  ExpectClientSettings(copy, 5, true, "/tmp/local", "remote");
+}
+
+TEST_F(RequestTest, SettersSetTheirOneFieldUnchecked) {
+  Request request;
+  request.setAPI("A");
+  EXPECT_EQ(request.toStr(), "A//-1");
+  request.setMethod("list");
+  EXPECT_EQ(request.toStr(), "A/list/-1");
+  request.setVersion(-5);
+  EXPECT_EQ(request.toStr(), "A/list/-5");
+  ExpectClientSettings(request, 120, false, "", "");
+  request.setTimeout(-1);
+  ExpectClientSettings(request, -1, false, "", "");
+  request.setEncryptRequired(true);
+  ExpectClientSettings(request, -1, true, "", "");
+  request.setUploadFile({"/tmp/local", "remote"});
+  ExpectClientSettings(request, -1, true, "/tmp/local", "remote");
+  EXPECT_EQ(request.toStr(), "A/list/-5");
+  EXPECT_TRUE(request.getParams().isNull());
+}
+
+TEST_F(RequestTest, SettersTakeTheRequestsOwnFields) {
+  Request request = Filled();
+  request.setAPI(request.getAPI());
+  request.setMethod(request.getAPI());
+  request.setUploadFile(request.getUploadFile());
+  EXPECT_EQ(request.toStr(), "A/A/3");
+  ExpectClientSettings(request, 5, true, "/tmp/local", "remote");
+}
+
+TEST_F(RequestTest, AnEncryptionFlagCanBeTakenBack) {
+  Request request = Filled();
+  request.setEncryptRequired(false);
+  EXPECT_FALSE(request.isEncryptRequired());
+}
+
+TEST_F(RequestTest, IsValidWithApiMethodAndAVersionOfAtLeastOne) {
+  struct Row {
+    const char* api;
+    const char* method;
+    int version;
+    bool valid;
+  };
+  const Row rows[] = {
+      {"", "", -1, false},
+      {"A", "list", 1, true},
+      {"A", "list", 2, true},
+      {"", "list", 1, false},
+      {"A", "", 1, false},
+      {"A", "list", 0, false},
+      {"A", "list", -5, false},
+      {"A", "list", INT32_MAX, true},
+      {"A", "list", INT32_MIN, false},
+      {" ", " ", 1, true},
+  };
+  for (const Row& row : rows) {
+    const Request request(row.api, row.version, row.method, Json::Value());
+    EXPECT_EQ(request.isValid(), row.valid) << request.toStr();
+  }
+}
+
+TEST_F(RequestTest, ValidityIgnoresTheRest) {
+  Request request = WithParams(Parse(R"({"api": 5})"));
+  request.setTimeout(-1);
+  request.setUploadFile({"", "name only"});
+  EXPECT_TRUE(request.isValid());
+  EXPECT_TRUE(WithParams("no object").isValid());
+}
+
+TEST_F(RequestTest, ExactlyThreeKeysAreReserved) {
+  for (const char* key : kReserved) EXPECT_FALSE(Request::isValidKey(key)) << key;
+  for (const std::string key :
+       {"", "API", "Api", "apis", "ap", " api", "api ", "Method", "VERSION", "id"}) {
+    EXPECT_TRUE(Request::isValidKey(key)) << key;
+  }
+  EXPECT_TRUE(Request::isValidKey(std::string("api\0", 4)));
+}
+
+TEST_F(RequestTest, AddsOneParam) {
+  Request request;
+  EXPECT_TRUE(request.addParam("id", 7));
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+  EXPECT_TRUE(request.addParam("list", Parse("[1, {}]")));
+  EXPECT_TRUE(request.addParam("none", Json::Value()));
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7, "list": [1, {}], "none": null})"));
+}
+
+TEST_F(RequestTest, AddingAParamAgainReplacesIt) {
+  Request request;
+  request.addParam("id", Parse(R"({"a": 1, "b": 2})"));
+  EXPECT_TRUE(request.addParam("id", Parse(R"({"c": 3})")));
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": {"c": 3}})"));
+}
+
+TEST_F(RequestTest, RefusesAReservedKey) {
+  for (const char* key : kReserved) {
+    Request request;
+    EXPECT_FALSE(request.addParam(key, "x"));
+    EXPECT_TRUE(request.getParams().isNull());
+    request.addParam("id", 7);
+    EXPECT_FALSE(request.addParam(key, "x"));
+    EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+    EXPECT_EQ(request.toStr(), "//-1");
+  }
+}
+
+TEST_F(RequestTest, AddsAParamUnderTheEmptyKey) {
+  Request request;
+  EXPECT_TRUE(request.addParam("", 7));
+  EXPECT_EQ(request.getParams(), Parse(R"({"": 7})"));
+}
+
+TEST_F(RequestTest, AddsAParamUnderAKeyWithANulByte) {
+  Request request;
+  EXPECT_TRUE(request.addParam(kKeyWithNul, 7));
+  EXPECT_TRUE(request.addParam(std::string("api\0", 4), 8));
+  EXPECT_EQ(request.getParams().getMemberNames(),
+            (std::vector<std::string>{kKeyWithNul, std::string("api\0", 4)}));
+}
+
+TEST_F(RequestTest, AParamIsACopy) {
+  Json::Value value = Parse("[1]");
+  Request request;
+  request.addParam("list", value);
+  value.append(2);
+  EXPECT_EQ(request.getParams(), Parse(R"({"list": [1]})"));
+}
+
+TEST_F(RequestTest, MergesTheMembersOfAnObject) {
+  Request request = WithParams(Parse(R"({"a": 1, "b": {"x": 1}})"));
+  EXPECT_TRUE(request.addParam(Parse(R"({"b": {"y": 2}, "c": null, "": 3})")));
+  EXPECT_EQ(request.getParams(), Parse(R"({"": 3, "a": 1, "b": {"y": 2}, "c": null})"));
+}
+
+TEST_F(RequestTest, MergingIntoNullParamsMakesAnObject) {
+  Request request;
+  EXPECT_TRUE(request.addParam(Parse(R"({"a": 1, "b": "x"})")));
+  EXPECT_EQ(request.getParams(), Parse(R"({"a": 1, "b": "x"})"));
+}
+
+TEST_F(RequestTest, MergingSkipsReservedKeysSilently) {
+  Request request;
+  const Json::Value members =
+      Parse(R"({"aaa": 1, "api": "B", "method": "m", "version": 9, "zzz": 2})");
+  EXPECT_TRUE(request.addParam(members));
+  EXPECT_EQ(request.getParams(), Parse(R"({"aaa": 1, "zzz": 2})"));
+  EXPECT_EQ(request.toStr(), "//-1");
+}
+
+TEST_F(RequestTest, MergingOnlyReservedKeysLeavesNullParamsNull) {
+  Request request;
+  EXPECT_TRUE(request.addParam(Parse(R"({"api": "B"})")));
+  EXPECT_TRUE(request.addParam(Parse("{}")));
+  EXPECT_TRUE(request.getParams().isNull());
+}
+
+TEST_F(RequestTest, MergingKeepsReservedKeysThatParamsHold) {
+  Request request = WithParams(Parse(R"({"api": 5, "id": 7})"));
+  EXPECT_TRUE(request.addParam(Parse(R"({"api": 6, "id": 8})")));
+  EXPECT_EQ(request.getParams(), Parse(R"({"api": 5, "id": 8})"));
+}
+
+TEST_F(RequestTest, MergesKeysWithNulBytes) {
+  Json::Value members;
+  members[kKeyWithNul] = 1;
+  members["a"] = 2;
+  Request request;
+  EXPECT_TRUE(request.addParam(members));
+  EXPECT_EQ(request.getParams(), members);
+}
+
+TEST_F(RequestTest, MergingAnythingButAnObjectAddsNothing) {
+  std::vector<Json::Value> all = ValuesWithoutMembers();
+  all.emplace_back();
+  for (const Json::Value& members : all) {
+    Request request = WithParams(Parse(R"({"id": 7})"));
+    EXPECT_TRUE(request.addParam(members));
+    EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+    Request empty;
+    EXPECT_TRUE(empty.addParam(members));
+    EXPECT_TRUE(empty.getParams().isNull());
+  }
+}
+
+TEST_F(RequestTest, NothingIsAddedToParamsThatCannotHoldMembers) {
+  for (const Json::Value& params : ValuesWithoutMembers()) {
+    Request request = WithParams(params);
+    EXPECT_FALSE(request.addParam("id", 7));
+    EXPECT_FALSE(request.addParam("api", 7));
+    EXPECT_FALSE(request.addParam(Parse(R"({"id": 7})")));
+    EXPECT_FALSE(request.addParam(Parse("{}")));
+    EXPECT_FALSE(request.addParam(Parse("[1]")));
+    EXPECT_FALSE(request.addParam(Json::Value()));
+    EXPECT_EQ(request.getParams(), params);
+  }
+}
+
+TEST_F(RequestTest, AParamMayBeTheParamsThemselves) {
+  Request request = WithParams(Parse(R"({"id": 7})"));
+  EXPECT_TRUE(request.addParam("all", request.getParams()));
+  EXPECT_EQ(request.getParams(), Parse(R"({"all": {"id": 7}, "id": 7})"));
+  Request empty;
+  EXPECT_TRUE(empty.addParam("all", empty.getParams()));
+  EXPECT_EQ(empty.getParams(), Parse(R"({"all": null})"));
+}
+
+TEST_F(RequestTest, AParamMayBePartOfTheParamItReplaces) {
+  Request request = WithParams(Parse(R"({"id": {"deep": {"x": [1, 2]}}})"));
+  EXPECT_TRUE(request.addParam("id", request.getParams()["id"]["deep"]));
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": {"x": [1, 2]}})"));
+  EXPECT_TRUE(request.addParam("id", request.getParams()["id"]));
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": {"x": [1, 2]}})"));
+}
+
+TEST_F(RequestTest, MergingTheParamsIntoThemselvesChangesNothing) {
+  const Json::Value params = Parse(R"({"a": {"b": 1}, "api": 5, "c": [1]})");
+  Request request = WithParams(params);
+  EXPECT_TRUE(request.addParam(request.getParams()));
+  EXPECT_EQ(request.getParams(), params);
+}
+
+TEST_F(RequestTest, MergesAnObjectThatTheMergeReplaces) {
+  Request request = WithParams(Parse(R"({"m": {"a": 1, "m": {"long": "text"}, "z": [2]}})"));
+  EXPECT_TRUE(request.addParam(request.getParams()["m"]));
+  EXPECT_EQ(request.getParams(), Parse(R"({"a": 1, "m": {"long": "text"}, "z": [2]})"));
+}
+
+TEST_F(RequestTest, MergesAnObjectInsideAMemberThatTheMergeReplaces) {
+  Request request =
+      WithParams(Parse(R"({"m": {"n": {"a": {"b": 1}, "m": "new", "z": {"y": 2}}}, "z": 0})"));
+  EXPECT_TRUE(request.addParam(request.getParams()["m"]["n"]));
+  EXPECT_EQ(request.getParams(), Parse(R"({"a": {"b": 1}, "m": "new", "z": {"y": 2}})"));
+}
+
+TEST_F(RequestTest, LoadsACall) {
+  Request request;
+  request.setRequest(Parse(R"({"api": "A", "method": "get", "version": 3, "id": 7, "list": [1]})"));
+  EXPECT_EQ(request.getAPI(), "A");
+  EXPECT_EQ(request.getMethod(), "get");
+  EXPECT_EQ(request.getVersion(), 3);
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7, "list": [1]})"));
+}
+
+TEST_F(RequestTest, LoadingReplacesTheParams) {
+  Request request = Filled();
+  request.setRequest(Parse(R"({"other": 1})"));
+  EXPECT_EQ(request.getParams(), Parse(R"({"other": 1})"));
+}
+
+TEST_F(RequestTest, LoadingLeavesFieldsOfMissingMembers) {
+  Request request = Filled();
+  request.setRequest(Parse("{}"));
+  EXPECT_EQ(request.toStr(), "A/get/3");
+  EXPECT_EQ(request.getParams(), Parse("{}"));
+}
+
+TEST_F(RequestTest, LoadingDoesNotTouchTheClientSettings) {
+  Request request = Filled();
+  request.setRequest(Parse(
+      R"({"api": "B", "timeout": 9, "encrypt_required": false, "upload_file": {"path": "p"}})"));
+  ExpectClientSettings(request, 5, true, "/tmp/local", "remote");
+}
+
+TEST_F(RequestTest, LoadingTakesEmptyTextsToo) {
+  Request request = Filled();
+  request.setRequest(Parse(R"({"api": "", "method": ""})"));
+  EXPECT_EQ(request.toStr(), "//3");
+  EXPECT_EQ(request.getParams(), Parse("{}"));
+}
+
+TEST_F(RequestTest, LoadingKeepsNulBytesOfTexts) {
+  Json::Value call;
+  call["api"] = std::string("A\0B", 3);
+  EXPECT_EQ(Request(call).getAPI(), std::string("A\0B", 3));
+}
+
+TEST_F(RequestTest, LoadingLeavesAnApiOrMethodOfAnotherTypeAmongTheParams) {
+  for (const char* key : {"api", "method"}) {
+    for (const char* text : {"null", "5", "2.5", "true", "[\"A\"]", "{\"api\": \"A\"}"}) {
+      Json::Value call;
+      call[key] = Parse(text);
+      Request request = Filled();
+      request.setRequest(call);
+      EXPECT_EQ(request.toStr(), "A/get/3") << key << text;
+      EXPECT_EQ(request.getParams(), call) << key << text;
+    }
+  }
+}
+
+TEST_F(RequestTest, LoadingTakesAVersionThatIsAnInt) {
+  struct Row {
+    Json::Value value;
+    int version;
+  };
+  const Row rows[] = {{0, 0},  {-5, -5}, {INT32_MAX, INT32_MAX}, {INT32_MIN, INT32_MIN},
+                      {7U, 7}, {3.0, 3}, {Json::Int64{12}, 12}};
+  for (const Row& row : rows) {
+    Json::Value call;
+    call["version"] = row.value;
+    Request request = Filled();
+    request.setRequest(call);
+    EXPECT_EQ(request.getVersion(), row.version);
+    EXPECT_EQ(request.getParams(), Parse("{}"));
+  }
+}
+
+TEST_F(RequestTest, LoadingLeavesAVersionThatIsNoIntAmongTheParams) {
+  for (const char* text :
+       {"null", "\"3\"", "true", "2.5", "2147483648", "-2147483649", "1e30", "[3]", "{}"}) {
+    Json::Value call;
+    call["version"] = Parse(text);
+    Request request;
+    request.setVersion(9);
+    request.setRequest(call);
+    EXPECT_EQ(request.getVersion(), 9) << text;
+    EXPECT_EQ(request.getParams(), call) << text;
+    EXPECT_EQ(request.toJson()["version"], Json::Value(9)) << text;
+  }
+}
+
+TEST_F(RequestTest, LoadingTakesMembersIndependently) {
+  Request request = Filled();
+  request.setRequest(Parse(R"({"api": 5, "method": "list", "version": "3"})"));
+  EXPECT_EQ(request.toStr(), "A/list/3");
+  EXPECT_EQ(request.getParams(), Parse(R"({"api": 5, "version": "3"})"));
+}
+
+TEST_F(RequestTest, LoadingIsCaseSensitive) {
+  Request request = Filled();
+  request.setRequest(Parse(R"({"API": "B", "Method": "m", "VERSION": 1})"));
+  EXPECT_EQ(request.toStr(), "A/get/3");
+  EXPECT_EQ(request.getParams(), Parse(R"({"API": "B", "Method": "m", "VERSION": 1})"));
+}
+
+TEST_F(RequestTest, LoadingAnythingButAnObjectOnlySetsTheParams) {
+  std::vector<Json::Value> all = ValuesWithoutMembers();
+  all.emplace_back();
+  for (const Json::Value& call : all) {
+    Request request = Filled();
+    request.setRequest(call);
+    EXPECT_EQ(request.getParams(), call);
+    EXPECT_EQ(request.toStr(), "A/get/3");
+    EXPECT_EQ(Request(call).getParams(), call);
+  }
+}
+
+TEST_F(RequestTest, LoadsItsOwnParams) {
+  Request request = WithParams(Parse(R"({"api": "B", "version": 2, "in": {"method": "m"}})"));
+  request.setRequest(request.getParams());
+  EXPECT_EQ(request.toStr(), "B/list/2");
+  EXPECT_EQ(request.getParams(), Parse(R"({"in": {"method": "m"}})"));
+  request.setRequest(request.getParams()["in"]);
+  EXPECT_EQ(request.toStr(), "B/m/2");
+  EXPECT_EQ(request.getParams(), Parse("{}"));
+}
+
+TEST_F(RequestTest, JsonFormSetsTheThreeReservedMembersBesideTheParams) {
+  const Json::Value json = Request("A", 2, "get", Parse(R"({"id": 7})")).toJson();
+  EXPECT_EQ(json, Parse(R"({"api": "A", "method": "get", "version": 2, "id": 7})"));
+  EXPECT_EQ(json["version"].type(), Json::intValue);
+}
+
+TEST_F(RequestTest, JsonFormOfADefaultRequest) {
+  EXPECT_EQ(Request().toJson(), Parse(R"({"api": "", "method": "", "version": -1})"));
+}
+
+TEST_F(RequestTest, JsonFormHasNoClientSettings) {
+  EXPECT_EQ(Filled().toJson(), Parse(R"({"api": "A", "method": "get", "version": 3, "id": 7})"));
+}
+
+TEST_F(RequestTest, JsonFormOverwritesReservedKeysOfTheParams) {
+  const Json::Value params = Parse(R"({"api": 5, "method": [1], "version": "3", "id": 7})");
+  const Request request = WithParams(params);
+  EXPECT_EQ(request.toJson(), Parse(R"({"api": "A", "method": "list", "version": 1, "id": 7})"));
+  EXPECT_EQ(request.getParams(), params);
+}
+
+TEST_F(RequestTest, JsonFormLeavesOutParamsThatCannotHoldMembers) {
+  for (const Json::Value& params : ValuesWithoutMembers()) {
+    const Request request = WithParams(params);
+    EXPECT_EQ(request.toJson(), Parse(R"({"api": "A", "method": "list", "version": 1})"));
+    EXPECT_EQ(request.getParams(), params);
+  }
+}
+
+TEST_F(RequestTest, JsonFormIsACopy) {
+  const Request request = Filled();
+  request.toJson()["id"] = 8;
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+}
+
+TEST_F(RequestTest, ShortNameHasApiMethodAndVersion) {
+  EXPECT_EQ(WithParams(Json::Value()).toStr(), "A/list/1");
+  EXPECT_EQ(Request().toStr(), "//-1");
+  EXPECT_EQ(Request(" a/b ", INT32_MIN, "", Json::Value()).toStr(), " a/b //-2147483648");
+}
+
+TEST_F(RequestTest, ClearGoesBackToTheDefaultsButForTheEncryptionFlag) {
+  Request request = Filled();
+  request.clear();
+  EXPECT_EQ(request.getVersion(), -1);
+  EXPECT_EQ(request.getAPI(), "");
+  EXPECT_EQ(request.getMethod(), "");
+  ExpectClientSettings(request, 120, true, "", "");
+  Request plain;
+  plain.clear();
+  EXPECT_FALSE(plain.isEncryptRequired());
+}
+
+TEST_F(RequestTest, ClearEmptiesAnObjectAndMakesOtherParamsNull) {
+  Request request = Filled();
+  request.clear();
+  EXPECT_EQ(request.getParams(), Json::Value(Json::objectValue));
+  for (const Json::Value& params : ValuesWithoutMembers()) {
+    Request other = WithParams(params);
+    other.clear();
+    EXPECT_TRUE(other.getParams().isNull());
+  }
+  Request null;
+  null.clear();
+  EXPECT_TRUE(null.getParams().isNull());
+}
+
+TEST_F(RequestTest, AClearedRequestCanBeFilledAgain) {
+  Request request = Filled();
+  request.clear();
+  EXPECT_TRUE(request.addParam("id", 8));
+  EXPECT_EQ(request.toJson(), Parse(R"({"api": "", "method": "", "version": -1, "id": 8})"));
+}
+
+// Random documents: every JSON type, nested, with bytes of all values in keys and texts.
+class Documents {
+ public:
+  Json::Value Call() {
+    Json::Value call = Object(4);
+    call["api"] = Text();
+    call["method"] = Text();
+    call["version"] = static_cast<int>(random());
+    return call;
+  }
+
+  Json::Value Object(int depth) {
+    Json::Value object(Json::objectValue);
+    for (int left = Below(6); left > 0; --left) object[Text()] = Value(depth - 1);
+    return object;
+  }
+
+ private:
+  int Below(int bound) { return static_cast<int>(random() % static_cast<unsigned>(bound)); }
+
+  std::string Text() {
+    std::string text;
+    for (int left = Below(5); left > 0; --left) text += static_cast<char>(Below(256));
+    return text;
+  }
+
+  Json::Value Array(int depth) {
+    Json::Value array(Json::arrayValue);
+    for (int left = Below(5); left > 0; --left) array.append(Value(depth - 1));
+    return array;
+  }
+
+  Json::Value Value(int depth) {
+    switch (Below(depth > 0 ? 7 : 5)) {
+      case 0:
+        return {};
+      case 1:
+        return static_cast<Json::Int64>(static_cast<std::uint64_t>(random()) << 20);
+      case 2:
+        return Below(2) == 0;
+      case 3:
+        return Below(1000) / 8.0;
+      case 4:
+        return Text();
+      case 5:
+        return Array(depth);
+      default:
+        return Object(depth);
+    }
+  }
+
+  std::mt19937 random{20260901};
+};
+
+TEST_F(RequestTest, JsonFormGivesBackAnyCallThatWasLoaded) {
+  Documents documents;
+  Request request;
+  for (int round = 0; round < 2000; ++round) {
+    const Json::Value call = documents.Call();
+    request.setRequest(call);
+    ASSERT_EQ(request.toJson(), call);
+    for (const char* key : kReserved) ASSERT_FALSE(request.getParams().isMember(key));
+  }
+}
+
+TEST_F(RequestTest, MergingEqualsAddingTheMembersOneByOne) {
+  Documents documents;
+  for (int round = 0; round < 1000; ++round) {
+    const Json::Value before = documents.Object(3);
+    const Json::Value members = round % 2 == 0 ? documents.Object(3) : documents.Call();
+    Request merged = WithParams(before);
+    ASSERT_TRUE(merged.addParam(members));
+    Request single = WithParams(before);
+    for (const std::string& key : members.getMemberNames()) single.addParam(key, members[key]);
+    ASSERT_EQ(merged.getParams(), single.getParams());
+  }
+}
+
+}  // namespace
