@@ -74,10 +74,10 @@ class KELODR_EXPORT InsertCommand : public SqliteCommand {
   /// True makes the statement INSERT OR REPLACE INTO.
   void SetReplacable(bool isReplacable);
 
-  /// @name Sets one field, over an earlier value of that name.
+  /// @{
+  /// Sets one field, over an earlier value of that name.
   /// False for an empty name or a null text, with a line at ERR. T is `std::string`, `bool`, `int`,
   /// `unsigned int` or `long`.
-  /// @{
   template <typename T, typename = EnableFieldType<T>>
   bool AddFieldValue(const std::string& field, const T& value);
   bool AddFieldValue(const std::string& field, const char* value);
@@ -106,8 +106,8 @@ class KELODR_EXPORT UpdateCommand : public SqliteCommand {
   /// Replaces all fields; nothing is checked.
   void SetFieldValues(const SqliteValueList& list);
 
-  /// @name Sets one field, as `InsertCommand::AddFieldValue` does.
   /// @{
+  /// Sets one field, as `InsertCommand::AddFieldValue` does.
   template <typename T, typename = EnableFieldType<T>>
   bool AddFieldValue(const std::string& field, const T& value);
   bool AddFieldValue(const std::string& field, const char* value);

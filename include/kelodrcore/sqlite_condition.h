@@ -100,8 +100,8 @@ class KELODR_EXPORT SqliteInFamily : public SqliteCondition {
   /// Sets the keyword only; any other than "IN" or "NOT IN" makes every setter fail.
   explicit SqliteInFamily(const std::string& listKeyword);
 
-  /// @name Sets the keyword, then calls `SetValue`.
   /// @{
+  /// Sets the keyword, then calls `SetValue`.
   SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
                  const std::vector<SqliteValue>& values);
   SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
@@ -131,8 +131,8 @@ class KELODR_EXPORT SqliteInFamily : public SqliteCondition {
 class KELODR_EXPORT SqliteIn : public SqliteInFamily {
  public:
   SqliteIn();  ///< No operands.
-  /// @name Calls `SetValue`.
   /// @{
+  /// Calls `SetValue`.
   SqliteIn(const std::string& lvalue, const std::vector<SqliteValue>& values);
   SqliteIn(const std::string& lvalue, const std::string& value);
   /// @}
@@ -142,8 +142,8 @@ class KELODR_EXPORT SqliteIn : public SqliteInFamily {
 class KELODR_EXPORT SqliteNotIn : public SqliteInFamily {
  public:
   SqliteNotIn();  ///< No operands.
-  /// @name Calls `SetValue`.
   /// @{
+  /// Calls `SetValue`.
   SqliteNotIn(const std::string& lvalue, const std::vector<SqliteValue>& values);
   SqliteNotIn(const std::string& lvalue, const std::string& value);
   /// @}

@@ -20,8 +20,8 @@ class KELODR_EXPORT SqliteTableHandler {
   /// Copies the two texts.
   SqliteTableHandler(const std::string& name, const std::string& columns);
 
-  /// @name Copies both fields.
   /// @{
+  /// Copies both fields.
   SqliteTableHandler(const SqliteTableHandler& other);
   SqliteTableHandler& operator=(const SqliteTableHandler& other);
   /// @}

@@ -25,11 +25,11 @@ class KELODR_EXPORT SqliteValue {
   /// No value: invalid, and rendered as the empty text.
   SqliteValue();
 
-  /// @name A value of the argument's type.
+  // NOLINTBEGIN(google-explicit-constructor)
+  /// @{
+  /// A value of the argument's type.
   /// Implicit, so that a literal can stand wherever a value is asked for. An integer outside 32
   /// bits is stored whole, but rendered as the empty text (see `ToFormatedValue`).
-  /// @{
-  // NOLINTBEGIN(google-explicit-constructor)
   SqliteValue(int number);
   SqliteValue(bool truth);
   SqliteValue(unsigned int number);
@@ -51,18 +51,18 @@ class KELODR_EXPORT SqliteValue {
   SqliteValue(double number) = delete;
   // NOLINTEND(google-explicit-constructor)
 
-  /// @name Copies or moves payload and validity.
   /// @{
+  /// Copies or moves payload and validity.
   SqliteValue(const SqliteValue& other);
   SqliteValue(SqliteValue&& other) noexcept;
   /// @}
 
   ~SqliteValue();
 
-  /// @name Takes over the other's payload only.
+  /// @{
+  /// Takes over the other's payload only.
   /// The validity stays as it was, deliberately: assigning into a default-constructed value keeps
   /// it invalid.
-  /// @{
   SqliteValue& operator=(const SqliteValue& other);
   SqliteValue& operator=(SqliteValue&& other) noexcept;
   /// @}
@@ -102,8 +102,8 @@ class KELODR_EXPORT SqliteValueList {
   /// An empty record.
   SqliteValueList();
 
-  /// @name Copies or moves the fields.
   /// @{
+  /// Copies or moves the fields.
   SqliteValueList(const SqliteValueList& other);
   SqliteValueList(SqliteValueList&& other) noexcept;
   SqliteValueList& operator=(const SqliteValueList& other);
@@ -112,10 +112,10 @@ class KELODR_EXPORT SqliteValueList {
 
   virtual ~SqliteValueList();
 
-  /// @name Sets a field, over an earlier value of that name.
+  /// @{
+  /// Sets a field, over an earlier value of that name.
   /// False for an empty name or an invalid value: a line at ERR ("Bad Field[...] or value [...]"),
   /// and the record is unchanged.
-  /// @{
   bool AddValue(const std::string& field, const SqliteValue& fieldValue);
   bool AddValue(const std::string& field, SqliteValue&& fieldValue);
   /// @}
