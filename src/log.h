@@ -17,9 +17,10 @@
 
 // Logs one line at `level` (ERR, WARN, NOTICE, INFO or DEBUG) in the name of `function`, the public
 // operation that the caller called. A message without arguments goes through "%s". syslog is called
-// right here, so that the compiler checks the format and "%m" still sees the caller's errno.
-#define KELODR_LOG(level, function, format, ...)                                                   \
-  syslog(KELODR_PRIORITY_##level, "%s:%d(%s)[%s][%d]: " format, __FILE_NAME__, __LINE__, function, \
-         #level, static_cast<int>(getpid()), __VA_ARGS__)
+// right here, so that the compiler checks the format and "%m" still sees the caller's errno;
+// __extension__ because "%m" is the system's, not the C++ standard's.
+#define KELODR_LOG(level, function, format, ...)                                             \
+  __extension__ syslog(KELODR_PRIORITY_##level, "%s:%d(%s)[%s][%d]: " format, __FILE_NAME__, \
+                       __LINE__, function, #level, static_cast<int>(getpid()), __VA_ARGS__)
 
 #endif  // KELODRCORE_SRC_LOG_H_
