@@ -1,0 +1,453 @@
+#include "kelodrcore/sqlite_db.h"
+
+#include <dlfcn.h>
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sqlite3.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <type_traits>
+
+#include "kelodrcore/err.h"
+#include "support/database.h"
+
+namespace {
+
+using KeloDRCore::ErrRecorder;
+using KeloDRCore::SqliteDB;
+using KeloDRCore::SqliteValueList;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+using Records = std::vector<SqliteValueList>;
+
+const std::string kFile = "sqlite_db.cpp";
+
+// What the tests force the engine to answer.
+bool opensWithoutHandle = false;
+bool refusesBusyTimeout = false;
+
+template <typename Function>
+Function Next(const char* name, Function /*type*/) {
+  return reinterpret_cast<Function>(dlsym(RTLD_NEXT, name));
+}
+
+}  // namespace
+
+// The linker lets these stand before the engine's own.
+extern "C" int sqlite3_open(const char* path, sqlite3** db) {
+  if (opensWithoutHandle) {
+    *db = nullptr;
+    return SQLITE_OK;
+  }
+  return Next("sqlite3_open", &sqlite3_open)(path, db);
+}
+
+extern "C" int sqlite3_busy_timeout(sqlite3* db, int milliseconds) {
+  if (refusesBusyTimeout) return SQLITE_MISUSE;
+  if (db == nullptr) return SQLITE_OK;
+  return Next("sqlite3_busy_timeout", &sqlite3_busy_timeout)(db, milliseconds);
+}
+
+namespace {
+
+class NamingRecorder : public ErrRecorder {
+ public:
+  std::string GetErrCodeStr(int code) const override { return KeloDRCore::ERR::ToString(code); }
+};
+
+class OpenRecorder : public ErrRecorder {
+ public:
+  OpenRecorder(int code, const Json::Value& message) {
+    errCode = code;
+    errMsg = message;
+  }
+};
+
+TEST(ErrRecorderTest, FreshOneHasOnlyCodeZero) { EXPECT_EQ(ErrRecorder().GetErr(), Error(0)); }
+
+TEST(ErrRecorderTest, HasNoNameForAnyCode) {
+  for (const int code : {0, 401, 404, 405, -1}) EXPECT_EQ(ErrRecorder().GetErrCodeStr(code), "");
+}
+
+TEST(ErrRecorderTest, NamesItsCodeThroughTheOverride) {
+  class Naming : public NamingRecorder {
+   public:
+    Naming() { errCode = 401; }
+  };
+  Json::Value expected = Error(401);
+  expected["err_code_str"] = KeloDRCore::ERR::ToString(401);
+  EXPECT_EQ(Naming().GetErr(), expected);
+  EXPECT_EQ(static_cast<const ErrRecorder&>(Naming()).GetErr(), expected);
+}
+
+TEST(ErrRecorderTest, ShowsDetailsUnlessTheyAreNull) {
+  EXPECT_EQ(OpenRecorder(404, Json::Value()).GetErr(), Error(404));
+  for (const Json::Value& details : {Json::Value("text"), Json::Value(""), Json::Value(0),
+                                     Json::Value(Json::objectValue), Json::Value(false)}) {
+    Json::Value expected = Error(-7);
+    expected["err_msg"] = details;
+    EXPECT_EQ(OpenRecorder(-7, details).GetErr(), expected);
+  }
+}
+
+TEST(ErrRecorderTest, CopiesCodeAndDetails) {
+  const OpenRecorder original(5, "database is locked");
+  const ErrRecorder copy = original;
+  EXPECT_EQ(copy.GetErr(), original.GetErr());
+  ErrRecorder assigned;
+  assigned = original;
+  EXPECT_EQ(assigned.GetErr(), original.GetErr());
+  static_assert(!std::has_virtual_destructor_v<ErrRecorder>);
+  static_assert(std::has_virtual_destructor_v<SqliteDB>);
+  static_assert(!std::is_copy_constructible_v<SqliteDB> && !std::is_copy_assignable_v<SqliteDB>);
+}
+
+// A pointer to a virtual member holds its offset in the virtual table plus one.
+TEST(ErrRecorderTest, KeepsTheOrderOfItsSlots) {
+  const auto slot = [](auto member) {
+    size_t word = 0;
+    std::memcpy(&word, &member, sizeof word);
+    return (word - 1) / sizeof(void*);
+  };
+  EXPECT_EQ(slot(&ErrRecorder::GetErr), 0U);
+  EXPECT_EQ(slot(&ErrRecorder::GetErrCodeStr), 1U);
+}
+
+using SqliteDBTest = DatabaseTest;
+
+TEST_F(SqliteDBTest, ConstructionOpensNothing) {
+  EXPECT_FALSE(HasFile());
+  EXPECT_EQ(db->GetErr(), Error(0));
+  EXPECT_FALSE(db->IsExisted());
+}
+
+TEST_F(SqliteDBTest, OpenCreatesTheFileAndLeavesTheErrorAlone) {
+  db->SetDBErr(7, "before");
+  const Json::Value before = db->GetErr();
+  EXPECT_TRUE(db->Open());
+  EXPECT_TRUE(HasFile());
+  EXPECT_TRUE(db->IsExisted());
+  EXPECT_EQ(db->GetErr(), before);
+}
+
+TEST_F(SqliteDBTest, OpenOfAnOpenHandleExaminesNothing) {
+  ASSERT_TRUE(db->Exec("CREATE TEMP TABLE mine (n)"));
+  ASSERT_EQ(unlink(path.c_str()), 0);
+  refusesBusyTimeout = true;
+  EXPECT_TRUE(db->Open());
+  refusesBusyTimeout = false;
+  EXPECT_FALSE(HasFile());
+  EXPECT_THAT(Rows(*db, "SELECT count() AS n FROM mine"), ElementsAre("n:0"));
+}
+
+TEST_F(SqliteDBTest, OpenSetsTheBusyTimeoutToOneSecond) {
+  EXPECT_THAT(Rows(*db, "PRAGMA busy_timeout"), ElementsAre("timeout:1000"));
+}
+
+TEST_F(SqliteDBTest, OpenDescriptorsAreClosedOnExec) {
+  const std::set<int> before = OpenDescriptors();
+  ASSERT_TRUE(db->Exec("CREATE TABLE t (n)"));
+  int added = 0;
+  for (const int fd : OpenDescriptors()) {
+    if (before.count(fd) != 0) continue;
+    ++added;
+    EXPECT_NE(fcntl(fd, F_GETFD) & FD_CLOEXEC, 0);
+  }
+  EXPECT_EQ(added, 1);
+}
+
+TEST_F(SqliteDBTest, RefusedBusyTimeoutFailsOnceAndLeavesTheConnectionOpen) {
+  refusesBusyTimeout = true;
+  EXPECT_FALSE(db->Open());
+  ExpectLog({Warn(kFile, "Open", "Failed to set busy timeout with error")});
+  EXPECT_EQ(db->GetErr(), Error(0));
+  EXPECT_TRUE(db->Open());
+  refusesBusyTimeout = false;
+  EXPECT_THAT(Rows(*db, "PRAGMA busy_timeout"), ElementsAre("timeout:0"));
+}
+
+TEST_F(SqliteDBTest, ExecWithARefusedBusyTimeoutReadsAsAFailedOpen) {
+  refusesBusyTimeout = true;
+  EXPECT_FALSE(db->Exec("CREATE TABLE t (n)"));
+  refusesBusyTimeout = false;
+  EXPECT_EQ(db->GetErr(), Error(404));
+  ExpectLog({Warn(kFile, "Open", "Failed to set busy timeout with error"),
+             Err(kFile, "Exec", "Failed to open db [" + path + "]")});
+}
+
+TEST_F(SqliteDBTest, ExecReportsAnOpenThatGaveNoHandle) {
+  opensWithoutHandle = true;
+  EXPECT_FALSE(db->Exec("CREATE TABLE t (n)"));
+  opensWithoutHandle = false;
+  EXPECT_EQ(db->GetErr(), Error(403));
+  ExpectLog({Err(kFile, "Exec", "DB[" + path + "] is not opened")});
+}
+
+TEST_F(SqliteDBTest, SelectByCommandDoesNotCheckForAMissingHandle) {
+  const Json::Value misuse = Error(404, 21, "out of memory");
+  opensWithoutHandle = true;
+  SqliteValueList record;
+  EXPECT_FALSE(db->SelectByCommand("SELECT 1", record));
+  EXPECT_EQ(db->GetErr(), misuse);
+  Records records;
+  EXPECT_FALSE(db->SelectByCommand("SELECT 1", records));
+  EXPECT_EQ(db->GetErr(), misuse);
+  opensWithoutHandle = false;
+  ExpectLog(
+      {SelectFailed(0, "SELECT 1", misuse), ExecFailed("SelectByCommand", 0, "SELECT 1", misuse)});
+}
+
+TEST_F(SqliteDBTest, CloseOfAClosedHandleDoesNothing) {
+  db->Close();
+  ASSERT_TRUE(db->Open());
+  db->Close();
+  db->Close();
+  EXPECT_TRUE(db->Open());
+}
+
+TEST_F(SqliteDBTest, CloseEndsTheConnectionAndItsTransaction) {
+  ASSERT_TRUE(db->Exec("CREATE TABLE t (n); BEGIN; INSERT INTO t VALUES (1)"));
+  db->Close();
+  EXPECT_THAT(Rows(*db, "SELECT * FROM t"), IsEmpty());
+}
+
+TEST_F(SqliteDBTest, DestructionThroughTheHandleClosesTheConnection) {
+  const std::set<int> before = OpenDescriptors();
+  SqliteDB* const other = new SqliteDB(path, 0, "");
+  EXPECT_TRUE(other->Open());
+  EXPECT_EQ(OpenDescriptors().size(), before.size() + 1);
+  delete other;
+  EXPECT_EQ(OpenDescriptors(), before);
+}
+
+TEST_F(SqliteDBTest, StaysOpenAcrossOperationsAndFailures) {
+  ASSERT_TRUE(db->Exec("CREATE TEMP TABLE mine (n); INSERT INTO mine VALUES (1)"));
+  EXPECT_FALSE(db->Exec("no statement"));
+  SqliteValueList record;
+  EXPECT_FALSE(db->SelectByCommand("no statement", record));
+  LogCapture::Clear();
+  EXPECT_THAT(Rows(*db, "SELECT n FROM mine"), ElementsAre("n:1"));
+}
+
+TEST_F(SqliteDBTest, SingleAttemptsFailOnAClosedHandle) {
+  const OpenRecorder raw(21, "out of memory");
+  SqliteValueList record;
+  Records records;
+  EXPECT_FALSE(db->DoExecSqliteCommand("CREATE TABLE t (n)"));
+  EXPECT_EQ(db->GetErr(), raw.GetErr());
+  EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT 1 AS n", record));
+  EXPECT_EQ(db->GetErr(), raw.GetErr());
+  EXPECT_FALSE(db->DoSelectSqliteRecords("SELECT 1 AS n", records));
+  EXPECT_EQ(db->GetErr(), raw.GetErr());
+  EXPECT_FALSE(HasFile());
+  EXPECT_EQ(record.ToStr(), "");
+  EXPECT_THAT(records, IsEmpty());
+}
+
+TEST_F(SqliteDBTest, SingleExecRecordsTheRawFailureAndNoSuccess) {
+  ASSERT_TRUE(db->Open());
+  EXPECT_FALSE(db->DoExecSqliteCommand("DROP TABLE missing"));
+  const Json::Value failure = OpenRecorder(1, "no such table: missing").GetErr();
+  EXPECT_EQ(db->GetErr(), failure);
+  EXPECT_TRUE(db->DoExecSqliteCommand("CREATE TABLE t (n)"));
+  EXPECT_EQ(db->GetErr(), failure);
+  EXPECT_TRUE(db->DoExecSqliteCommand(""));
+  EXPECT_EQ(db->GetErr(), failure);
+}
+
+TEST_F(SqliteDBTest, SingleSelectsRecordTheRawFailureAndClearItOnSuccess) {
+  ASSERT_TRUE(db->Open());
+  const Json::Value failure = OpenRecorder(1, "no such table: missing").GetErr();
+  SqliteValueList record;
+  Records records;
+  EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT * FROM missing", record));
+  EXPECT_EQ(db->GetErr(), failure);
+  EXPECT_TRUE(db->DoSelectSqliteRecord("SELECT 1 AS n", record));
+  EXPECT_EQ(db->GetErr(), Error(0));
+  EXPECT_FALSE(db->DoSelectSqliteRecords("SELECT * FROM missing", records));
+  EXPECT_EQ(db->GetErr(), failure);
+  EXPECT_TRUE(db->DoSelectSqliteRecords("SELECT 1 AS n WHERE 0", records));
+  EXPECT_EQ(db->GetErr(), Error(0));
+}
+
+// A text without a statement compiles to nothing, and stepping nothing is a misuse.
+TEST_F(SqliteDBTest, SingleSelectsFailOnATextWithoutAStatement) {
+  ASSERT_TRUE(db->Open());
+  const Json::Value misuse = OpenRecorder(21, "not an error").GetErr();
+  SqliteValueList record;
+  Records records;
+  for (const char* const blank : {"", " \n", "-- nothing", "/* nothing */", ";"}) {
+    EXPECT_FALSE(db->DoSelectSqliteRecord(blank, record));
+    EXPECT_EQ(db->GetErr(), misuse);
+    EXPECT_FALSE(db->DoSelectSqliteRecords(blank, records));
+    EXPECT_EQ(db->GetErr(), misuse);
+  }
+}
+
+TEST_F(SqliteDBTest, SetDBErrOfCodeZeroDoesNothing) {
+  db->SetDBErr(7, "kept");
+  db->SetDBErr(0, "other");
+  db->SetDBErr(0, nullptr);
+  EXPECT_EQ(db->GetErr(), OpenRecorder(7, "kept").GetErr());
+}
+
+TEST_F(SqliteDBTest, SetDBErrTakesTheGivenMessageOrTheConnections) {
+  const SqliteDB& constant = *db;
+  constant.SetDBErr(26, "given");
+  EXPECT_EQ(db->GetErr(), OpenRecorder(26, "given").GetErr());
+  constant.SetDBErr(-3, "");
+  EXPECT_EQ(db->GetErr(), OpenRecorder(-3, "").GetErr());
+  ASSERT_TRUE(db->Open());
+  constant.SetDBErr(8, nullptr);
+  EXPECT_EQ(db->GetErr(), OpenRecorder(8, "not an error").GetErr());
+}
+
+TEST_F(SqliteDBTest, SetDBErrClassifiesBusyAndLockedAsALockAndAllElseAsAFailure) {
+  const SqliteDB& constant = *db;
+  for (const int code : {5, 6}) {
+    constant.SetDBErr(OpenRecorder(code, "text"));
+    EXPECT_EQ(db->GetErr(), Error(405, code, "text"));
+  }
+  for (const int code : {1, 2, 3, 4, 7, 8, 10, 26, 100, 101, 261, 262, 404, 405, -5}) {
+    constant.SetDBErr(OpenRecorder(code, "text"));
+    EXPECT_EQ(db->GetErr(), Error(404, code, "text"));
+  }
+}
+
+TEST_F(SqliteDBTest, SetDBErrKeepsOnlyTheDetailsThatAreThere) {
+  db->SetDBErr(7, "before");
+  db->SetDBErr(ErrRecorder());
+  EXPECT_EQ(db->GetErr(), Error(404));
+  db->SetDBErr(OpenRecorder(5, Json::Value()));
+  Json::Value codeOnly = Error(405);
+  codeOnly["err_msg"]["sqlite_errcode"] = 5;
+  EXPECT_EQ(db->GetErr(), codeOnly);
+  db->SetDBErr(OpenRecorder(0, "text"));
+  Json::Value textOnly = Error(404);
+  textOnly["err_msg"]["sqlite_errmsg"] = "text";
+  EXPECT_EQ(db->GetErr(), textOnly);
+}
+
+TEST_F(SqliteDBTest, SetDBErrClassifiesItsOwnError) {
+  db->SetDBErr(6, "database table is locked");
+  db->SetDBErr(*db);
+  EXPECT_EQ(db->GetErr(), Error(405, 6, "database table is locked"));
+}
+
+TEST_F(SqliteDBTest, ErrorsCarryNoName) { EXPECT_EQ(db->GetErrCodeStr(404), ""); }
+
+TEST_F(SqliteDBTest, FailureLineShowsTheErrorOfTheSubclass) {
+  class NamingDB : public SqliteDB {
+   public:
+    using SqliteDB::SqliteDB;
+    std::string GetErrCodeStr(int code) const override { return KeloDRCore::ERR::ToString(code); }
+  };
+  NamingDB named(path, 0, "");
+  EXPECT_FALSE(named.Exec("DROP TABLE missing"));
+  Json::Value expected = Error(404, 1, "no such table: missing");
+  expected["err_code_str"] = KeloDRCore::ERR::ToString(404);
+  EXPECT_EQ(named.GetErr(), expected);
+  ExpectLog({ExecFailed("Exec", 0, "DROP TABLE missing", expected)});
+}
+
+TEST_F(SqliteDBTest, ExecRunsAStatementWithoutALine) {
+  EXPECT_TRUE(db->Exec("CREATE TABLE t (n)"));
+  EXPECT_TRUE(HasFile());
+  EXPECT_EQ(db->GetErr(), Error(0));
+}
+
+TEST_F(SqliteDBTest, ExecClearsTheErrorBeforeIt) {
+  db->SetDBErr(7, "before");
+  EXPECT_TRUE(db->Exec("CREATE TABLE t (n)"));
+  EXPECT_EQ(db->GetErr(), Error(0));
+}
+
+TEST_F(SqliteDBTest, EmptyStatementsFailWithoutOpening) {
+  EXPECT_FALSE(db->Exec(""));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  SqliteValueList record;
+  Records records;
+  db->SetDBErr(7, "before");
+  EXPECT_FALSE(db->SelectByCommand("", record));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  db->SetDBErr(7, "before");
+  EXPECT_FALSE(db->SelectByCommand("", records));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(HasFile());
+  ExpectLog({Err(kFile, "Exec", "empty command to exec db[" + path + "]"),
+             Err(kFile, "SelectByCommand", "Empty command to select record"),
+             Err(kFile, "SelectByCommand", "Empty command to select records")});
+}
+
+TEST_F(SqliteDBTest, SyntaxErrorsAreNotRetried) {
+  const Json::Value failure = Error(404, 1, "near \"nonsense\": syntax error");
+  Pauses::Start();
+  SqliteDB patient(path, 5, "");
+  SqliteValueList record;
+  Records records;
+  EXPECT_FALSE(patient.Exec("nonsense"));
+  EXPECT_EQ(patient.GetErr(), failure);
+  EXPECT_FALSE(patient.SelectByCommand("nonsense", record));
+  EXPECT_EQ(patient.GetErr(), failure);
+  EXPECT_FALSE(patient.SelectByCommand("nonsense", records));
+  EXPECT_EQ(patient.GetErr(), failure);
+  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  ExpectLog({ExecFailed("Exec", 0, "nonsense", failure), SelectFailed(0, "nonsense", failure),
+             ExecFailed("SelectByCommand", 0, "nonsense", failure)});
+}
+
+TEST_F(SqliteDBTest, BlankStatementsRunInExecAndFailInAQuery) {
+  const Json::Value misuse = Error(404, 21, "not an error");
+  for (const char* const blank : {" ", "-- comment", "/* */;"}) {
+    EXPECT_TRUE(db->Exec(blank));
+    EXPECT_EQ(db->GetErr(), Error(0));
+    Records records;
+    EXPECT_FALSE(db->SelectByCommand(blank, records));
+    EXPECT_EQ(db->GetErr(), misuse);
+    ExpectLog({ExecFailed("SelectByCommand", 0, blank, misuse)});
+  }
+}
+
+TEST_F(SqliteDBTest, ExecRunsEveryStatementAndAQueryTheFirst) {
+  EXPECT_TRUE(db->Exec("CREATE TABLE t (n); INSERT INTO t VALUES (1); INSERT INTO t VALUES (2)"));
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t; DELETE FROM t"), ElementsAre("n:1", "n:2"));
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t; nonsense"), ElementsAre("n:1", "n:2"));
+}
+
+TEST_F(SqliteDBTest, ExecKeepsWhatRanBeforeTheFailingStatement) {
+  const std::string sql = "CREATE TABLE t (n); nonsense; DROP TABLE t";
+  EXPECT_FALSE(db->Exec(sql));
+  ExpectLog({ExecFailed("Exec", 0, sql, Error(404, 1, "near \"nonsense\": syntax error"))});
+  EXPECT_THAT(Rows(*db, "SELECT name FROM sqlite_master"), ElementsAre("name:'t'"));
+}
+
+TEST_F(SqliteDBTest, ExecDiscardsRows) {
+  EXPECT_TRUE(db->Exec("SELECT 1 UNION SELECT NULL"));
+  EXPECT_EQ(db->GetErr(), Error(0));
+}
+
+TEST_F(SqliteDBTest, QueryRunsAStatementWithoutRows) {
+  Records records;
+  SqliteValueList record;
+  EXPECT_TRUE(db->SelectByCommand("CREATE TABLE t (n)", records));
+  EXPECT_TRUE(db->SelectByCommand("INSERT INTO t VALUES (1)", record));
+  EXPECT_THAT(records, IsEmpty());
+  EXPECT_EQ(record.ToStr(), "");
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1"));
+}
+
+TEST_F(SqliteDBTest, StatementEndsAtAnEmbeddedNul) {
+  using std::string_literals::operator""s;
+  EXPECT_TRUE(db->Exec("CREATE TABLE t (n)\0 nonsense"s));
+  EXPECT_THAT(Rows(*db, "SELECT 1 AS n\0 nonsense"s), ElementsAre("n:1"));
+}
+
+TEST_F(SqliteDBTest, FailureNamesBytesThatAreNotUtf8) {
+  EXPECT_FALSE(db->Exec("DROP TABLE \"\xff\xfe'\x01\""));
+  EXPECT_EQ(db->GetErr(), Error(404, 1, "no such table: \xff\xfe'\x01"));
+  EXPECT_EQ(LogCapture::Take().size(), 1U);
+}
+
+}  // namespace

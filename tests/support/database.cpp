@@ -1,0 +1,122 @@
+#include "support/database.h"
+
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <time.h>
+#include <unistd.h>
+
+#include "kelodrcore/json_value.h"
+
+using KeloDRCore::SqliteDB;
+using KeloDRCore::SqliteValueList;
+
+namespace {
+
+constexpr useconds_t kSecond = 1000000;
+
+std::function<void()> pauseAction;
+std::vector<unsigned int> pauseLengths;
+useconds_t sqliteSleeps = 0;
+bool areSqliteSleepsSkipped = false;
+
+int failuresLeft = 0;
+
+void Fail(sqlite3_context* context, int /*count*/, sqlite3_value** arguments) {
+  const int code = sqlite3_value_int(arguments[0]);
+  if (failuresLeft > 0) {
+    --failuresLeft;
+    sqlite3_result_error_code(context, code);
+  } else {
+    sqlite3_result_int(context, code);
+  }
+}
+
+int AddFail(sqlite3* db, char** /*error*/, const void* /*api*/) {
+  return sqlite3_create_function(db, "fail", 1, SQLITE_UTF8, nullptr, Fail, nullptr, nullptr);
+}
+
+std::string FailureText(unsigned int retries, const std::string& wording, const std::string& sql,
+                        const Json::Value& error) {
+  return "Reach retry limit [" + std::to_string(retries) + "], failed to " + wording + "[" + sql +
+         "] with err [" + KeloDRCore::JsonValue::toString(error) + "]";
+}
+
+}  // namespace
+
+// The linker lets this stand before the C library's, for the shared libraries as well.
+extern "C" int usleep(useconds_t microseconds) {
+  if (microseconds >= kSecond) {
+    pauseLengths.push_back(microseconds / 1000);
+    if (pauseAction) pauseAction();
+    return 0;
+  }
+  sqliteSleeps += microseconds;
+  if (areSqliteSleepsSkipped) return 0;
+  const timespec length = {0, static_cast<long>(microseconds) * 1000};
+  return nanosleep(&length, nullptr);
+}
+
+void DatabaseTest::SetUp() {
+  CleanTest::SetUp();
+  path = Path("it's a base");
+  db = std::make_unique<SqliteDB>(path, 0U, "label");
+  Pauses::Start();
+}
+
+void DatabaseTest::TearDown() {
+  db.reset();
+  CleanTest::TearDown();
+}
+
+bool DatabaseTest::HasFile() const { return access(path.c_str(), F_OK) == 0; }
+
+Json::Value Error(int code) {
+  Json::Value error;
+  error["err_code"] = code;
+  return error;
+}
+
+Json::Value Error(int code, int sqliteCode, const std::string& sqliteMessage) {
+  Json::Value error = Error(code);
+  error["err_msg"]["sqlite_errcode"] = sqliteCode;
+  error["err_msg"]["sqlite_errmsg"] = sqliteMessage;
+  return error;
+}
+
+std::vector<std::string> Rows(SqliteDB& db, const std::string& sql) {
+  std::vector<SqliteValueList> records;
+  EXPECT_TRUE(db.SelectByCommand(sql, records)) << db.GetErr();
+  std::vector<std::string> rows;
+  for (const SqliteValueList& record : records) rows.push_back(record.ToStr());
+  return rows;
+}
+
+LogLine ExecFailed(const std::string& function, unsigned int retries, const std::string& sql,
+                   const Json::Value& error) {
+  return Err("sqlite_db.cpp", function, FailureText(retries, "exec command ", sql, error));
+}
+
+LogLine SelectFailed(unsigned int retries, const std::string& sql, const Json::Value& error) {
+  return Err("sqlite_db.cpp", "SelectByCommand",
+             FailureText(retries, "select command", sql, error));
+}
+
+namespace Pauses {
+
+void Start(const std::function<void()>& onPause, bool skipSqliteSleeps) {
+  pauseAction = onPause;
+  pauseLengths.clear();
+  sqliteSleeps = 0;
+  areSqliteSleepsSkipped = skipSqliteSleeps;
+}
+
+std::vector<unsigned int> Lengths() { return pauseLengths; }
+
+unsigned int SqliteWait() { return sqliteSleeps / 1000; }
+
+}  // namespace Pauses
+
+void FailNextCalls(int times) {
+  failuresLeft = times;
+  sqlite3_auto_extension(reinterpret_cast<void (*)()>(AddFail));
+}
