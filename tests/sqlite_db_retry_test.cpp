@@ -1,0 +1,199 @@
+// Statements that find the database busy or locked, with the engine failing on request.
+
+#include <gmock/gmock.h>
+#include <sqlite3.h>
+
+#include "kelodrcore/sqlite_db.h"
+#include "support/database.h"
+
+namespace {
+
+using KeloDRCore::SqliteDB;
+using KeloDRCore::SqliteValueList;
+using testing::AllOf;
+using testing::Each;
+using testing::ElementsAre;
+using testing::Ge;
+using testing::IsEmpty;
+using testing::Le;
+using testing::SizeIs;
+
+using Records = std::vector<SqliteValueList>;
+
+const std::string kFile = "sqlite_db.cpp";
+
+class SqliteDBRetryTest : public DatabaseTest {
+ protected:
+  void SetUp() override {
+    FailNextCalls(0);
+    DatabaseTest::SetUp();
+  }
+
+  // A handle that retries `retries` times, on a table with two rows.
+  void Start(unsigned int retries) {
+    db = std::make_unique<SqliteDB>(path, retries, "label");
+    ASSERT_TRUE(db->Exec("CREATE TABLE t (n); INSERT INTO t VALUES (1), (2)"));
+  }
+};
+
+struct Failure {
+  int code;
+  const char* message;
+};
+
+const Failure kLocks[] = {{5, "database is locked"}, {6, "database table is locked"}};
+
+TEST_F(SqliteDBRetryTest, ExecSucceedsAfterOnePause) {
+  Start(1);
+  for (const Failure& lock : kLocks) {
+    const std::string sql = "INSERT INTO t VALUES (fail(" + std::to_string(lock.code) + "))";
+    FailNextCalls(1);
+    Pauses::Start([&] { EXPECT_EQ(db->GetErr(), Error(405, lock.code, lock.message)); });
+    EXPECT_TRUE(db->Exec(sql));
+    EXPECT_EQ(db->GetErr(), Error(0));
+    EXPECT_THAT(Pauses::Lengths(), SizeIs(1));
+    ExpectLog(
+        {Info(kFile, "Exec", "After retry [1] times, success to exec command [" + sql + "]")});
+  }
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1", "n:2", "n:5", "n:6"));
+}
+
+TEST_F(SqliteDBRetryTest, ExecGivesUpOnePastTheLimit) {
+  for (const unsigned int limit : {0U, 1U, 3U}) {
+    for (const Failure& lock : kLocks) {
+      SqliteDB patient(path, limit, "");
+      const std::string sql = "SELECT fail(" + std::to_string(lock.code) + ")";
+      const Json::Value failure = Error(405, lock.code, lock.message);
+      FailNextCalls(static_cast<int>(limit) + 1);
+      Pauses::Start();
+      EXPECT_FALSE(patient.Exec(sql));
+      EXPECT_EQ(patient.GetErr(), failure);
+      EXPECT_THAT(Pauses::Lengths(), AllOf(SizeIs(limit), Each(AllOf(Ge(1000U), Le(2000U)))));
+      ExpectLog({ExecFailed("Exec", limit + 1, sql, failure)});
+      // All failures are used up, so that there were limit + 1 attempts.
+      EXPECT_TRUE(patient.Exec(sql));
+      EXPECT_THAT(Pauses::Lengths(), SizeIs(limit));
+    }
+  }
+}
+
+TEST_F(SqliteDBRetryTest, ExecSucceedsOnTheLastAttempt) {
+  Start(3);
+  FailNextCalls(3);
+  EXPECT_TRUE(db->Exec("SELECT fail(5)"));
+  EXPECT_THAT(Pauses::Lengths(), SizeIs(3));
+  ExpectLog(
+      {Info(kFile, "Exec", "After retry [3] times, success to exec command [SELECT fail(5)]")});
+}
+
+TEST_F(SqliteDBRetryTest, TheTwoQueriesCrossTheirWordings) {
+  Start(2);
+  const std::string sql = "SELECT fail(6) AS n";
+  const Json::Value failure = Error(405, 6, "database table is locked");
+  SqliteValueList record;
+  Records records;
+  FailNextCalls(2);
+  EXPECT_TRUE(db->SelectByCommand(sql, record));
+  EXPECT_EQ(db->GetErr(), Error(0));
+  FailNextCalls(2);
+  EXPECT_TRUE(db->SelectByCommand(sql, records));
+  EXPECT_EQ(db->GetErr(), Error(0));
+  FailNextCalls(3);
+  EXPECT_FALSE(db->SelectByCommand(sql, record));
+  EXPECT_EQ(db->GetErr(), failure);
+  FailNextCalls(3);
+  EXPECT_FALSE(db->SelectByCommand(sql, records));
+  EXPECT_EQ(db->GetErr(), failure);
+  EXPECT_THAT(Pauses::Lengths(), SizeIs(8));
+  ExpectLog({Info(kFile, "SelectByCommand",
+                  "After retry [2] times, success to exec command [" + sql + "]"),
+             Info(kFile, "SelectByCommand", "After retry [2] times, success to select command"),
+             SelectFailed(3, sql, failure), ExecFailed("SelectByCommand", 3, sql, failure)});
+}
+
+TEST_F(SqliteDBRetryTest, QueriesWithLimitZeroMakeOneAttempt) {
+  Start(0);
+  const std::string sql = "SELECT fail(5) AS n";
+  const Json::Value failure = Error(405, 5, "database is locked");
+  SqliteValueList record;
+  Records records;
+  FailNextCalls(1);
+  EXPECT_FALSE(db->SelectByCommand(sql, record));
+  FailNextCalls(1);
+  EXPECT_FALSE(db->SelectByCommand(sql, records));
+  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  ExpectLog({SelectFailed(1, sql, failure), ExecFailed("SelectByCommand", 1, sql, failure)});
+}
+
+TEST_F(SqliteDBRetryTest, EveryOtherFailureEndsAtOnce) {
+  Start(3);
+  for (const int code :
+       {1, 2, 3, 4, 8, 9, 10, 11, 12, 13, 14, 15, 16, 18, 19, 20, 22, 23, 24, 25, 26}) {
+    const std::string sql = "SELECT fail(" + std::to_string(code) + ")";
+    FailNextCalls(1);
+    EXPECT_FALSE(db->Exec(sql));
+    EXPECT_EQ(db->GetErr(), Error(404, code, sqlite3_errstr(code)));
+    ExpectLog({ExecFailed("Exec", 0, sql, Error(404, code, sqlite3_errstr(code)))});
+    SqliteValueList record;
+    FailNextCalls(1);
+    EXPECT_FALSE(db->SelectByCommand(sql, record));
+    EXPECT_EQ(db->GetErr(), Error(404, code, sqlite3_errstr(code)));
+    LogCapture::Clear();
+  }
+  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+}
+
+TEST_F(SqliteDBRetryTest, AnotherFailureAfterRetriesShowsThePausesMade) {
+  Start(5);
+  const std::string sql = "INSERT INTO late SELECT fail(5)";
+  const Json::Value failure = Error(404, 1, "no such table: late");
+  ASSERT_TRUE(db->Exec("CREATE TABLE late (n)"));
+  SqliteDB other(path, 0, "");
+  FailNextCalls(100);
+  Pauses::Start([&] {
+    if (Pauses::Lengths().size() < 2) return;
+    EXPECT_TRUE(other.Exec("DROP TABLE late"));
+  });
+  EXPECT_FALSE(db->Exec(sql));
+  EXPECT_EQ(db->GetErr(), failure);
+  EXPECT_THAT(Pauses::Lengths(), SizeIs(2));
+  ExpectLog({ExecFailed("Exec", 2, sql, failure)});
+}
+
+TEST_F(SqliteDBRetryTest, RowsOfAFailedAttemptStayWhenItIsTriedAgain) {
+  Start(1);
+  Records records;
+  FailNextCalls(1);
+  EXPECT_TRUE(
+      db->SelectByCommand("SELECT n FROM t UNION ALL SELECT fail(5) UNION ALL SELECT 9", records));
+  std::vector<std::string> rows;
+  for (const SqliteValueList& record : records) rows.push_back(record.ToStr());
+  EXPECT_THAT(rows, ElementsAre("n:1", "n:2", "n:1", "n:2", "n:5", "n:9"));
+  ExpectLog({Info(kFile, "SelectByCommand", "After retry [1] times, success to select command")});
+}
+
+TEST_F(SqliteDBRetryTest, SingleAttemptsNeverRetry) {
+  Start(3);
+  SqliteValueList record;
+  Records records;
+  FailNextCalls(3);
+  EXPECT_FALSE(db->DoExecSqliteCommand("SELECT fail(5)"));
+  EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT fail(5)", record));
+  EXPECT_FALSE(db->DoSelectSqliteRecords("SELECT fail(5)", records));
+  Json::Value raw = Error(5);
+  raw["err_msg"] = "database is locked";
+  EXPECT_EQ(db->GetErr(), raw);
+  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+}
+
+TEST_F(SqliteDBRetryTest, TheConnectionIsKeptBetweenAttempts) {
+  Start(2);
+  ASSERT_TRUE(db->Exec("CREATE TEMP TABLE mine (n)"));
+  FailNextCalls(2);
+  const std::string sql = "INSERT INTO mine SELECT fail(5)";
+  EXPECT_TRUE(db->Exec(sql));
+  LogCapture::Clear();
+  EXPECT_THAT(Rows(*db, "SELECT n FROM mine"), ElementsAre("n:5"));
+}
+
+}  // namespace
