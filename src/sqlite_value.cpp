@@ -171,7 +171,7 @@ SqliteValueList& SqliteValueList::operator=(const SqliteValueList& other) {
 }
 
 SqliteValueList& SqliteValueList::operator=(SqliteValueList&& other) noexcept {
-  values = std::move(other.values);
+  values.swap(other.values);  // other than a move, also right for a list given to itself
   return *this;
 }
 

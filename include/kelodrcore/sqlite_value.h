@@ -44,7 +44,7 @@ class KELODR_EXPORT SqliteValue {
   SqliteValue(const char* text);
 
   /// Other pointers would turn into a bool.
-  template <typename T, typename = std::enable_if_t<!std::is_same_v<std::remove_cv_t<T>, char>>>
+  template <typename T, typename = std::enable_if_t<!std::is_same_v<std::remove_const_t<T>, char>>>
   SqliteValue(T* pointer) = delete;
 
   /// Real numbers would lose their fraction.
