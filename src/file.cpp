@@ -1,0 +1,294 @@
+#include "kelodrcore/file.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <ext/stdio_filebuf.h>
+#include <istream>
+#include <limits>
+#include <locale>
+#include <memory>
+#include <utility>
+
+#include "kelocore.h"
+#include "kelodrcore/json_value.h"
+#include "log.h"
+#include "privilege.h"
+
+namespace KeloDRCore::File {
+namespace {
+
+struct StreamCloser {
+  void operator()(FILE* stream) const { fclose(stream); }
+};
+using Stream = std::unique_ptr<FILE, StreamCloser>;
+
+// An input file stream with close-on-exec, which std::ifstream cannot set.
+class InputFile {
+ public:
+  explicit InputFile(const std::string& path)
+      : buffer(open(path.c_str(), O_RDONLY | O_CLOEXEC), std::ios::in), lines(&buffer) {}
+
+  bool IsOpen() const { return buffer.is_open(); }
+  bool NextLine(std::string& line) { return static_cast<bool>(std::getline(lines, line)); }
+
+ private:
+  __gnu_cxx::stdio_filebuf<char> buffer;
+  std::istream lines;
+};
+
+// fgets, except that an interrupted read is taken up again: fgets loses what it has read when a
+// signal handler returns into it.
+template <int kSize>
+bool ReadChunk(FILE* stream, char (&chunk)[kSize]) {
+  int length = 0;
+  while (length < kSize - 1 && (length == 0 || chunk[length - 1] != '\n')) {
+    const int byte = getc(stream);
+    if (byte != EOF) {
+      chunk[length++] = static_cast<char>(byte);
+    } else if (ferror(stream) != 0 && errno == EINTR) {
+      clearerr(stream);
+    } else {
+      break;
+    }
+  }
+  chunk[length] = '\0';
+  return length > 0;
+}
+
+enum class WriteResult { kDone, kWriteFailed, kFlushFailed, kSyncFailed };
+
+WriteResult WriteAndSync(FILE* stream, int fd, const Json::Value& value) {
+  if (fprintf(stream, "%s", JsonValue::toString(value).c_str()) < 0) {
+    return WriteResult::kWriteFailed;
+  }
+  if (fflush(stream) != 0) return WriteResult::kFlushFailed;
+  return fsync(fd) == 0 ? WriteResult::kDone : WriteResult::kSyncFailed;
+}
+
+}  // namespace
+
+bool Read(const std::string& path, Json::Value& value) {
+  if (path.empty()) {
+    KELODR_LOG(ERR, __func__, "%s", "Invalid path");
+    return false;
+  }
+  if (access(path.c_str(), F_OK) != 0) {
+    KELODR_LOG(DEBUG, __func__, "file[%s] is not existed", path.c_str());
+    return true;
+  }
+  InputFile file(path);
+  if (!file.IsOpen()) {
+    KELODR_LOG(ERR, __func__, "File[%s] is not opened.", path.c_str());
+    return false;
+  }
+  std::string content;
+  for (std::string line; file.NextLine(line);) content += line;
+  return JsonValue::fromString(value, content);
+}
+
+bool Read(int fd, Json::Value& value) {
+  const Stream stream(fdopen(fd, "r"));
+  if (!stream) {
+    KELODR_LOG(ERR, __func__, "Failed to open file descriptor [%d]", fd);
+    return false;
+  }
+  std::string content;
+  char chunk[1024];
+  while (ReadChunk(stream.get(), chunk)) content += chunk;
+  return JsonValue::fromString(value, content);
+}
+
+bool Write(const std::string& path, const Json::Value& value) {
+  if (path.empty()) {
+    KELODR_LOG(ERR, __func__, "%s", "Empty path to write.");
+    return false;
+  }
+  const Stream stream(fopen(path.c_str(), "we"));
+  if (!stream) {
+    KELODR_LOG(ERR, __func__, "Failed to open file [%s]", path.c_str());
+    return false;
+  }
+  const WriteResult result = WriteAndSync(stream.get(), fileno(stream.get()), value);
+  if (result == WriteResult::kWriteFailed) {
+    KELODR_LOG(ERR, __func__, "Failed to write [%s] to [%s].", JsonValue::toString(value).c_str(),
+               path.c_str());
+  } else if (result == WriteResult::kFlushFailed) {
+    KELODR_LOG(ERR, __func__, "Failed to flush file[%s]", path.c_str());
+  } else if (result == WriteResult::kSyncFailed) {
+    KELODR_LOG(ERR, __func__, "Failed to sync file [%s]", path.c_str());
+  }
+  return result == WriteResult::kDone;
+}
+
+bool Write(int fd, const Json::Value& value) {
+  const Stream stream(fdopen(fd, "w"));
+  if (!stream) {
+    KELODR_LOG(ERR, __func__, "Failed to open file descriptor [%d]", fd);
+    return false;
+  }
+  const WriteResult result = WriteAndSync(stream.get(), fd, value);
+  if (result == WriteResult::kWriteFailed) {
+    KELODR_LOG(ERR, __func__, "Failed to write [%s] to fd[%d]", JsonValue::toString(value).c_str(),
+               fd);
+  } else if (result == WriteResult::kFlushFailed) {
+    KELODR_LOG(ERR, __func__, "%s", "Failed to flush file");
+  } else if (result == WriteResult::kSyncFailed) {
+    KELODR_LOG(ERR, __func__, "%s", "Failed to sync file");
+  }
+  return result == WriteResult::kDone;
+}
+
+bool CreateDir(const std::string& path, int mode) {
+  if (path.empty()) return false;
+  if (KLIBCFileCheckDir(path.c_str()) == 1) return true;
+
+  const auto bits = static_cast<unsigned int>(mode);
+  if (mode > 0777) {
+    KELODR_LOG(ERR, __func__, "Directory mode error: %o", bits);
+    return false;
+  }
+  char modeText[4];
+  if (snprintf(modeText, sizeof(modeText), "%o", bits) >= static_cast<int>(sizeof(modeText))) {
+    KELODR_LOG(ERR, __func__, "snprintf error with mode [%o]", bits);
+    return false;
+  }
+
+  KELODR_PRIVILEGED();
+  if (KLIBCExec("/bin/mkdir", "-p", path.c_str(), "-m", modeText) != 0) {
+    KELODR_LOG(ERR, __func__, "Failed to create dir [%s] with mode [%o]", path.c_str(), bits);
+    return false;
+  }
+  return true;
+}
+
+bool RemoveDir(const std::string& path) {
+  if (KLIBCFileCheckDir(path.c_str()) == 0) return true;
+  return KLIBCExec("/bin/rm", "-rf", path.c_str(), nullptr, nullptr) == 0;
+}
+
+std::string GetParentDir(const std::string& path) { return path.substr(0, path.rfind('/')); }
+
+bool IsRegularFile(int fd) {
+  struct stat status = {};
+  return fd >= 0 && fstat(fd, &status) == 0 && S_ISREG(status.st_mode);
+}
+
+namespace {
+
+constexpr char kSeparator[] = "=";
+constexpr char kWhiteSpace[] = " \t\n\v\f\r";  // of the classic locale
+
+// What a formatted extraction does with a number, without a stream a number: the standard facet
+// reads straight from the text.
+class NumberReader : private std::num_get<char, const char*> {
+ public:
+  NumberReader() : format(nullptr) { format.imbue(std::locale::classic()); }
+
+  void Extract(const std::string& text, double& out) const { Get(text, out); }
+
+  void Extract(const std::string& text, int& out) const {
+    long wide = 0;
+    Get(text, wide);
+    constexpr long kMin = std::numeric_limits<int>::min();
+    constexpr long kMax = std::numeric_limits<int>::max();
+    out = static_cast<int>(std::clamp(wide, kMin, kMax));
+  }
+
+ private:
+  template <typename Number>
+  void Get(const std::string& text, Number& out) const {
+    const size_t begin = text.find_first_not_of(kWhiteSpace);
+    if (begin == std::string::npos) return;
+    std::ios_base::iostate ignored = std::ios_base::goodbit;
+    get(text.data() + begin, text.data() + text.size(), format, ignored, out);
+  }
+
+  // The facet takes flags and locale from here.
+  mutable std::basic_ios<char> format;
+};
+
+template <typename V>
+bool Convert(const NumberReader& reader, const std::string& text, V& out) {
+  if constexpr (std::is_arithmetic_v<V>) {
+    if (text.empty()) return false;
+    reader.Extract(text, out);
+    return true;
+  } else {
+    return toType(text, out, V());
+  }
+}
+
+// `key` and `value` come in empty or 0. `text` is room that is used again for the next line.
+template <typename V>
+bool parseLineKeyValue(const NumberReader& reader, const std::string& line, std::string& text,
+                       std::string& key, V& value) {
+  if (line.empty()) {
+    KELODR_LOG(WARN, __func__, "%s", "Bad Parameter.");
+    return false;
+  }
+  const size_t end = line.find(kSeparator);
+  if (end == std::string::npos) {
+    KELODR_LOG(NOTICE, __func__, "Cannot find separator[%s] in line[%s]", kSeparator, line.c_str());
+    return false;
+  }
+  text.assign(line, 0, end);
+  if (!toType(text, key, std::string())) return false;
+  text.assign(line, end + 1);
+  return Convert(reader, text, value);
+}
+
+}  // namespace
+
+template <typename K, typename V>
+bool toType(const K& text, V& out, const V& defaultValue) {
+  if (text.empty()) {
+    out = defaultValue;
+    return false;
+  }
+  const size_t begin = text.find_first_not_of(kWhiteSpace);
+  if (begin != std::string::npos) {
+    out = text.substr(begin, text.find_first_of(kWhiteSpace, begin) - begin);
+  }
+  return true;
+}
+
+template <typename K, typename V>
+int Read(const std::string& path, std::map<K, V>& map) {
+  if (path.empty()) {
+    KELODR_LOG(ERR, __func__, "%s", "Invalid path");
+    return -1;
+  }
+  if (access(path.c_str(), F_OK) != 0) return 0;
+  InputFile file(path);
+  if (!file.IsOpen()) {
+    KELODR_LOG(WARN, __func__, "File[%s] is not opened.", path.c_str());
+    return -1;
+  }
+  std::map<K, V> entries;  // apart from `map`, of which `path` may be a part
+  const NumberReader reader;
+  std::string text;
+  for (std::string line; file.NextLine(line);) {
+    K key{};
+    V value{};
+    if (parseLineKeyValue(reader, line, text, key, value)) {
+      entries[std::move(key)] = std::move(value);
+    } else {
+      KELODR_LOG(NOTICE, __func__, "Failed to parse line[%s] from file [%s]", line.c_str(),
+                 path.c_str());
+    }
+  }
+  map = std::move(entries);
+  return static_cast<int>(map.size());
+}
+
+template int Read(const std::string&, std::map<std::string, std::string>&);
+template int Read(const std::string&, std::map<std::string, int>&);
+template int Read(const std::string&, std::map<std::string, double>&);
+template bool toType(const std::string&, std::string&, const std::string&);
+
+}  // namespace KeloDRCore::File
