@@ -28,7 +28,7 @@ packages_of() {
     docs) echo doxygen graphviz ;;
     web) echo lighttpd curl ;;
     bench) echo libbenchmark-dev ;;
-    fuzz) echo clang ;;
+    fuzz) echo clang libclang-rt-14-dev ;;
     coverage) echo gcovr ;;
     *) echo "setup.sh: there is no group '$1'; scripts/setup.sh without one lists them" >&2; return 1 ;;
   esac

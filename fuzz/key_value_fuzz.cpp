@@ -1,0 +1,68 @@
+// Any bytes as a key=value file, against a reader made of the standard library's extraction alone.
+
+#include <kelodrcore/file.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <map>
+#include <sstream>
+
+#include "fuzz.h"
+
+namespace {
+
+namespace File = KeloDRCore::File;
+
+template <typename V>
+V Extract(const std::string& text) {
+  std::istringstream stream(text);
+  V value{};
+  stream >> value;
+  return value;
+}
+
+template <typename V>
+std::map<std::string, V> Reference(const std::string& text) {
+  std::map<std::string, V> result;
+  std::istringstream lines(text);
+  for (std::string line; std::getline(lines, line);) {
+    const size_t equal = line.find('=');
+    if (equal == std::string::npos || equal == 0 || equal + 1 == line.size()) continue;
+    result[Extract<std::string>(line.substr(0, equal))] = Extract<V>(line.substr(equal + 1));
+  }
+  return result;
+}
+
+// A NaN is equal to nothing.
+template <typename V>
+bool IsSame(const V& one, const V& other) {
+  return one == other || (one != one && other != other);
+}
+
+template <typename V>
+void Check(const std::string& path, const std::string& text) {
+  std::map<std::string, V> map;
+  const int count = File::Read(path, map);
+  const std::map<std::string, V> expected = Reference<V>(text);
+  Require(count == int(expected.size()) && map.size() == expected.size(),
+          "the entries are counted");
+  auto other = expected.begin();
+  for (const auto& [key, value] : map) {
+    Require(key == other->first, "keys are those of formatted extraction");
+    Require(IsSame(value, other->second), "values are those of formatted extraction");
+    ++other;
+  }
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  static const int fd = memfd_create("fuzz", MFD_CLOEXEC);
+  static const std::string path = "/proc/self/fd/" + std::to_string(fd);
+  Require(ftruncate(fd, 0) == 0 && pwrite(fd, data, size, 0) == ssize_t(size), "the file is there");
+  const std::string text(reinterpret_cast<const char*>(data), size);
+  Check<std::string>(path, text);
+  Check<int>(path, text);
+  Check<double>(path, text);
+  return 0;
+}
