@@ -14,6 +14,7 @@
 #include <cerrno>
 #include <climits>
 #include <csignal>
+#include <cstdlib>
 #include <string>
 #include <thread>
 
@@ -127,7 +128,8 @@ TEST_F(PidFileTest, ReadsZeroForWhatIsNotAPid) {
         std::string("abc"), std::string("12x"), std::string("x12"), std::string("0x10"),
         std::string("1.5"), std::string("12 34"), std::string("2147483648"),
         std::string("4294967297"), std::string("18446744073709551617"), std::string("12\0", 3),
-        std::string(200, '1'), std::string(100000, ' ') + "1"}) {
+        std::string(200, '1'), "12" + std::string(200, ' ') + "x",
+        std::string(100000, ' ') + "1"}) {
     EXPECT_EQ(ReadOf(text), 0) << text.substr(0, 30);
   }
 }
@@ -224,6 +226,25 @@ TEST_F(PidFileTest, DoesNotWriteThroughAPlantedHardLink) {
   WriteText(Path("victim"), "precious");
   ASSERT_EQ(link(Path("victim").c_str(), path.c_str()), 0);
   EXPECT_EQ(KLIBCProcPidFileCreate(path.c_str()), 0);
+  EXPECT_EQ(ReadText(Path("victim")), "precious");
+}
+
+// Whoever may write to the directory can put the link back at any moment.
+TEST_F(PidFileTest, DoesNotWriteThroughALinkPlantedAgainAndAgain) {
+  WriteText(Path("victim"), "precious");
+  std::atomic<bool> done{false};
+  std::thread attacker([&] {
+    while (!done) {
+      if (symlink("victim", path.c_str()) != 0 && errno != EEXIST) abort();
+    }
+  });
+  for (int i = 0; i < 5000; ++i) {
+    if (KLIBCProcPidFileCreate(path.c_str()) != 0) {
+      EXPECT_EQ(errno, EEXIST);
+    }
+  }
+  done = true;
+  attacker.join();
   EXPECT_EQ(ReadText(Path("victim")), "precious");
 }
 
