@@ -22,6 +22,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <optional>
@@ -34,6 +35,7 @@ constexpr int kMaxLinks = 40;                // as many as the kernel follows
 constexpr int kMaxAttempts = 60000;          // a minute of pauses
 constexpr useconds_t kPause = 1000;          // microseconds
 constexpr size_t kMaxNameInTemporary = 100;  // some file systems allow 143 bytes a name
+constexpr size_t kSmallestRead = 4096;
 constexpr mode_t kPermissionBits = 07777;
 
 // The one rule for calls that a signal interrupts: they are made again.
@@ -121,7 +123,9 @@ bool WriteAll(const Descriptor& file, const std::string& text) {
 
 bool ReadAll(const Descriptor& file, size_t expected, std::string& text) {
   size_t done = 0;
-  text.resize(expected + 1);  // the byte more finds the end without growing
+  // The byte more finds the end without growing; files of /proc give a size of 0, and some of them
+  // their content to the first read only.
+  text.resize(std::max(expected + 1, kSmallestRead));
   while (true) {
     const ssize_t count = Retry([&] { return read(file.Get(), &text[done], text.size() - done); });
     if (count < 0) return false;

@@ -1,0 +1,355 @@
+// The text form of documents; the files are in json_value_file_test.cpp.
+
+#include "kelodrcore/json_value.h"
+
+#include <clocale>
+#include <cmath>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <limits>
+#include <locale>
+#include <memory>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "support/clean_test.h"
+
+namespace {
+
+using KeloDRCore::JsonValue::fromString;
+using KeloDRCore::JsonValue::toString;
+
+using JsonValueTest = CleanTest;
+
+Json::Value Parsed(const std::string& text) {
+  Json::Value value("untouched");
+  EXPECT_TRUE(fromString(value, text)) << text;
+  return value;
+}
+
+void ExpectRefused(const std::string& text) {
+  Json::Value value("untouched");
+  EXPECT_FALSE(fromString(value, text)) << text;
+  EXPECT_EQ(value, Json::Value("untouched")) << text;
+}
+
+std::string Nested(int levels) {
+  return std::string(static_cast<size_t>(levels), '[') +
+         std::string(static_cast<size_t>(levels), ']');
+}
+
+// What JsonCpp itself says in the classic locale.
+bool ReadByJsonCpp(const std::string& text, Json::Value& value) {
+  Json::CharReaderBuilder builder;
+  builder["failIfExtra"] = true;
+  builder["collectComments"] = false;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  return reader->parse(text.data(), text.data() + text.size(), &value, nullptr);
+}
+
+std::string WrittenByJsonCpp(const Json::Value& value) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "";
+  builder["commentStyle"] = "None";
+  builder["emitUTF8"] = true;
+  return Json::writeString(builder, value);
+}
+
+// Documents of every type, with texts and names of any bytes.
+class RandomDocuments {
+ public:
+  explicit RandomDocuments(unsigned seed) : generator(seed) {}
+
+  Json::Value Next(int depth = 0) {
+    switch (Below(depth < 4 ? 8 : 6)) {
+      case 0:
+        return {};
+      case 1:
+        return Below(2) == 0;
+      case 2:
+        return static_cast<Json::Int64>(Bits());
+      case 3:
+        return static_cast<Json::UInt64>(Bits() | (uint64_t{1} << 63));
+      case 4:
+        return Double();
+      case 5:
+        return Text();
+      case 6:
+        return Array(depth);
+      default:
+        return Object(depth);
+    }
+  }
+
+  double Double() {
+    double number;
+    do {
+      const uint64_t bits = Bits();
+      static_assert(sizeof number == sizeof bits);
+      std::memcpy(&number, &bits, sizeof number);
+    } while (!std::isfinite(number));
+    return number;
+  }
+
+  std::string Text() {
+    std::string text;
+    for (unsigned length = Below(12); length > 0; --length) text += static_cast<char>(Below(256));
+    return text;
+  }
+
+  unsigned Below(unsigned limit) { return static_cast<unsigned>(generator() % limit); }
+
+ private:
+  uint64_t Bits() { return generator(); }
+
+  Json::Value Array(int depth) {
+    Json::Value array(Json::arrayValue);
+    for (unsigned size = Below(5); size > 0; --size) array.append(Next(depth + 1));
+    return array;
+  }
+
+  Json::Value Object(int depth) {
+    Json::Value object(Json::objectValue);
+    for (unsigned size = Below(5); size > 0; --size) object[Text()] = Next(depth + 1);
+    return object;
+  }
+
+  std::mt19937_64 generator;
+};
+
+TEST_F(JsonValueTest, WritesOneCompactLineInTheOrderOfNames) {
+  Json::Value value;
+  value["b"].append(1);
+  value["b"].append("x");
+  value["a"] = Json::Value(Json::objectValue);
+  value["c"] = Json::Value(Json::arrayValue);
+  value["d"] = true;
+  value["e"];
+  EXPECT_EQ(toString(value), R"({"a":{},"b":[1,"x"],"c":[],"d":true,"e":null})");
+}
+
+TEST_F(JsonValueTest, WritesNoComments) {
+  Json::Value value;
+  Json::CharReaderBuilder collecting;
+  const std::unique_ptr<Json::CharReader> reader(collecting.newCharReader());
+  const std::string text = "// before\n{\"a\": /*in*/ 1} // after\n";
+  ASSERT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, nullptr));
+  ASSERT_TRUE(value.hasComment(Json::commentBefore));
+  EXPECT_EQ(toString(value), "{\"a\":1}");
+}
+
+TEST_F(JsonValueTest, WritesUtf8AsItIs) {
+  EXPECT_EQ(toString("\xC3\xA9\xE2\x82\xAC\xF0\x9F\x98\x80\x7F/"),
+            "\"\xC3\xA9\xE2\x82\xAC\xF0\x9F\x98\x80\x7F/\"");
+}
+
+TEST_F(JsonValueTest, EscapesQuoteBackslashAndControlBytes) {
+  EXPECT_EQ(toString(std::string("\"\\\b\f\n\r\t\0\x01\x1f", 10)),
+            R"("\"\\\b\f\n\r\t\u0000\u0001\u001f")");
+}
+
+TEST_F(JsonValueTest, EveryByteOfTextsAndNamesComesBack) {
+  std::string bytes;
+  for (int c = 0; c < 256; ++c) bytes += static_cast<char>(c);
+  Json::Value value;
+  value[bytes] = bytes;
+  EXPECT_EQ(Parsed(toString(value)), value);
+}
+
+TEST_F(JsonValueTest, WritesIntegersWhole) {
+  EXPECT_EQ(toString(Json::Value::minLargestInt), "-9223372036854775808");
+  EXPECT_EQ(toString(Json::Value::maxLargestUInt), "18446744073709551615");
+}
+
+TEST_F(JsonValueTest, WritesDoublesAsDoubles) {
+  EXPECT_EQ(toString(1.0), "1.0");
+  EXPECT_EQ(toString(-0.0), "-0.0");
+  EXPECT_EQ(toString(1.5), "1.5");
+  EXPECT_EQ(toString(0.1), "0.10000000000000001");
+  EXPECT_EQ(toString(1e300), "1.0000000000000001e+300");
+}
+
+TEST_F(JsonValueTest, WritesNumbersThatJsonLacksAsJsonCppDoes) {
+  const double infinity = std::numeric_limits<double>::infinity();
+  EXPECT_EQ(toString(std::nan("")), "null");
+  EXPECT_EQ(toString(infinity), "1e+9999");
+  EXPECT_EQ(toString(-infinity), "-1e+9999");
+}
+
+TEST_F(JsonValueTest, WritesNullForTheGapsOfAnArray) {
+  Json::Value value;
+  value[2] = 1;
+  EXPECT_EQ(toString(value), "[null,null,1]");
+}
+
+TEST_F(JsonValueTest, RandomDocumentsComeBackAndReadAsJsonCppWritesThem) {
+  RandomDocuments documents(1);
+  for (int i = 0; i < 20000; ++i) {
+    const Json::Value value = documents.Next();
+    const std::string text = toString(value);
+    ASSERT_EQ(text, WrittenByJsonCpp(value));
+    ASSERT_EQ(text.find('\n'), std::string::npos);
+    const Json::Value back = Parsed(text);
+    ASSERT_EQ(back, value) << text;
+    ASSERT_EQ(toString(back), text);
+  }
+}
+
+// The document with bytes put in, taken out and replaced.
+std::string Mutated(std::string text, RandomDocuments& random) {
+  static const char* const kPieces[] = {
+      "{",    "}",           "[",       "]",        ",",
+      ":",    "\"",          "\\",      "/**/",     "+",
+      "-",    "//\n",        "1e400",   "1e-400",   "-.5",
+      "1.",   "1e+",         "007",     " ",        "'",
+      "/",    "\\ud83d",     "\\udc00", "\\u00e",   "99999999999999999999",
+      "*",    "n",           "true",    "Infinity", "\"x\":[1,",
+      "\xFF", "\xEF\xBB\xBF"};
+  for (unsigned changes = random.Below(4); changes > 0; --changes) {
+    const size_t at = random.Below(static_cast<unsigned>(text.size()) + 1);
+    const size_t length = random.Below(3);
+    const unsigned piece = random.Below(sizeof kPieces / sizeof *kPieces + 1);
+    text.replace(at, length, piece > 0 ? kPieces[piece - 1] : "");
+  }
+  return text;
+}
+
+// An unended comment that the text's last byte would end is the one thing that JsonCpp lets pass.
+TEST_F(JsonValueTest, RandomTextsReadAsJsonCppReadsThem) {
+  RandomDocuments random(2);
+  int accepted = 0;
+  for (int i = 0; i < 60000; ++i) {
+    const std::string text = Mutated(toString(random.Next(1)), random);
+    Json::Value value;
+    Json::Value expected;
+    const bool jsonCpp = ReadByJsonCpp(text, expected);
+    if (jsonCpp && text.back() == '/') continue;
+    ASSERT_EQ(fromString(value, text), jsonCpp) << text;
+    if (!jsonCpp) continue;
+    ++accepted;
+    ASSERT_EQ(toString(value), toString(expected)) << text;
+  }
+  EXPECT_GT(accepted, 10000);
+}
+
+TEST_F(JsonValueTest, RandomBytesNeverThrowAndChangeNothingOnFailure) {
+  RandomDocuments random(3);
+  for (int i = 0; i < 20000; ++i) {
+    Json::Value value("untouched");
+    if (fromString(value, random.Text())) continue;
+    ASSERT_EQ(value, Json::Value("untouched"));
+  }
+}
+
+TEST_F(JsonValueTest, ReadsValuesOfEveryType) {
+  EXPECT_EQ(Parsed("null"), Json::Value());
+  EXPECT_EQ(Parsed(" \t\r\ntrue\n"), Json::Value(true));
+  EXPECT_TRUE(Parsed("7").isInt());
+  EXPECT_EQ(Parsed("-9223372036854775808"), Json::Value(Json::Value::minLargestInt));
+  EXPECT_EQ(Parsed("18446744073709551615"), Json::Value(Json::Value::maxLargestUInt));
+  EXPECT_EQ(Parsed("18446744073709551616"), Json::Value(18446744073709551616.0));
+  EXPECT_EQ(Parsed("-2.5e-1"), Json::Value(-0.25));
+  EXPECT_EQ(Parsed(R"("\u00e9\ud83d\ude00\/")"), Json::Value("\xC3\xA9\xF0\x9F\x98\x80/"));
+  EXPECT_EQ(Parsed(R"({"a":[1,{}]})")["a"].size(), 2U);
+}
+
+TEST_F(JsonValueTest, ReplacesWhatTheValueHeldCommentsIncluded) {
+  Json::Value value;
+  value["old"] = 1;
+  value.setComment(std::string("// old"), Json::commentBefore);
+  ASSERT_TRUE(fromString(value, "{\"new\":2}"));
+  EXPECT_EQ(toString(value), "{\"new\":2}");
+  EXPECT_FALSE(value.hasComment(Json::commentBefore));
+}
+
+TEST_F(JsonValueTest, AcceptsAndDropsComments) {
+  const Json::Value value = Parsed("/*a*/ // b\n{ /*c*/ \"x\": /*d*/ [1 /*e*/, 2] /*f*/ } // g");
+  EXPECT_EQ(toString(value), "{\"x\":[1,2]}");
+  EXPECT_EQ(value.getComment(Json::commentBefore), "");
+}
+
+TEST_F(JsonValueTest, SkipsAByteOrderMark) { EXPECT_EQ(Parsed("\xEF\xBB\xBF[1]").size(), 1U); }
+
+TEST_F(JsonValueTest, IsAsLenientAsJsonCppInsideTheDocument) {
+  EXPECT_EQ(Parsed("[1,]").size(), 1U);
+  EXPECT_EQ(Parsed("{\"a\":1,}").size(), 1U);
+  EXPECT_EQ(Parsed(R"({"a":{"x":1},"a":{"y":2}})"), Parsed(R"({"a":{"y":2}})"));
+  EXPECT_EQ(Parsed("007"), Json::Value(7));
+  EXPECT_EQ(Parsed("\"a\nb\""), Json::Value("a\nb"));
+}
+
+TEST_F(JsonValueTest, RefusesAnythingBehindTheDocument) {
+  for (const char* text :
+       {"{} x", "{}{}", "[1]]", "1 2", "{},", "{} /", "{} /* x", "{} /* x /", "{} /*/", "\"a\"b"}) {
+    ExpectRefused(text);
+  }
+  ExpectRefused(std::string("{}\0", 3));
+  ExpectRefused(std::string("{}\0{}", 5));
+  ExpectRefused(std::string("{} \n\0", 5));
+  EXPECT_EQ(Parsed("{} \n // end\n /* end */ \t"), Json::Value(Json::objectValue));
+}
+
+TEST_F(JsonValueTest, RefusesTextsWithoutADocument) {
+  for (const char* text : {"", " ", "\n", "// x", "/* x */", "\xEF\xBB\xBF"}) ExpectRefused(text);
+}
+
+TEST_F(JsonValueTest, RefusesSyntaxErrors) {
+  for (const char* text :
+       {"{",     "[",        "[1",        "[1 2]",     "{\"a\"}",     "{\"a\" 1}",
+        "{a:1}", "{1:1}",    "[,]",       "[1,,2]",    "tru",         "True",
+        "'a'",   "\"a",      "\"\\x\"",   "\"\\u12\"", "\"\\ud800\"", "\"\\ud800x\"",
+        "NaN",   "Infinity", "-Infinity", "1e",        "1e400",       "]",
+        "}",     ":",        "[}",        "{]"}) {
+    ExpectRefused(text);
+  }
+}
+
+TEST_F(JsonValueTest, RefusesMoreThanAThousandLevels) {
+  EXPECT_TRUE(Parsed(Nested(1000)).isArray());
+  ExpectRefused(Nested(1001));
+  ExpectRefused(std::string(1000000, '['));
+  ExpectRefused(std::string(999, '[') + "{\"a\":1}" + std::string(999, ']'));
+  EXPECT_TRUE(Parsed(std::string(998, '[') + "{\"a\":1}" + std::string(998, ']')).isArray());
+}
+
+TEST_F(JsonValueTest, ATextMayBePartOfTheValueThatItReplaces) {
+  Json::Value value;
+  value["text"] = "{\"a\":[1,2]}";
+  ASSERT_TRUE(fromString(value, value["text"].asString()));
+  EXPECT_EQ(toString(value), "{\"a\":[1,2]}");
+}
+
+class CommaPoint : public std::numpunct<char> {
+  char do_decimal_point() const override { return ','; }
+  char do_thousands_sep() const override { return '.'; }
+  std::string do_grouping() const override { return "\3"; }
+};
+
+void ExpectPlainNumbers() {
+  const std::string text = "[1234567,1.5,1234567.25,1.0000000000000001e+300]";
+  EXPECT_EQ(toString(Parsed(text)), text);
+  EXPECT_EQ(Parsed("1.500"), Json::Value(1.5));
+  ExpectRefused("1,5");
+}
+
+TEST_F(JsonValueTest, NumbersDoNotDependOnTheGlobalCppLocale) {
+  const std::locale before = std::locale::global(std::locale(std::locale(), new CommaPoint));
+  ExpectPlainNumbers();
+  std::locale::global(before);
+}
+
+TEST_F(JsonValueTest, NumbersDoNotDependOnTheCLocale) {
+  const std::string compile = "localedef -i de_DE -f UTF-8 " + Path("de_DE.UTF-8") + " >&2";
+  if (std::system(compile.c_str()) != 0) GTEST_SKIP() << "localedef cannot build de_DE here";
+  EXPECT_EQ(RunInChild([this] {
+              setenv("LOCPATH", dir.c_str(), 1);
+              ASSERT_NE(std::setlocale(LC_ALL, "de_DE.UTF-8"), nullptr);
+              ASSERT_EQ(std::to_string(1.5), "1,500000");
+              ExpectPlainNumbers();
+            }),
+            0);
+}
+
+}  // namespace
