@@ -15,9 +15,9 @@ namespace {
 constexpr useconds_t kSecond = 1000000;
 
 std::function<void()> pauseAction;
+std::function<void()> sqliteSleepAction;
 std::vector<unsigned int> pauseLengths;
 useconds_t sqliteSleeps = 0;
-bool areSqliteSleepsSkipped = false;
 
 int failuresLeft = 0;
 
@@ -51,7 +51,10 @@ extern "C" int usleep(useconds_t microseconds) {
     return 0;
   }
   sqliteSleeps += microseconds;
-  if (areSqliteSleepsSkipped) return 0;
+  if (sqliteSleepAction) {
+    sqliteSleepAction();
+    return 0;
+  }
   const timespec length = {0, static_cast<long>(microseconds) * 1000};
   return nanosleep(&length, nullptr);
 }
@@ -103,11 +106,11 @@ LogLine SelectFailed(unsigned int retries, const std::string& sql, const Json::V
 
 namespace Pauses {
 
-void Start(const std::function<void()>& onPause, bool skipSqliteSleeps) {
+void Start(const std::function<void()>& onPause, const std::function<void()>& onSqliteSleep) {
   pauseAction = onPause;
   pauseLengths.clear();
   sqliteSleeps = 0;
-  areSqliteSleepsSkipped = skipSqliteSleeps;
+  sqliteSleepAction = onSqliteSleep;
 }
 
 std::vector<unsigned int> Lengths() { return pauseLengths; }

@@ -42,9 +42,10 @@ LogLine SelectFailed(unsigned int retries, const std::string& sql, const Json::V
 // Sleeps of a second or more are the library's and end at once, shorter ones are SQLite's.
 namespace Pauses {
 
-// Forgets what was recorded and sets what runs in place of each pause. SQLite's own sleeps are real
-// unless they are skipped.
-void Start(const std::function<void()>& onPause = nullptr, bool skipSqliteSleeps = false);
+// Forgets what was recorded and sets what runs in place of each pause, and in place of SQLite's own
+// sleeps, which are real without it.
+void Start(const std::function<void()>& onPause = nullptr,
+           const std::function<void()>& onSqliteSleep = nullptr);
 
 // The lengths of the library's pauses in milliseconds.
 std::vector<unsigned int> Lengths();

@@ -1,0 +1,350 @@
+// Processes that share a database file, and files that resist.
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sqlite3.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+
+#include "kelodrcore/sqlite_db.h"
+#include "support/database.h"
+
+namespace {
+
+using KeloDRCore::InsertCommand;
+using KeloDRCore::SelectCommand;
+using KeloDRCore::SqliteDB;
+using KeloDRCore::SqliteTableHandler;
+using KeloDRCore::SqliteValueList;
+using testing::AllOf;
+using testing::Each;
+using testing::ElementsAre;
+using testing::Ge;
+using testing::IsEmpty;
+using testing::Le;
+using testing::SizeIs;
+
+using Records = std::vector<SqliteValueList>;
+
+const std::string kFile = "sqlite_db.cpp";
+const Json::Value kBusy = Error(405, 5, "database is locked");
+
+// A child process that holds an exclusive lock on a database from construction until Release().
+class LockHolder {
+ public:
+  explicit LockHolder(const std::string& path) {
+    if (pipe2(locked, O_CLOEXEC) != 0 || pipe2(release, O_CLOEXEC) != 0) abort();
+    child = fork();
+    if (child == 0) Hold(path.c_str());
+    close(locked[1]);
+    close(release[0]);
+    char byte = 0;
+    EXPECT_EQ(read(locked[0], &byte, 1), 1) << "the other process got no lock";
+    close(locked[0]);
+  }
+
+  ~LockHolder() { Release(); }
+
+  void Release() {
+    if (child <= 0) return;
+    close(release[1]);
+    int status = -1;
+    waitpid(child, &status, 0);
+    EXPECT_EQ(status, 0);
+    child = -1;
+  }
+
+ private:
+  [[noreturn]] void Hold(const char* path) {
+    close(locked[0]);
+    close(release[1]);
+    sqlite3* db = nullptr;
+    if (sqlite3_open(path, &db) != SQLITE_OK ||
+        sqlite3_exec(db, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr) != SQLITE_OK ||
+        write(locked[1], "", 1) != 1) {
+      _exit(1);
+    }
+    char byte = 0;
+    const bool isEnd = read(release[0], &byte, 1) == 0;
+    sqlite3_close(db);
+    _exit(isEnd ? 0 : 1);
+  }
+
+  int locked[2];
+  int release[2];
+  pid_t child;
+};
+
+class SqliteDBProcessTest : public DatabaseTest {
+ protected:
+  void SetUp() override {
+    DatabaseTest::SetUp();
+    ASSERT_TRUE(db->Exec("CREATE TABLE t (n); INSERT INTO t VALUES (1)"));
+    db->Close();
+  }
+
+  static void SkipSleep() {}
+};
+
+TEST_F(SqliteDBProcessTest, EachAttemptReallyWaitsOneSecond) {
+  const LockHolder holder(path);
+  Pauses::Start();
+  const auto start = std::chrono::steady_clock::now();
+  EXPECT_FALSE(db->Exec("INSERT INTO t VALUES (2)"));
+  EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::seconds(1));
+  EXPECT_EQ(Pauses::SqliteWait(), 1000U);
+  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  EXPECT_EQ(db->GetErr(), kBusy);
+  ExpectLog({ExecFailed("Exec", 1, "INSERT INTO t VALUES (2)", kBusy)});
+}
+
+TEST_F(SqliteDBProcessTest, ALockForGoodEndsOnePastTheLimit) {
+  const LockHolder holder(path);
+  for (const unsigned int limit : {0U, 1U, 3U}) {
+    SqliteDB patient(path, limit, "");
+    SqliteValueList record;
+    Records records;
+    const auto expectWaits = [&] {
+      EXPECT_THAT(Pauses::Lengths(), AllOf(SizeIs(limit), Each(AllOf(Ge(1000U), Le(2000U)))));
+      EXPECT_EQ(Pauses::SqliteWait(), 1000 * (limit + 1)) << "not one wait an attempt";
+      EXPECT_EQ(patient.GetErr(), kBusy);
+    };
+    Pauses::Start(nullptr, SkipSleep);
+    EXPECT_FALSE(patient.Exec("DELETE FROM t"));
+    expectWaits();
+    Pauses::Start(nullptr, SkipSleep);
+    EXPECT_FALSE(patient.SelectByCommand("SELECT n FROM t", record));
+    expectWaits();
+    Pauses::Start(nullptr, SkipSleep);
+    EXPECT_FALSE(patient.SelectByCommand("SELECT n FROM t", records));
+    expectWaits();
+    ExpectLog({ExecFailed("Exec", limit + 1, "DELETE FROM t", kBusy),
+               SelectFailed(limit + 1, "SELECT n FROM t", kBusy),
+               ExecFailed("SelectByCommand", limit + 1, "SELECT n FROM t", kBusy)});
+  }
+}
+
+TEST_F(SqliteDBProcessTest, ALockReleasedInTheFirstPauseIsSurvived) {
+  SqliteDB patient(path, 1, "");
+  LockHolder holder(path);
+  Pauses::Start([&] { holder.Release(); }, SkipSleep);
+  EXPECT_TRUE(patient.Exec("INSERT INTO t VALUES (2)"));
+  EXPECT_EQ(patient.GetErr(), Error(0));
+  EXPECT_EQ(Pauses::SqliteWait(), 1000U);
+  ExpectLog({Info(kFile, "Exec",
+                  "After retry [1] times, success to exec command [INSERT INTO t VALUES (2)]")});
+  EXPECT_THAT(Rows(patient, "SELECT n FROM t"), ElementsAre("n:1", "n:2"));
+}
+
+TEST_F(SqliteDBProcessTest, ALockReleasedInTheLastPauseIsSurvived) {
+  SqliteDB patient(path, 3, "");
+  LockHolder holder(path);
+  Records records;
+  const auto releaseInThird = [&] {
+    if (Pauses::Lengths().size() == 3) holder.Release();
+  };
+  Pauses::Start(releaseInThird, SkipSleep);
+  EXPECT_TRUE(patient.SelectByCommand("SELECT n FROM t", records));
+  EXPECT_THAT(records, SizeIs(1));
+  ExpectLog({Info(kFile, "SelectByCommand", "After retry [3] times, success to select command")});
+}
+
+TEST_F(SqliteDBProcessTest, ALockReleasedWithinTheBusyTimeoutIsNoRetry) {
+  LockHolder holder(path);
+  Pauses::Start(nullptr, [&] { holder.Release(); });
+  EXPECT_TRUE(db->Exec("INSERT INTO t VALUES (2)"));
+  EXPECT_GT(Pauses::SqliteWait(), 0U);
+  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+}
+
+TEST_F(SqliteDBProcessTest, ALockedTableOfASharedCacheIsRetriedAsLocked) {
+  ASSERT_EQ(sqlite3_enable_shared_cache(1), SQLITE_OK);
+  SqliteDB writer(path, 0, "");
+  SqliteDB patient(path, 1, "");
+  ASSERT_TRUE(writer.Open() && patient.Open());
+  sqlite3_enable_shared_cache(0);
+  ASSERT_TRUE(writer.Exec("BEGIN; INSERT INTO t VALUES (2)"));
+  const std::string sql = "SELECT n FROM t";
+  const Json::Value locked = Error(405, 6, "database table is locked: t");
+  SqliteValueList record;
+  EXPECT_FALSE(patient.SelectByCommand(sql, record));
+  EXPECT_EQ(patient.GetErr(), locked);
+  ExpectLog({SelectFailed(2, sql, locked)});
+  Pauses::Start([&] { EXPECT_TRUE(writer.Exec("COMMIT")); });
+  EXPECT_TRUE(patient.SelectByCommand(sql, record));
+  ExpectLog({Info(kFile, "SelectByCommand",
+                  "After retry [1] times, success to exec command [" + sql + "]")});
+}
+
+TEST_F(SqliteDBProcessTest, AnInsertOnALockedFileFailsAtTheTable) {
+  const LockHolder holder(path);
+  InsertCommand insert;
+  insert.SetTable(SqliteTableHandler("t", "n"));
+  insert.AddFieldValue("n", 2);
+  Pauses::Start(nullptr, SkipSleep);
+  EXPECT_FALSE(db->InsertRecord(insert));
+  EXPECT_EQ(db->GetErr(), kBusy);
+  ExpectLog({Info(kFile, "Exec", "label Exec cmd: INSERT INTO t (n) VALUES (2);"),
+             ExecFailed("SelectByCommand", 1,
+                        "SELECT 1 FROM sqlite_master WHERE type='table' AND name='t';", kBusy),
+             ExecFailed("Exec", 1, "CREATE TABLE IF NOT EXISTS t (n)", kBusy),
+             Err(kFile, "CreateTable", "Failed to create table [t] with cmd[n]"),
+             Err(kFile, "Exec", "Failed to create table [t]")});
+}
+
+// A child that inserts 200 rows of its own once `gate` reaches its end.
+pid_t StartWriter(const std::string& path, int number, const int (&gate)[2]) {
+  const pid_t child = fork();
+  if (child != 0) return child;
+  close(gate[1]);
+  char byte = 0;
+  bool isGood = read(gate[0], &byte, 1) == 0;
+  {
+    SqliteDB db(path, 1000, "writer");
+    isGood = db.Exec("PRAGMA synchronous=OFF") && isGood;  // the disk's speed is not in question
+    InsertCommand insert;
+    insert.SetTable(SqliteTableHandler("shared", "writer INTEGER, n INTEGER, UNIQUE (writer, n)"));
+    insert.AddFieldValue("writer", number);
+    for (int n = 0; n < 200; ++n) {
+      insert.AddFieldValue("n", n);
+      isGood = db.InsertRecord(insert) && isGood;
+    }
+  }
+  _exit(isGood ? 0 : 1);
+}
+
+TEST_F(SqliteDBProcessTest, EightWritersLoseNoRow) {
+  int gate[2];
+  ASSERT_EQ(pipe2(gate, O_CLOEXEC), 0);
+  std::vector<pid_t> writers;
+  for (int number = 0; number < 8; ++number) writers.push_back(StartWriter(path, number, gate));
+  close(gate[0]);
+  close(gate[1]);
+  for (const pid_t writer : writers) {
+    int status = -1;
+    EXPECT_EQ(waitpid(writer, &status, 0), writer);
+    EXPECT_EQ(status, 0);
+  }
+  int count = 0;
+  EXPECT_TRUE(db->GetCount(SqliteTableHandler("shared", ""), count));
+  EXPECT_EQ(count, 1600);
+  EXPECT_THAT(
+      Rows(*db, "SELECT writer, count() AS n FROM shared GROUP BY writer HAVING count() <> 200"),
+      IsEmpty());
+}
+
+TEST_F(SqliteDBProcessTest, AReadOnlyFileIsReadAndNotWritten) {
+  ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
+  ASSERT_EQ(chmod(path.c_str(), 0444), 0);
+  const int status = RunInChild([&] {
+    constexpr uid_t kNobody = 65534;
+    ASSERT_TRUE(geteuid() != 0 || setresuid(kNobody, kNobody, kNobody) == 0);
+    const Json::Value failure = Error(404, 8, "attempt to write a readonly database");
+    EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1"));
+    EXPECT_FALSE(db->Exec("DELETE FROM t"));
+    EXPECT_EQ(db->GetErr(), failure);
+    ExpectLog({ExecFailed("Exec", 0, "DELETE FROM t", failure)});
+  });
+  EXPECT_EQ(status, 0);
+}
+
+class SqliteDBFileTest : public DatabaseTest {};
+
+TEST_F(SqliteDBFileTest, PathsThatCannotBeOpenedFailInEveryOperation) {
+  ASSERT_EQ(symlink("loop", Path("loop").c_str()), 0);
+  for (const std::string& bad : {dir, Path("no/such/dir"), Path("loop"), Path("loop/below")}) {
+    SqliteDB nowhere(bad, 3, "");
+    SqliteValueList record;
+    Records records;
+    const LogLine warning = Warn(kFile, "Open", "Failed to open db[" + bad + "]");
+    const std::string message = "Failed to open db [" + bad + "]";
+    nowhere.SetDBErr(7, "before");
+    const Json::Value before = nowhere.GetErr();
+    EXPECT_FALSE(nowhere.Open());
+    EXPECT_EQ(nowhere.GetErr(), before);
+    EXPECT_FALSE(nowhere.SelectByCommand("SELECT 1", record));
+    EXPECT_EQ(nowhere.GetErr(), before);
+    EXPECT_FALSE(nowhere.SelectByCommand("SELECT 1", records));
+    EXPECT_EQ(nowhere.GetErr(), before);
+    EXPECT_FALSE(nowhere.Exec("SELECT 1"));
+    EXPECT_EQ(nowhere.GetErr(), Error(404));
+    ExpectLog({warning, warning, Err(kFile, "SelectByCommand", message), warning,
+               Err(kFile, "SelectByCommand", message), warning, Err(kFile, "Exec", message)});
+  }
+}
+
+TEST_F(SqliteDBFileTest, AFailedOpenIsTriedAgainByTheNextOperation) {
+  SqliteDB late(Path("dir/file"), 0, "");
+  EXPECT_FALSE(late.Exec("SELECT 1"));
+  EXPECT_EQ(LogCapture::Take().size(), 2U);
+  ASSERT_EQ(mkdir(Path("dir").c_str(), 0700), 0);
+  EXPECT_TRUE(late.Exec("SELECT 1"));
+}
+
+TEST_F(SqliteDBFileTest, AFileThatIsNoDatabaseIsLeftAlone) {
+  const std::string text(4096, 'x');
+  WriteText(path, text);
+  const Json::Value failure = Error(404, 26, "file is not a database");
+  EXPECT_TRUE(db->Open());
+  EXPECT_FALSE(db->Exec("CREATE TABLE t (n)"));
+  EXPECT_EQ(db->GetErr(), failure);
+  ExpectLog({ExecFailed("Exec", 0, "CREATE TABLE t (n)", failure)});
+  db->Close();
+  EXPECT_EQ(ReadText(path), text);
+}
+
+TEST_F(SqliteDBFileTest, IsExistedIsTrueForWhateverStandsAtThePath) {
+  EXPECT_TRUE(SqliteDB(dir, 0, "").IsExisted());
+  EXPECT_FALSE(SqliteDB("", 0, "").IsExisted());
+  WriteText(path, "");
+  EXPECT_TRUE(db->IsExisted());
+}
+
+TEST_F(SqliteDBFileTest, AFileRemovedUnderTheHandleIsReadAndNotWritten) {
+  ASSERT_TRUE(db->Exec("CREATE TABLE t (n); INSERT INTO t VALUES (1)"));
+  ASSERT_EQ(unlink(path.c_str()), 0);
+  const SqliteTableHandler table("t", "n");
+  const Json::Value failure = Error(404, 8, "attempt to write a readonly database");
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1"));
+  EXPECT_FALSE(db->Exec("INSERT INTO t VALUES (2)"));
+  EXPECT_EQ(db->GetErr(), failure);
+  ExpectLog({ExecFailed("Exec", 0, "INSERT INTO t VALUES (2)", failure)});
+  // To the operations that look for the file first there is none.
+  EXPECT_TRUE(db->DeleteAllRecords(table));
+  SelectCommand select;
+  select.SetTable(table);
+  select.SelectAll();
+  Records records;
+  EXPECT_FALSE(db->SelectRecords(select, records));
+  EXPECT_FALSE(HasFile());
+}
+
+TEST_F(SqliteDBFileTest, ThousandsOfOperationsLeaveNothingBehind) {
+  EXPECT_TRUE(db->Open());
+  db->Close();
+  const std::set<int> descriptors = OpenDescriptors();
+  const sqlite3_int64 memory = sqlite3_memory_used();
+  for (int round = 0; round < 500; ++round) {
+    SqliteDB passing(path, 0, "");
+    SqliteDB nowhere(dir, 0, "");
+    SqliteValueList record;
+    Records records;
+    EXPECT_TRUE(passing.Exec("SELECT 1"));
+    EXPECT_FALSE(passing.Exec("nonsense"));
+    EXPECT_TRUE(passing.SelectByCommand("SELECT 1 AS n UNION SELECT 2", record));
+    EXPECT_FALSE(passing.SelectByCommand("nonsense", record));
+    EXPECT_FALSE(passing.SelectByCommand("SELECT abs(-9223372036854775808)", records));
+    EXPECT_FALSE(passing.SelectByCommand(" ", records));
+    EXPECT_FALSE(nowhere.Exec("SELECT 1"));
+    EXPECT_FALSE(nowhere.SelectByCommand("SELECT 1", records));
+    LogCapture::Clear();
+  }
+  EXPECT_EQ(OpenDescriptors(), descriptors);
+  EXPECT_EQ(sqlite3_memory_used(), memory);
+}
+
+}  // namespace
