@@ -8,7 +8,7 @@
 #   examples  what the example programs link
 #   format    the formatter
 #   lint      the static checkers
-#   i386      the 32-bit compiler runtime and the 32-bit libraries' sysroot
+#   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
 #   docs      the API documentation's generator
 #   web       a web server for the web API handler
 #   bench     the benchmark library

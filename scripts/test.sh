@@ -7,6 +7,9 @@ cd "$(dirname "$0")/.."
 preset=${1:-dev}
 
 scripts/setup.sh build test examples
+case $preset in
+  i386*) scripts/setup-i386.sh ;;
+esac
 cmake --preset "$preset"
 cmake --build --preset "$preset"
 ctest --preset "$preset" --parallel "$(nproc)"
