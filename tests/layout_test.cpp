@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "kelodrcore/cache.h"
 #include "kelodrcore/sqlite_command.h"
 #include "kelodrcore/sqlite_condition.h"
 #include "kelodrcore/sqlite_db.h"
@@ -60,6 +61,8 @@ FIELDS(DeleteCommand, &DeleteCommand::deleteAll, &DeleteCommand::condition);
 FIELDS(ErrRecorder, &ErrRecorder::errCode, &ErrRecorder::errMsg);
 FIELDS(SqliteDB, &SqliteDB::dbHandle, &SqliteDB::dbPath, &SqliteDB::retryLimit,
        &SqliteDB::logLabel);
+FIELDS(Cache, &Cache::path, &Cache::timeout, &Cache::alwaysRequired, &Cache::retryLimit,
+       &Cache::cachedData, &Cache::loadedMtime);
 
 size_t RoundUp(size_t value, size_t alignment) {
   return (value + alignment - 1) / alignment * alignment;
@@ -93,6 +96,7 @@ TEST(LayoutTest, FieldsStandInDeclaredOrder) {
   ExpectFieldsFrom<DeleteCommand>(sizeof(SqliteCommand));
   ExpectFieldsFrom<ErrRecorder>(kVirtuals);
   ExpectFieldsFrom<SqliteDB>(sizeof(ErrRecorder));
+  ExpectFieldsFrom<Cache>(kVirtuals);
 }
 
 TEST(LayoutTest, ConditionsWithoutFieldsOfTheirOwnAddNone) {
@@ -168,6 +172,16 @@ TEST(LayoutTest, TheDatabaseAddsItsDestructorBehindTheRecordersSlots) {
   EXPECT_EQ(SlotOf(&ErrRecorder::GetErrCodeStr), 1U);
   EXPECT_EQ(SlotsIn("ErrRecorder"), 2U);
   EXPECT_EQ(SlotsIn("SqliteDB"), 4U);
+}
+
+TEST(LayoutTest, ACacheHasItsDestructorThenSixSlots) {
+  EXPECT_EQ(SlotOf(&Cache::GetInfo), 2U);
+  EXPECT_EQ(SlotOf(&Cache::GetDefaultValue), 3U);
+  EXPECT_EQ(SlotOf(&Cache::GetUpdatedData), 4U);
+  EXPECT_EQ(SlotOf(&Cache::IsValidData), 5U);
+  EXPECT_EQ(SlotOf(&Cache::IsNeedUpdate), 6U);
+  EXPECT_EQ(SlotOf(&Cache::IsUpdatedDataRequired), 7U);
+  EXPECT_EQ(SlotsIn("Cache"), 8U);
 }
 
 }  // namespace layout

@@ -1,0 +1,403 @@
+// What processes that share a cache file see of each other.
+
+#include "support/cache_process.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/file.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <set>
+#include <stdexcept>
+
+#include "kelodrcore/file_lock.h"
+#include "support/test_clock.h"
+
+namespace {
+
+using KeloDRCore::FileLock;
+
+// Called before each flock of this process.
+std::function<void()> onFlock;
+
+}  // namespace
+
+// Stands before the C library's.
+extern "C" int flock(int fd, int operation) noexcept {
+  if (onFlock) onFlock();
+  return static_cast<int>(syscall(SYS_flock, fd, operation));
+}
+
+namespace {
+
+// --- The claim
+
+TEST_F(CacheProcessTest, AClaimIsThePidFileOfTheFetchingProcess) {
+  TestCache cache = MakeCache();
+  cache.fetch = [this](Json::Value& out) {
+    EXPECT_EQ(atoi(ReadText(pidFile).c_str()), getpid());
+    EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{"c.cached.pid"});
+    out = 1;
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{"c.cached"});
+  ExpectLog({Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, TheLockIsNamedAfterTheFileAndFreeDuringTheFetch) {
+  TestCache cache = MakeCache();
+  cache.fetch = [this](Json::Value& out) {
+    EXPECT_TRUE(std::filesystem::exists("/tmp/.kelodr_lock/" + path + ".lock"));
+    EXPECT_TRUE(FileLock(lockName).tryLock(LOCK_EX | LOCK_NB));
+    out = 1;
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_TRUE(FileLock(lockName).tryLock(LOCK_EX | LOCK_NB));
+  ExpectLog({Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, AFailedFetchReleasesTheClaim) {
+  EXPECT_FALSE(MakeCache(true, -1).Update());
+  EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{});
+  ExpectLog({Starts(), FetchFailed(-1), Finishes()});
+}
+
+TEST_F(CacheProcessTest, AnExceptionReleasesTheClaimAndReachesTheCaller) {
+  TestCache cache = MakeCache();
+  cache.fetch = [](Json::Value&) -> bool { throw std::runtime_error("fetch"); };
+  EXPECT_THROW(cache.Update(), std::runtime_error);
+  EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{});
+  EXPECT_TRUE(FileLock(lockName).tryLock(LOCK_EX | LOCK_NB));
+  ExpectLog({Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, NoClaimWhileAnotherReaderKeepsTheLock) {
+  TestClock::SkipSleeps();
+  FileLock reader(lockName);
+  ASSERT_TRUE(reader.lock(LOCK_SH | LOCK_NB, 0));
+  EXPECT_FALSE(MakeCache().Update());
+  EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>(100, 50000));
+  ExpectLog(
+      {Debug("cache.cpp", "SetUpdating", "Failed to lock [/tmp/.kelodr_lock/" + path + ".lock]")});
+}
+
+TEST_F(CacheProcessTest, NoClaimWhenAnotherProcessWasQuicker) {
+  FileLock reader(lockName);
+  ASSERT_TRUE(reader.lock(LOCK_SH | LOCK_NB, 0));
+  TestClock::SkipSleeps([&] {
+    WriteText(pidFile, std::to_string(getppid()));
+    reader.unlock();
+  });
+  EXPECT_FALSE(MakeCache().Update());
+  EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>{50000});
+  ExpectLog(
+      {Debug("cache.cpp", "SetUpdating", "there is other process to update cache [" + path + "]")});
+  std::filesystem::remove(pidFile);
+}
+
+TEST_F(CacheProcessTest, NoClaimAndNoLineWhenAnotherProcessClaimedSinceTheFirstLook) {
+  int locks = 0;
+  onFlock = [&] {
+    if (++locks == 2) WriteText(pidFile, std::to_string(getppid()));
+  };
+  EXPECT_FALSE(MakeCache().Update());
+  onFlock = nullptr;
+  EXPECT_EQ(locks, 2);
+  ExpectLog({});
+  std::filesystem::remove(pidFile);
+}
+
+TEST_F(CacheProcessTest, NoClaimWithoutAPidFile) {
+  std::filesystem::create_directories(pidFile + "/in the way");
+  EXPECT_FALSE(MakeCache().Update());
+  ExpectLog({Debug("cache.cpp", "SetUpdating", "Failed to set cache [" + path + "] updating")});
+  std::filesystem::remove_all(pidFile);
+}
+
+TEST_F(CacheProcessTest, TheClaimIsReleasedEvenWithoutTheLock) {
+  TestClock::SkipSleeps();
+  FileLock reader(lockName);
+  TestCache cache = MakeCache();
+  cache.fetch = [&](Json::Value& out) {
+    out = 1;
+    return reader.lock(LOCK_SH | LOCK_NB, 0);
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>(1200, 50000));
+  ExpectLog({Starts(),
+             Notice("cache.cpp", "UnsetUpdating", "Failed to lock to unset cache[" + path + "]"),
+             Finishes()});
+}
+
+TEST_F(CacheProcessTest, TheClaimOfAnotherProcessIsNotReleased) {
+  TestCache cache = MakeCache();
+  cache.fetch = [this](Json::Value& out) {
+    WriteText(pidFile, std::to_string(getppid()));
+    out = 1;
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  ExpectLog({Starts(), Debug("cache.cpp", "UnsetUpdating",
+                             "Failed to unset updating cache [" + pidFile +
+                                 "] since different pid[" + std::to_string(getppid()) + "]")});
+  EXPECT_EQ(ReadText(pidFile), std::to_string(getppid()));
+  std::filesystem::remove(pidFile);
+  EXPECT_TRUE(FileLock(lockName).tryLock(LOCK_EX | LOCK_NB));
+}
+
+TEST_F(CacheProcessTest, TheClaimOfADeadProcessIsRemoved) {
+  const pid_t dead = Start([] { return 0; });
+  EXPECT_EQ(Join(dead), 0);
+  TestCache cache = MakeCache();
+  cache.fetch = [&](Json::Value& out) {
+    WriteText(pidFile, std::to_string(dead));
+    out = 1;
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  ExpectLog({Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, APidFileThatCannotBeRemovedIsReported) {
+  TestCache cache = MakeCache();
+  cache.fetch = [this](Json::Value& out) {
+    out = 1;
+    return std::filesystem::remove(pidFile);
+  };
+  EXPECT_TRUE(cache.Update());
+  ExpectLog({Starts(), CannotUnlink("No such file or directory"), Finishes()});
+}
+
+// --- Who counts as an updater
+
+TEST_F(CacheProcessTest, APidFileOfADeadOrReusedPidOrOfNobodyStopsNoUpdate) {
+  const pid_t dead = Start([] { return 0; });
+  EXPECT_EQ(Join(dead), 0);
+  for (const std::string& text :
+       {std::to_string(dead), std::to_string(getppid()) + "\n1\n", std::string("0"),
+        std::string("-1"), std::string("x"), std::string()}) {
+    WriteText(pidFile, text);
+    TestCache cache = MakeCache();
+    cache.FetchGives(text);
+    EXPECT_TRUE(cache.Update());
+    EXPECT_EQ(cache.GetCachedData(), text);
+    ExpectLog({Starts(), Finishes()});
+  }
+}
+
+TEST_F(CacheProcessTest, AProcessInThePidFileIsAnUpdaterEvenTheCaller) {
+  WriteCacheFile("\"old\"", kStale);
+  const TestCache cache = MakeCache(false);
+  for (const pid_t pid : {getppid(), getpid(), pid_t{1}}) {
+    WriteText(pidFile, std::to_string(pid));
+    EXPECT_TRUE(cache.Update());
+    EXPECT_EQ(cache.Read(), "old");
+  }
+  ExpectLog({});
+  EXPECT_EQ(JoinAll(), 0);
+  std::filesystem::remove(pidFile);
+}
+
+TEST_F(CacheProcessTest, AnExclusiveLockStandsForAnUpdater) {
+  WriteCacheFile("\"old\"", kStale);
+  TestClock::SkipSleeps();
+  FileLock updater(lockName);
+  ASSERT_TRUE(updater.lock(LOCK_EX | LOCK_NB, 0));
+  EXPECT_EQ(MakeCache(false).Read(), "old");
+  EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>(100, 50000));
+  ExpectLog({});
+  EXPECT_EQ(JoinAll(), 0);
+}
+
+// --- Waiting
+
+TEST_F(CacheProcessTest, AWaiterGetsTheFreshData) {
+  WriteCacheFile("\"old\"", kStale);
+  const Event fetching, finish;
+  const pid_t updater = StartUpdater(fetching, finish);
+  ASSERT_TRUE(fetching.Wait());
+  const pid_t waiter = StartWaiter("new");
+  EXPECT_TRUE(WaitForLines(StartsWaiting()));
+  finish.Cause();
+  EXPECT_EQ(Join(waiter), 0);
+  EXPECT_EQ(Join(updater), 0);
+  EXPECT_EQ(LogCapture::ReadMirror(mirror).back(), FinishesWaiting());
+}
+
+TEST_F(CacheProcessTest, AWaiterGoesOnOnceTheFileIsFreshWhoeverUpdates) {
+  WriteCacheFile("\"old\"", kStale);
+  const Event fetching, finish;
+  const pid_t updater = StartUpdater(fetching, finish);
+  ASSERT_TRUE(fetching.Wait());
+  const pid_t waiter = StartWaiter("other");
+  EXPECT_TRUE(WaitForLines(StartsWaiting()));
+  WriteCacheFile("\"other\"");
+  EXPECT_EQ(Join(waiter), 0);
+  finish.Cause();
+  EXPECT_EQ(Join(updater), 0);
+}
+
+TEST_F(CacheProcessTest, AReaderThatNeedsNoFreshDataDoesNotWait) {
+  WriteCacheFile("\"old\"", kStale);
+  const Event fetching, finish;
+  StartUpdater(fetching, finish);
+  ASSERT_TRUE(fetching.Wait());
+  EXPECT_EQ(MakeCache(false).Read(), "old");
+  EXPECT_EQ(CountInMirror(StartsWaiting()), 0U);
+  finish.Cause();
+  EXPECT_EQ(JoinAll(), 1);
+}
+
+TEST_F(CacheProcessTest, AWaiterLooksAgainEvery300To1000MsWhileTheLockIsTakenAndTheFileStale) {
+  WriteCacheFile("\"old\"", kStale);
+  FileLock updater(lockName);
+  ASSERT_TRUE(updater.lock(LOCK_EX | LOCK_NB, 0));
+  size_t sleeps = 0;
+  TestClock::SkipSleeps([&] {
+    if (++sleeps == 302) WriteCacheFile("\"fresh\"");
+  });
+  EXPECT_EQ(MakeCache().Read(), "fresh");
+  ExpectLog({StartsWaiting(), FinishesWaiting()});
+  const std::vector<unsigned int> lengths = TestClock::TakeSleeps();
+  // The first look, then two rounds of a sleep and a look.
+  ASSERT_EQ(lengths.size(), 302U);
+  for (size_t i = 0; i < lengths.size(); ++i) {
+    if (i == 100 || i == 201) {
+      EXPECT_GE(lengths[i], 300000U);
+      EXPECT_LE(lengths[i], 1000000U);
+    } else {
+      EXPECT_EQ(lengths[i], 50000U) << i;
+    }
+  }
+}
+
+// --- The refresher
+
+TEST_F(CacheProcessTest, ARefresherUpdatesBehindTheCallersBack) {
+  WriteCacheFile("\"old\"", kStale);
+  const Event finish;
+  TestCache cache = MakeCache(false);
+  cache.fetch = [&, caller = getpid()](Json::Value& out) {
+    out =
+        atoi(ReadText(pidFile).c_str()) == getpid() && getpid() != caller && getsid(0) == getpid();
+    return finish.Wait();
+  };
+  EXPECT_EQ(cache.Read(), "old");
+  finish.Cause();
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(cache.Read(), true);
+  ExpectLog({});
+  EXPECT_EQ(LogCapture::ReadMirror(mirror), (std::vector<LogLine>{Starts(), Finishes()}));
+}
+
+TEST_F(CacheProcessTest, ARefresherEndsWith0WhateverTheFetchDoes) {
+  WriteCacheFile("\"old\"", kStale);
+  TestCache cache = MakeCache(false, -1);
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(JoinAll(), 1);
+  cache.fetch = [](Json::Value&) -> bool { throw std::runtime_error("fetch"); };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(cache.Read(), "old");
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(LogCapture::ReadMirror(mirror),
+            (std::vector<LogLine>{Starts(), FetchFailed(-1), Finishes(), Starts(), Finishes(),
+                                  Starts(), Finishes()}));
+}
+
+TEST_F(CacheProcessTest, ARefresherHoldsUpNobodyWhoReadsTheCallersOutput) {
+  WriteCacheFile("\"old\"", kStale);
+  const Event finish;
+  int output[2];
+  ASSERT_EQ(pipe2(output, O_CLOEXEC), 0);
+  EXPECT_EQ(RunInChild([&] {
+              for (const int fd : {STDOUT_FILENO, STDERR_FILENO}) dup2(output[1], fd);
+              close(output[1]);
+              TestCache cache = MakeCache(false);
+              cache.fetch = [&](Json::Value& out) {
+                out = 1;
+                return finish.Wait();
+              };
+              EXPECT_TRUE(cache.Update());
+            }),
+            0);
+  close(output[1]);
+  pollfd poller{output[0], POLLIN, 0};
+  EXPECT_EQ(poll(&poller, 1, 10000), 1) << "no end of file while the refresher runs";
+  char byte = 0;
+  EXPECT_EQ(read(output[0], &byte, 1), 0);
+  finish.Cause();
+  EXPECT_EQ(JoinAll(), 1);
+  close(output[0]);
+}
+
+std::string exitFile;
+
+TEST_F(CacheProcessTest, ARefresherRunsNoExitHandlerAndFlushesNoStream) {
+  WriteCacheFile("\"old\"", kStale);
+  exitFile = Path("exit");
+  EXPECT_EQ(RunInChild([&] {
+              FILE* stream = fopen(Path("stream").c_str(), "w");
+              fputs("once", stream);
+              atexit([] { std::ofstream(exitFile, std::ios::app) << "once"; });
+              EXPECT_TRUE(MakeCache(false, -1).Update());
+              exit(testing::Test::HasFailure() ? 1 : 0);
+            }),
+            0);
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(ReadText(Path("stream")), "once");
+  EXPECT_EQ(ReadText(exitFile), "once");
+}
+
+TEST_F(CacheProcessTest, ACallerMayIgnoreItsChildren) {
+  cacheDir = Path("new");
+  EXPECT_EQ(RunInChild([&] {
+              signal(SIGCHLD, SIG_IGN);
+              TestCache cache = MakeCache(false);
+              EXPECT_TRUE(cache.UpdateWithData("old"));
+              cache.isNeedUpdate = [](const Json::Value&) { return true; };
+              cache.FetchGives("new");
+              EXPECT_EQ(cache.Read(), "old");
+            }),
+            0);
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(MakeCache().Read(), "new");
+}
+
+TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {
+  WriteCacheFile("\"old\"", kStale);
+  LogCapture::MirrorTo("");
+  constexpr int kDone = 7;  // a status that only the end of the child's body gives
+  const pid_t child = Start([&] {
+    const TestCache cache = MakeCache(false);
+    const std::set<int> open = OpenDescriptors();
+    rlimit limit{0, 0};
+    // Two free descriptors: enough for the lock and the pid file, too few to fork with.
+    for (int free = 0; free < 2; ++limit.rlim_cur) {
+      if (open.count(static_cast<int>(limit.rlim_cur)) == 0) ++free;
+    }
+    limit.rlim_max = limit.rlim_cur;
+    EXPECT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+    const LogLine failed =
+        Warn("cache.cpp", "Update", "Failed to fork(). errno=[24/Too many open files]");
+    EXPECT_FALSE(cache.Update());
+    ExpectLog({failed});
+    EXPECT_EQ(cache.Read(), "old");
+    ExpectLog({failed, ReadFailed()});
+    return kDone;
+  });
+  const int status = Join(child);
+  EXPECT_TRUE(WIFEXITED(status));
+  EXPECT_EQ(WEXITSTATUS(status), kDone);
+}
+
+}  // namespace

@@ -1,0 +1,50 @@
+#include "support/test_cache.h"
+
+#include <fcntl.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <ctime>
+#include <filesystem>
+
+#include "support/test_clock.h"
+
+void CacheFixture::SetUp() {
+  CleanTest::SetUp();
+  if (geteuid() != 0) GTEST_SKIP() << "needs root: caches and lock files are written as root";
+  cacheDir = Path("cache");
+  std::filesystem::create_directory(cacheDir);
+  path = cacheDir + "/c.cached";
+  pidFile = path + ".pid";
+  lockName = path + ".lock";
+}
+
+void CacheFixture::TearDown() {
+  TestClock::Reset();
+  for (const std::string& name : NamesIn(cacheDir)) EXPECT_EQ(name, "c.cached") << "left behind";
+  std::error_code error;
+  std::filesystem::remove_all("/tmp/.kelodr_lock" + dir, error);
+  CleanTest::TearDown();
+}
+
+void CacheFixture::WriteCacheFile(const std::string& data, int age) const {
+  WriteText(path, R"({"cached_data":)" + data + "}");
+  if (age != 0) SetMtime(time(nullptr) - age);
+}
+
+void CacheFixture::SetMtime(time_t seconds) const {
+  const timespec times[2] = {{seconds, 0}, {seconds, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
+}
+
+void CacheFixture::RunWithOwnTmp(const std::string& size, const std::function<void()>& body) {
+  EXPECT_EQ(RunInChild([&] {
+              ASSERT_EQ(unshare(CLONE_NEWNS), 0);
+              ASSERT_EQ(mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), 0);
+              ASSERT_EQ(mount("tmpfs", "/tmp", "tmpfs", 0, ("size=" + size).c_str()), 0);
+              body();
+            }),
+            0);
+}
