@@ -12,6 +12,7 @@
 #include <limits>
 #include <locale>
 #include <memory>
+#include <type_traits>
 #include <utility>
 
 #include "kelocore.h"
