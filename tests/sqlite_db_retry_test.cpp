@@ -1,4 +1,5 @@
-// Statements that find the database busy or locked, with the engine failing on request.
+// Statements that find the database busy or locked, with the engine failing on request, and the
+// recorded error while they run.
 
 #include <gmock/gmock.h>
 #include <sqlite3.h>
@@ -8,6 +9,7 @@
 
 namespace {
 
+using KeloDRCore::SqliteCommand;
 using KeloDRCore::SqliteDB;
 using KeloDRCore::SqliteValueList;
 using testing::AllOf;
@@ -194,6 +196,51 @@ TEST_F(SqliteDBRetryTest, TheConnectionIsKeptBetweenAttempts) {
   EXPECT_TRUE(db->Exec(sql));
   LogCapture::Clear();
   EXPECT_THAT(Rows(*db, "SELECT n FROM mine"), ElementsAre("n:5"));
+}
+
+TEST_F(SqliteDBRetryTest, TheErrorIsUnknownWhileExecRunsAndAFailureWhileAQueryDoes) {
+  Start(0);
+  SqliteValueList record;
+  Records records;
+  Json::Value during;
+  FailNextCalls(0, [&] { during = db->GetErr(); });
+  EXPECT_TRUE(db->Exec("SELECT fail(1)"));
+  EXPECT_EQ(during, Error(407));
+  db->SetDBErr(7, "before");
+  EXPECT_TRUE(db->SelectByCommand("SELECT fail(1) AS n", record));
+  EXPECT_EQ(during, Error(404));
+  db->SetDBErr(7, "before");
+  EXPECT_TRUE(db->SelectByCommand("SELECT fail(1) AS n", records));
+  EXPECT_EQ(during, Error(404));
+}
+
+// Notes the handle's error whenever it is asked something.
+class ProbeCommand : public SqliteCommand {
+ public:
+  explicit ProbeCommand(const SqliteDB& observed) : db(observed) {}
+
+  std::string GetCommand() const override {
+    errors.push_back(db.GetErr());
+    return "SELECT " + std::to_string(errors.size());
+  }
+  bool IsValid() const override {
+    errors.push_back(db.GetErr());
+    return true;
+  }
+  void DumpParam(std::stringstream& /*stream*/) const override {}
+
+  mutable std::vector<Json::Value> errors;
+
+ private:
+  const SqliteDB& db;
+};
+
+TEST_F(SqliteDBRetryTest, ACommandIsAskedTwiceWithTheErrorOfItsStep) {
+  const ProbeCommand probe(*db);
+  EXPECT_TRUE(db->Exec(probe));
+  EXPECT_THAT(probe.errors, ElementsAre(Error(407), Error(407), Error(404)));
+  ExpectLog({Info(kFile, "Exec", "label Exec cmd: SELECT 1"),
+             Info(kFile, "Exec", "label Exec cmd success")});
 }
 
 }  // namespace

@@ -20,9 +20,11 @@ std::vector<unsigned int> pauseLengths;
 useconds_t sqliteSleeps = 0;
 
 int failuresLeft = 0;
+std::function<void()> callAction;
 
 void Fail(sqlite3_context* context, int /*count*/, sqlite3_value** arguments) {
   const int code = sqlite3_value_int(arguments[0]);
+  if (callAction) callAction();
   if (failuresLeft > 0) {
     --failuresLeft;
     sqlite3_result_error_code(context, code);
@@ -119,7 +121,8 @@ unsigned int SqliteWait() { return sqliteSleeps / 1000; }
 
 }  // namespace Pauses
 
-void FailNextCalls(int times) {
+void FailNextCalls(int times, const std::function<void()>& onCall) {
   failuresLeft = times;
+  callAction = onCall;
   sqlite3_auto_extension(reinterpret_cast<void (*)()>(AddFail));
 }

@@ -56,7 +56,8 @@ unsigned int SqliteWait();
 }  // namespace Pauses
 
 // Gives every connection opened from now on the SQL function fail(code): it fails with that SQLite
-// result code for the next `times` calls, and returns the code after them.
-void FailNextCalls(int times);
+// result code for the next `times` calls, and returns the code after them. `onCall` runs in each
+// call.
+void FailNextCalls(int times, const std::function<void()>& onCall = nullptr);
 
 #endif  // KELODRCORE_TESTS_SUPPORT_DATABASE_H_
