@@ -1,6 +1,7 @@
 // Documents in files: whole, replaced in one step, whoever writes and whatever fails.
 
 #include <fcntl.h>
+#include <poll.h>
 #include <sys/file.h>
 #include <sys/inotify.h>
 #include <sys/mount.h>
@@ -291,6 +292,8 @@ void WaitUntilClosed(const std::string& path, int times) {
   ASSERT_GE(inotify_add_watch(events, path.c_str(), IN_CLOSE_NOWRITE), 0);
   while (times > 0) {
     inotify_event event;
+    pollfd ready = {events, POLLIN, 0};
+    ASSERT_EQ(poll(&ready, 1, 10000), 1) << "nobody tries the lock again and again";
     ASSERT_EQ(read(events, &event, sizeof event), static_cast<ssize_t>(sizeof event));
     --times;
   }
