@@ -7,13 +7,14 @@ scripts/setup.sh build examples
 cmake --preset release
 cmake --build --preset release
 
+drctl=build/release/examples/drctl/drctl
 scratch=$(mktemp -d)
-trap 'rm -r "$scratch"' EXIT
+trap 'rm -r "$scratch" "/tmp/.kelodr_lock$scratch"' EXIT
 
 # Says what comes, shows the command, runs it.
 show() {
   printf '\n# %s\n$ drctl --db registry.db %s\n' "$1" "${*:2}"
-  build/release/examples/drctl/drctl --db "$scratch/registry.db" "${@:2}"
+  "$drctl" --db "$scratch/registry.db" "${@:2}"
 }
 
 show "Adds a node: the file and its table are made on first use" \
@@ -31,3 +32,24 @@ show "With --verbose, the library's own log lines" --verbose node remove nas1
 printf '\n# A failure prints the error document and exits with 1\n'
 show "A name that is taken" node add "o'brien's nas" --address nas.example --port 1 ||
   echo "exit status $?"
+
+show "Reads the system's own key=value file; a value is its first word" system info
+
+exported=$scratch/registry.json
+show "Writes the registry to a JSON file, in place" export "$exported"
+show "And reads it back; a bad document changes nothing" import "$exported"
+echo '{"format":"drctl registry","version":1,"volumes":[],"nodes":[{"name":"x"}]}' >"$scratch/bad.json"
+show "As here" import "$scratch/bad.json" || echo "exit status $?"
+
+cache=(--cached --cache-dir "$scratch/cache")
+show "Asks for the volumes through a cache file that all processes share" \
+  --verbose volume list "${cache[@]}" --repeat 2 2>&1 | grep -E '^[#$]|answered'
+
+printf '\n# The cache file gets old, and 20 processes ask at once\n'
+touch --date=@0 "$scratch/cache/volumes.cached"
+for i in {1..20}; do
+  "$drctl" --verbose volume list "${cache[@]}" >/dev/null 2>"$scratch/answer.$i" &
+done
+wait
+echo "$(grep -l "answered from a fresh scan" "$scratch"/answer.* | wc -l) of them scanned," \
+  "$(grep -l "answered from the cache file" "$scratch"/answer.* | wc -l) waited for it and read the file"

@@ -3,132 +3,55 @@
 #include <syslog.h>
 
 #include <CLI/CLI.hpp>
-#include <iostream>
-#include <memory>
-#include <optional>
+#include <limits>
 #include <string>
 
-#include "mounts.h"
-#include "output.h"
-#include "registry.h"
+#include "commands.h"
 
 namespace drctl {
 namespace {
 
-using KeloDRCore::SqliteValueList;
-
 constexpr int kUsageError = 2;
-
-// What the command line said, over all subcommands.
-struct Options {
-  std::string db;
-  bool verbose = false;
-  bool json = false;
-  std::string name;
-  std::optional<std::string> address;
-  std::optional<std::string> state;
-  std::optional<int> port;
-  Query query;
-};
-
-SqliteValueList GivenFields(const Options& options) {
-  SqliteValueList fields;
-  if (options.address) fields.AddValue("address", *options.address);
-  if (options.port) fields.AddValue("port", *options.port);
-  if (options.state) fields.AddValue("state", *options.state);
-  return fields;
-}
-
-int AddNode(Registry& registry, const Options& options) {
-  SqliteValueList node = GivenFields(options);
-  node.AddValue("name", options.name);
-  if (!options.state) node.AddValue("state", "unknown");
-  if (registry.AddNode(node)) return 0;
-  return Complain("cannot add node '" + options.name + "'", registry.GetErr());
-}
-
-int SetNode(Registry& registry, const Options& options) {
-  if (registry.SetNode(options.name, GivenFields(options))) return 0;
-  return Complain("cannot change node '" + options.name + "'", registry.GetErr());
-}
-
-int RemoveNode(Registry& registry, const Options& options) {
-  if (registry.RemoveNode(options.name)) return 0;
-  return Complain("cannot remove node '" + options.name + "'", registry.GetErr());
-}
-
-int ListNodes(Registry& registry, const Options& options) {
-  Rows rows;
-  if (!registry.ListNodes(options.query, rows)) {
-    return Complain("cannot list the nodes", registry.GetErr());
-  }
-  Print(rows, NodeColumns(), options.json);
-  return 0;
-}
-
-int CountNodes(Registry& registry, const Options& /*options*/) {
-  int count = 0;
-  if (!registry.CountNodes(count)) return Complain("cannot count the nodes", registry.GetErr());
-  std::cout << count << '\n';
-  return 0;
-}
-
-int ScanVolumes(Registry& registry, const Options& /*options*/) {
-  const Rows volumes = ScanMounts();
-  if (volumes.empty()) {
-    std::cerr << "drctl: cannot read the mounts from /proc/self/mountinfo\n";
-    return 1;
-  }
-  if (!registry.ReplaceVolumes(volumes)) {
-    return Complain("cannot store the volumes", registry.GetErr());
-  }
-  std::cout << volumes.size() << " mount points stored\n";
-  return 0;
-}
-
-int ListVolumes(Registry& registry, const Options& options) {
-  Rows rows;
-  if (!registry.ListVolumes(options.query, rows)) {
-    return Complain("cannot list the volumes", registry.GetErr());
-  }
-  Print(rows, VolumeColumns(), options.json);
-  return 0;
-}
 
 // The command line: a tree of subcommands, of which the leaf that was named runs.
 class CommandLine {
  public:
   CommandLine() {
     app.require_subcommand(1);
-    app.add_option("--db", options.db, "The registry's SQLite file")->required();
+    app.add_option("--db", options.db, "The registry's SQLite file");
     app.add_flag("--verbose", options.verbose, "Show the library's log lines on standard error");
     AddNodeCommands();
     AddVolumeCommands();
+    AddSystemCommands();
+    AddTransferCommands();
   }
 
   int Run(int argc, char** argv) {
     try {
       app.parse(argc, argv);
+      if (needsDb && !options.cached && options.db.empty()) throw CLI::RequiredError("--db");
     } catch (const CLI::ParseError& error) {
       return app.exit(error) == 0 ? 0 : kUsageError;
     }
     openlog("drctl", LOG_PID | (options.verbose ? LOG_PERROR : 0), LOG_USER);
-    Registry registry(options.db);
-    return run(registry, options);
+    return run(options);
   }
 
  private:
-  using Action = int (*)(Registry&, const Options&);
+  using Action = int (*)(const Options&);
 
   CLI::App* AddCommand(CLI::App* parent, const std::string& name, const std::string& description,
-                       Action action) {
+                       Action action, bool isOnDb = true) {
     CLI::App* const command = parent->add_subcommand(name, description);
-    command->callback([this, action] { run = action; });
+    command->callback([this, action, isOnDb] {
+      run = action;
+      needsDb = isOnDb;
+    });
     return command;
   }
 
-  CLI::Option* AddName(CLI::App* command) {
-    return command->add_option("name", options.name, "The node's name")->required();
+  void AddName(CLI::App* command) {
+    command->add_option("name", options.name, "The node's name")->required();
   }
 
   void AddNodeFields(CLI::App* command, bool isRequired) {
@@ -151,6 +74,24 @@ class CommandLine {
         ->check(CLI::NonNegativeNumber);
   }
 
+  void AddCacheOptions(CLI::App* command) {
+    CLI::Option* const cached = command->add_flag(
+        "--cached", options.cached, "Ask the mounts themselves, through a cache file");
+    CLI::Option* const dir =
+        command->add_option("--cache-dir", options.cacheDir, "The directory of the cache file");
+    cached->needs(dir);
+    for (const char* const name : {"--filter", "--order", "--desc", "--limit", "--offset"}) {
+      cached->excludes(command->get_option(name));
+    }
+    command->add_option("--max-age", options.maxAge, "Seconds until the cache file is stale")
+        ->capture_default_str()
+        ->needs(cached)
+        ->check(CLI::Range(0L, std::numeric_limits<long>::max()));
+    command->add_option("--repeat", options.repeat, "Ask that many times")
+        ->needs(cached)
+        ->check(CLI::PositiveNumber);
+  }
+
   void AddNodeCommands() {
     CLI::App* const node = app.add_subcommand("node", "The replication nodes");
     node->require_subcommand(1);
@@ -169,12 +110,36 @@ class CommandLine {
     CLI::App* const volume = app.add_subcommand("volume", "This machine's volumes");
     volume->require_subcommand(1);
     AddCommand(volume, "scan", "Stores the mounted volumes", ScanVolumes);
-    AddListOptions(AddCommand(volume, "list", "Lists the stored volumes", ListVolumes));
+    CLI::App* const list = AddCommand(volume, "list", "Lists the stored volumes", ListVolumes);
+    AddListOptions(list);
+    AddCacheOptions(list);
+  }
+
+  void AddSystemCommands() {
+    CLI::App* const system = app.add_subcommand("system", "This machine's system");
+    system->require_subcommand(1);
+    CLI::App* const info =
+        AddCommand(system, "info", "Shows a file of key=value lines", ShowSystem, false);
+    options.file = "/etc/os-release";
+    info->add_option("--file", options.file, "The file")->capture_default_str();
+    info->add_flag("--json", options.json, "Print one line of JSON");
+  }
+
+  void AddTransferCommands() {
+    for (const auto& [name, description, action] :
+         {std::make_tuple("export", "Writes the registry to a JSON file", ExportRegistry),
+          std::make_tuple("import", "Replaces the registry by that of a JSON file",
+                          ImportRegistry)}) {
+      AddCommand(&app, name, description, action)
+          ->add_option("file", options.file, "The JSON file")
+          ->required();
+    }
   }
 
   CLI::App app{"A registry of replication nodes and of this machine's volumes", "drctl"};
   Options options;
   Action run = nullptr;
+  bool needsDb = true;
 };
 
 }  // namespace

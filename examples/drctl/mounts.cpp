@@ -73,7 +73,7 @@ SqliteValueList MakeRow(const std::string& mountPoint, const Mount& mount, unsig
 
 }  // namespace
 
-std::vector<SqliteValueList> ScanMounts() {
+Rows ScanMounts() {
   std::map<std::string, Mount> mounts;
   std::ifstream in("/proc/self/mountinfo");
   for (std::string line; std::getline(in, line);) {
@@ -81,7 +81,7 @@ std::vector<SqliteValueList> ScanMounts() {
     Mount mount;
     if (ParseLine(line, mountPoint, mount)) mounts[mountPoint] = mount;
   }
-  std::vector<SqliteValueList> rows;
+  Rows rows;
   const auto now = static_cast<unsigned int>(std::time(nullptr));
   for (const auto& [mountPoint, mount] : mounts) rows.push_back(MakeRow(mountPoint, mount, now));
   return rows;

@@ -3,15 +3,13 @@
 #ifndef DRCTL_MOUNTS_H_
 #define DRCTL_MOUNTS_H_
 
-#include <kelodrcore/sqlite_value.h>
-
-#include <vector>
+#include "rows.h"
 
 namespace drctl {
 
 // One row a mount point, with the columns of a volume. Where mounts are stacked on one mount point,
 // the last one counts. Empty when /proc/self/mountinfo cannot be read.
-std::vector<KeloDRCore::SqliteValueList> ScanMounts();
+Rows ScanMounts();
 
 }  // namespace drctl
 

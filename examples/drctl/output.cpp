@@ -45,27 +45,6 @@ void PrintTable(const std::vector<std::vector<std::string>>& lines,
 
 }  // namespace
 
-Json::Value ToJson(const SqliteValueList& row, const std::vector<Column>& columns) {
-  Json::Value object(Json::objectValue);
-  for (const Column& column : columns) {
-    if (!row.HasField(column.name)) continue;
-    long long number = 0;
-    std::string text;
-    if (column.isNumber && row.GetValue(column.name, number)) {
-      object[column.name] = static_cast<Json::Int64>(number);
-    } else if (!column.isNumber && row.GetValue(column.name, text)) {
-      object[column.name] = text;
-    }
-  }
-  return object;
-}
-
-Json::Value ToJson(const Rows& rows, const std::vector<Column>& columns) {
-  Json::Value array(Json::arrayValue);
-  for (const SqliteValueList& row : rows) array.append(ToJson(row, columns));
-  return array;
-}
-
 void Print(const Rows& rows, const std::vector<Column>& columns, bool asJson) {
   if (asJson) return PrintJson(ToJson(rows, columns));
   std::vector<std::vector<std::string>> lines(1);

@@ -8,13 +8,9 @@
 #include <string>
 #include <vector>
 
-#include "registry.h"
+#include "rows.h"
 
 namespace drctl {
-
-// A row as an object with the columns that it has, and all rows as an array of them.
-Json::Value ToJson(const KeloDRCore::SqliteValueList& row, const std::vector<Column>& columns);
-Json::Value ToJson(const Rows& rows, const std::vector<Column>& columns);
 
 // One line of JSON, or a table with a line of headings; to standard output.
 void Print(const Rows& rows, const std::vector<Column>& columns, bool asJson);

@@ -25,16 +25,10 @@ const SqliteTableHandler kVolumes("volume",
                                   "fs_type TEXT NOT NULL, size_mib INTEGER NOT NULL, "
                                   "free_mib INTEGER NOT NULL, scanned_at INTEGER NOT NULL");
 
-const Column* FindColumn(const std::vector<Column>& columns, const std::string& name) {
-  const auto found = std::find_if(columns.begin(), columns.end(),
-                                  [&](const Column& column) { return column.name == name; });
-  return found != columns.end() ? &*found : nullptr;
-}
-
 // The value of a filter in the type of its column; invalid when it does not fit.
 SqliteValue FilterValue(const Column& column, const std::string& text) {
   if (!column.isNumber) return text;
-  int number = 0;
+  unsigned int number = 0;
   const char* const end = text.data() + text.size();
   const auto result = std::from_chars(text.data(), end, number);
   if (result.ec != std::errc() || result.ptr != end) return {};
@@ -54,24 +48,7 @@ SqliteCondition ParseFilter(const std::vector<Column>& columns, const std::strin
   return SqliteEqual(column->name, value);
 }
 
-bool ReadText(const SqliteValueList& row, const std::string& field, std::string& text) {
-  return row.HasField(field) && row.GetValue(field, text);
-}
-
 }  // namespace
-
-const std::vector<Column>& NodeColumns() {
-  static const std::vector<Column> columns = {
-      {"name", false}, {"address", false}, {"port", true}, {"state", false}};
-  return columns;
-}
-
-const std::vector<Column>& VolumeColumns() {
-  static const std::vector<Column> columns = {{"mount_point", false}, {"device", false},
-                                              {"fs_type", false},     {"size_mib", true},
-                                              {"free_mib", true},     {"scanned_at", true}};
-  return columns;
-}
 
 Registry::Registry(const std::string& path) : SqliteDB(path, kRetries, "[drctl]") {}
 
@@ -94,21 +71,6 @@ bool Registry::InTransaction(const std::function<bool()>& steps) {
   errCode = code;
   errMsg = message;
   return false;
-}
-
-std::string Registry::CheckNode(const SqliteValueList& node, bool isWhole) {
-  for (const char* const field : {"name", "address", "state"}) {
-    std::string text;
-    if (!node.HasField(field) && !isWhole) continue;
-    if (!ReadText(node, field, text) || text.empty()) return std::string(field) + " must be a text";
-    if (text.find('\0') != std::string::npos) return std::string(field) + " holds a NUL byte";
-  }
-  int port = 0;
-  if (!node.HasField("port") && !isWhole) return "";
-  if (!node.HasField("port") || !node.GetValue("port", port) || port < 1 || port > 65535) {
-    return "port must be a number from 1 to 65535";
-  }
-  return "";
 }
 
 bool Registry::AddNode(const SqliteValueList& node) {

@@ -10,18 +10,9 @@
 #include <string>
 #include <vector>
 
+#include "rows.h"
+
 namespace drctl {
-
-using Rows = std::vector<KeloDRCore::SqliteValueList>;
-
-// A column, as commands and output name it.
-struct Column {
-  std::string name;
-  bool isNumber;
-};
-
-const std::vector<Column>& NodeColumns();
-const std::vector<Column>& VolumeColumns();
 
 // What a list shows: rows that meet every filter, sorted, a part of them.
 struct Query {
@@ -57,12 +48,10 @@ class Registry : public KeloDRCore::SqliteDB {
   // Replaces nodes and volumes at once, or changes nothing.
   bool ReplaceAll(const Rows& nodes, const Rows& volumes);
 
-  // Empty when the fields of a node are good, else what is wrong with them. `isWhole`: all fields
-  // must be there.
-  static std::string CheckNode(const KeloDRCore::SqliteValueList& node, bool isWhole);
+  // Records a failure of the program's own; false.
+  bool Fail(int code, const std::string& message);
 
  private:
-  bool Fail(int code, const std::string& message);
   bool InTransaction(const std::function<bool()>& steps);
   bool RequireNode(const std::string& name);
   bool InsertAll(const KeloDRCore::SqliteTableHandler& table, const Rows& rows);

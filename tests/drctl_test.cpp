@@ -1,0 +1,323 @@
+// The example program, run as a user runs it.
+
+#include <fcntl.h>
+#include <kelodrcore/json_value.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <set>
+
+#include "support/clean_test.h"
+#include "support/program.h"
+
+namespace {
+
+namespace JsonValue = KeloDRCore::JsonValue;
+
+class DrctlTest : public CleanTest {
+ protected:
+  // Runs "drctl --db FILE ARGUMENT..." on this test's own registry.
+  Outcome Run(std::vector<std::string> arguments, const std::string& input = "") {
+    arguments.insert(arguments.begin(), {DRCTL, "--db", Path("registry.db")});
+    return RunProgram(dir, arguments, input);
+  }
+
+  void AddNode(const std::string& name, const std::string& port = "5566",
+               const std::string& state = "online") {
+    const Outcome outcome = Run(
+        {"node", "add", name, "--address", name + ".example", "--port", port, "--state", state});
+    ASSERT_EQ(outcome.status, 0) << outcome.err;
+  }
+
+  Json::Value List(const std::string& what, std::vector<std::string> options = {}) {
+    options.insert(options.begin(), {what, "list", "--json"});
+    const Outcome outcome = Run(options);
+    EXPECT_EQ(outcome.status, 0) << outcome.err;
+    Json::Value rows;
+    EXPECT_TRUE(JsonValue::fromString(rows, outcome.out)) << outcome.out;
+    return rows;
+  }
+
+  // The names of the listed nodes, joined.
+  std::string Names(const std::vector<std::string>& options = {}) {
+    std::string names;
+    for (const Json::Value& node : List("node", options)) names += node["name"].asString() + " ";
+    return names;
+  }
+};
+
+TEST_F(DrctlTest, WithoutASubcommandItIsAUsageError) {
+  const Outcome outcome = Run({});
+  EXPECT_EQ(outcome.status, 2);
+  EXPECT_EQ(outcome.out, "");
+  EXPECT_NE(outcome.err.find("subcommand is required"), std::string::npos) << outcome.err;
+}
+
+TEST_F(DrctlTest, HelpGoesToStandardOutputAndSucceeds) {
+  for (const std::vector<std::string>& arguments :
+       {std::vector<std::string>{"--help"}, {"node", "--help"}, {"node", "add", "--help"}}) {
+    const Outcome outcome = Run(arguments);
+    EXPECT_EQ(outcome.status, 0);
+    EXPECT_NE(outcome.out.find("Usage: drctl"), std::string::npos);
+    EXPECT_EQ(outcome.err, "");
+  }
+}
+
+TEST_F(DrctlTest, AMissingDbIsAUsageErrorWhereOneIsNeeded) {
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list"}).status, 2);
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "system", "info"}).status, 0);
+}
+
+TEST_F(DrctlTest, BadPortsAreUsageErrors) {
+  for (const char* const port : {"0", "65536", "-1", "x", "80x", ""}) {
+    EXPECT_EQ(Run({"node", "add", "a", "--address", "b", "--port", port}).status, 2) << port;
+  }
+  EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
+}
+
+TEST_F(DrctlTest, AnAddedNodeIsListed) {
+  ASSERT_EQ(Run({"node", "add", "o'brien \"x\"", "--address", "192.0.2.1", "--port", "80"}).status,
+            0);
+  const Json::Value nodes = List("node");
+  ASSERT_EQ(nodes.size(), 1U);
+  EXPECT_EQ(nodes[0]["name"], "o'brien \"x\"");
+  EXPECT_EQ(nodes[0]["address"], "192.0.2.1");
+  EXPECT_EQ(nodes[0]["port"], 80);
+  EXPECT_EQ(nodes[0]["state"], "unknown");
+}
+
+TEST_F(DrctlTest, ATakenNameFailsWithTheErrorDocument) {
+  AddNode("a");
+  const Outcome outcome = Run({"node", "add", "a", "--address", "x", "--port", "1"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.out, "");
+  EXPECT_EQ(outcome.err,
+            "drctl: cannot add node 'a': {\"err_code\":508,\"err_code_str\":\"ERR_NODE_EXIST\","
+            "\"err_msg\":\"there is a node of that name\"}\n");
+  EXPECT_EQ(List("node")[0]["address"], "a.example");
+}
+
+TEST_F(DrctlTest, SetChangesOnlyWhatIsGiven) {
+  AddNode("a", "80");
+  ASSERT_EQ(Run({"node", "set", "a", "--state", "syncing"}).status, 0);
+  const Json::Value node = List("node")[0];
+  EXPECT_EQ(node["state"], "syncing");
+  EXPECT_EQ(node["port"], 80);
+}
+
+TEST_F(DrctlTest, SetWithoutAChangeFails) {
+  AddNode("a");
+  const Outcome outcome = Run({"node", "set", "a"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_NE(outcome.err.find("BAD_PARAMETER"), std::string::npos) << outcome.err;
+}
+
+TEST_F(DrctlTest, UnknownNodesCannotBeChangedOrRemoved) {
+  for (const bool isFileThere : {false, true}) {
+    if (isFileThere) AddNode("a");
+    for (const std::vector<std::string>& arguments :
+         {std::vector<std::string>{"node", "set", "b", "--state", "x"}, {"node", "remove", "b"}}) {
+      const Outcome outcome = Run(arguments);
+      EXPECT_EQ(outcome.status, 1);
+      EXPECT_NE(outcome.err.find("ERR_NODE_NOT_EXIST"), std::string::npos) << outcome.err;
+    }
+  }
+  EXPECT_EQ(Names(), "a ");
+}
+
+TEST_F(DrctlTest, ReadingAMissingRegistryCreatesNothing) {
+  EXPECT_EQ(Run({"node", "count"}).out, "0\n");
+  EXPECT_EQ(List("node").size(), 0U);
+  EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
+}
+
+TEST_F(DrctlTest, RemoveAndCount) {
+  AddNode("a");
+  AddNode("b");
+  EXPECT_EQ(Run({"node", "count"}).out, "2\n");
+  EXPECT_EQ(Run({"node", "remove", "a"}).status, 0);
+  EXPECT_EQ(Run({"node", "count"}).out, "1\n");
+  EXPECT_EQ(Names(), "b ");
+}
+
+TEST_F(DrctlTest, ListFiltersOrdersAndLimits) {
+  AddNode("a", "3");
+  AddNode("b", "2", "offline");
+  AddNode("c", "1");
+  EXPECT_EQ(Names({"--order", "port"}), "c b a ");
+  EXPECT_EQ(Names({"--order", "name", "--desc"}), "c b a ");
+  EXPECT_EQ(Names({"--filter", "state=online", "--order", "name"}), "a c ");
+  EXPECT_EQ(Names({"--filter", "state!=online"}), "b ");
+  EXPECT_EQ(Names({"--filter", "port=3", "--filter", "state=online"}), "a ");
+  EXPECT_EQ(Names({"--order", "name", "--limit", "1", "--offset", "1"}), "b ");
+  EXPECT_EQ(Names({"--filter", "name=' OR 1=1 --"}), "");
+}
+
+TEST_F(DrctlTest, BadFiltersAndOrdersAreRefused) {
+  AddNode("a");
+  for (const std::vector<std::string>& option : {std::vector<std::string>{"--filter", "bogus=1"},
+                                                 {"--filter", "name"},
+                                                 {"--filter", "=1"},
+                                                 {"--filter", "port=x"},
+                                                 {"--order", "name; DROP TABLE node"}}) {
+    std::vector<std::string> arguments = {"node", "list"};
+    arguments.insert(arguments.end(), option.begin(), option.end());
+    const Outcome outcome = Run(arguments);
+    EXPECT_EQ(outcome.status, 1) << option[1];
+    EXPECT_NE(outcome.err.find("BAD_PARAMETER"), std::string::npos) << outcome.err;
+  }
+}
+
+TEST_F(DrctlTest, TheTableHasHeadingsAndAlignedColumns) {
+  AddNode("a", "80");
+  AddNode("longer", "5566");
+  EXPECT_EQ(Run({"node", "list", "--order", "name"}).out,
+            "name    address         port  state\n"
+            "a       a.example         80  online\n"
+            "longer  longer.example  5566  online\n");
+}
+
+TEST_F(DrctlTest, AnUnusableRegistryFailsWithTheErrorDocument) {
+  const Outcome outcome = RunProgram(dir, {DRCTL, "--db", Path("no/such/dir.db"), "node", "add",
+                                           "a", "--address", "b", "--port", "1"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.err,
+            "drctl: cannot add node 'a': "
+            "{\"err_code\":404,\"err_code_str\":\"ERR_DATABASE_OPERATION\"}\n");
+}
+
+TEST_F(DrctlTest, VerboseShowsTheLogLines) {
+  const Outcome outcome = Run({"--verbose", "node", "add", "a", "--address", "b", "--port", "1"});
+  EXPECT_NE(outcome.err.find("(Exec)[INFO]"), std::string::npos) << outcome.err;
+  EXPECT_EQ(Run({"node", "count"}).err, "");
+}
+
+TEST_F(DrctlTest, ScannedVolumesAreTheMachinesMounts) {
+  ASSERT_EQ(Run({"volume", "scan"}).status, 0);
+  const Json::Value volumes = List("volume");
+  std::set<std::string> listed;
+  for (const Json::Value& volume : volumes) listed.insert(volume["mount_point"].asString());
+  EXPECT_EQ(listed.size(), volumes.size()) << "one row a mount point";
+  EXPECT_EQ(listed.count("/"), 1U);
+  EXPECT_EQ(listed.count("/proc"), 1U);
+  // A second scan replaces, it does not add.
+  ASSERT_EQ(Run({"volume", "scan"}).status, 0);
+  EXPECT_EQ(List("volume").size(), volumes.size());
+}
+
+TEST_F(DrctlTest, SystemInfoReadsKeysAndValues) {
+  WriteText(Path("settings"), "NAME=nas\nSIZE = 5\nno separator\n");
+  const Outcome outcome = Run({"system", "info", "--file", Path("settings")});
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_EQ(outcome.out, "NAME=nas\nSIZE=5\n");
+  EXPECT_EQ(Run({"system", "info", "--json", "--file", Path("settings")}).out,
+            "{\"NAME\":\"nas\",\"SIZE\":\"5\"}\n");
+  EXPECT_EQ(Run({"system", "info", "--file", Path("none")}).status, 1);
+}
+
+TEST_F(DrctlTest, AnExportedRegistryComesBack) {
+  AddNode("a", "80");
+  AddNode("o'brien", "81");
+  ASSERT_EQ(Run({"volume", "scan"}).status, 0);
+  const Json::Value nodes = List("node", {"--order", "name"});
+  const Json::Value volumes = List("volume", {"--order", "mount_point"});
+  ASSERT_EQ(Run({"export", Path("registry.json")}).status, 0);
+  ASSERT_EQ(Run({"node", "remove", "a"}).status, 0);
+  AddNode("c");
+  ASSERT_EQ(Run({"import", Path("registry.json")}).status, 0);
+  EXPECT_EQ(List("node", {"--order", "name"}), nodes);
+  EXPECT_EQ(List("volume", {"--order", "mount_point"}), volumes);
+}
+
+TEST_F(DrctlTest, ABadImportTellsEveryReasonAndChangesNothing) {
+  AddNode("a");
+  WriteText(Path("bad.json"), R"({"format":"drctl registry","version":1,"volumes":[],"nodes":[
+      {"name":"b","address":"x","port":1,"state":"s"},
+      {"name":"b","address":"x","port":1,"state":"s"},
+      {"name":"c","address":"x","port":70000,"state":"s"},
+      {"name":"d","address":5,"port":1,"state":"s"}, 7]})");
+  const Outcome outcome = Run({"import", Path("bad.json")});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.err,
+            "drctl: refused: nodes[1]: there is another name b\n"
+            "drctl: refused: nodes[2]: port must be a number from 1 to 65535\n"
+            "drctl: refused: nodes[3]: address must be a text\n"
+            "drctl: refused: nodes[4]: not an object\n"
+            "drctl: cannot import '" +
+                Path("bad.json") + "': nothing was changed\n");
+  EXPECT_EQ(Names(), "a ");
+}
+
+TEST_F(DrctlTest, WhatIsNoExportIsNotImported) {
+  AddNode("a");
+  for (const char* const text : {"", "[]", "{}", "{\"format\":\"drctl registry\",\"version\":2}",
+                                 "{\"format\":\"drctl registry\",\"version\":1}", "not JSON"}) {
+    WriteText(Path("bad.json"), text);
+    EXPECT_EQ(Run({"import", Path("bad.json")}).status, 1) << text;
+  }
+  EXPECT_EQ(Run({"import", Path("none.json")}).status, 1);
+  EXPECT_EQ(Names(), "a ");
+}
+
+class DrctlCacheTest : public DrctlTest {
+ protected:
+  Outcome ListCached(const std::vector<std::string>& options = {}) {
+    std::vector<std::string> arguments = {DRCTL,    "--verbose", "volume",      "list",
+                                          "--json", "--cached",  "--cache-dir", Path("cache")};
+    arguments.insert(arguments.end(), options.begin(), options.end());
+    return RunProgram(dir, arguments);
+  }
+
+  static int CountOf(const std::string& text, const std::string& part) {
+    int count = 0;
+    for (size_t at = text.find(part); at != std::string::npos; at = text.find(part, at + 1))
+      ++count;
+    return count;
+  }
+
+  void TearDown() override {
+    RunProgram(dir, {"/bin/rm", "-rf", "/tmp/.kelodr_lock/" + dir});
+    DrctlTest::TearDown();
+  }
+};
+
+TEST_F(DrctlCacheTest, AnswersFromAScanThenTheFileThenMemory) {
+  const Outcome first = ListCached();
+  EXPECT_EQ(first.status, 0);
+  EXPECT_EQ(CountOf(first.err, "answered from a fresh scan"), 1) << first.err;
+  const Outcome second = ListCached({"--repeat", "3"});
+  EXPECT_EQ(CountOf(second.err, "answered from the cache file"), 1) << second.err;
+  EXPECT_EQ(CountOf(second.err, "answered from memory"), 2) << second.err;
+  EXPECT_EQ(first.out, second.out);
+}
+
+TEST_F(DrctlCacheTest, AStaleFileIsScannedAgain) {
+  ASSERT_EQ(ListCached().status, 0);
+  const timespec old[2] = {{1000, 0}, {1000, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, Path("cache/volumes.cached").c_str(), old, 0), 0);
+  EXPECT_EQ(CountOf(ListCached().err, "answered from a fresh scan"), 1);
+}
+
+// What the demo shows: many ask at once, and one of them scans.
+TEST_F(DrctlCacheTest, OfTwentyProcessesAtOnceOneScans) {
+  std::vector<pid_t> children;
+  for (int i = 0; i < 20; ++i) {
+    children.push_back(fork());
+    if (children.back() != 0) continue;
+    const Outcome outcome = ListCached();
+    WriteText(Path("answer-" + std::to_string(i)), outcome.err);
+    _exit(outcome.status);
+  }
+  std::string answers;
+  for (size_t i = 0; i < children.size(); ++i) {
+    int status = -1;
+    ASSERT_EQ(waitpid(children[i], &status, 0), children[i]);
+    EXPECT_EQ(status, 0);
+    answers += ReadText(Path("answer-" + std::to_string(i)));
+  }
+  EXPECT_EQ(CountOf(answers, "answered from a fresh scan"), 1) << answers;
+  EXPECT_EQ(CountOf(answers, "answered from the cache file"), 19) << answers;
+}
+
+}  // namespace
