@@ -8,7 +8,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 inputs=${1:-100000}
 targets=("${@:2}")
-[ ${#targets[@]} -gt 0 ] || targets=(command key_value literal request)
+[ ${#targets[@]} -gt 0 ] || targets=(command key_value literal request response)
 
 scripts/setup.sh build fuzz
 cmake --preset fuzz
