@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
+#include <memory>
 #include <mutex>
 #include <ostream>
 #include <regex>
@@ -51,12 +52,12 @@ void Record(int priority, const char* format, va_list arguments) {
   char* text = nullptr;
   errno = savedErrno;  // for "%m"
   if (vasprintf(&text, format, arguments) < 0) abort();
+  const std::unique_ptr<char, void (*)(void*)> owner(text, free);
   {
     const std::lock_guard<std::mutex> guard(mutex);
     lines.push_back(Parse(priority, text, std::to_string(getpid())));
     if (!mirrorPath.empty()) Mirror(priority, text);
   }
-  free(text);
   errno = savedErrno;
 }
 

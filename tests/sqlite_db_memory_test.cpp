@@ -1,0 +1,103 @@
+// The database handle when memory runs out: the n-th allocation fails, for every n.
+
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+
+#include <cstdlib>
+#include <new>
+
+#include "kelodrcore/sqlite_db.h"
+#include "support/database.h"
+
+namespace {
+
+using KeloDRCore::InsertCommand;
+using KeloDRCore::SelectCommand;
+using KeloDRCore::SqliteDB;
+using KeloDRCore::SqliteTableHandler;
+using KeloDRCore::SqliteValueList;
+
+// Allocations until one fails; below 0 none does.
+int allocationsLeft = -1;
+
+}  // namespace
+
+void* operator new(std::size_t size) {
+  if (allocationsLeft >= 0 && allocationsLeft-- == 0) throw std::bad_alloc();
+  void* const memory = std::malloc(size != 0 ? size : 1);
+  if (memory == nullptr) throw std::bad_alloc();
+  return memory;
+}
+
+void operator delete(void* memory) noexcept { std::free(memory); }
+void operator delete(void* memory, std::size_t /*size*/) noexcept { std::free(memory); }
+
+namespace {
+
+class SqliteDBMemoryTest : public DatabaseTest {
+ protected:
+  // Runs `action` with the n-th allocation failing until n is beyond its last. Nothing but
+  // std::bad_alloc may come out, and closing must give back all that SQLite took, which it does
+  // not while a statement is left.
+  void FailEachAllocation(const std::function<void(SqliteDB&)>& action) {
+    const sqlite3_int64 memory = sqlite3_memory_used();
+    bool isThrough = false;
+    int allocation = 0;
+    for (; !isThrough; ++allocation) {
+      ASSERT_LT(allocation, 100000);
+      SqliteDB scarce(path, 0, "label");
+      allocationsLeft = allocation;
+      try {
+        action(scarce);
+        isThrough = allocationsLeft >= 0;
+      } catch (const std::bad_alloc&) {
+      }
+      allocationsLeft = -1;
+      scarce.Close();
+      ASSERT_EQ(sqlite3_memory_used(), memory) << "allocation " << allocation;
+      LogCapture::Clear();
+    }
+    EXPECT_GT(allocation, 5);
+  }
+
+  void SetUp() override {
+    DatabaseTest::SetUp();
+    ASSERT_TRUE(db->Exec("CREATE TABLE t (n, s); INSERT INTO t VALUES (1, 'a long enough text')"));
+    db->Close();
+  }
+};
+
+TEST_F(SqliteDBMemoryTest, ExecFailsCleanly) {
+  FailEachAllocation([](SqliteDB& scarce) { scarce.Exec("DROP TABLE a_table_that_is_missing"); });
+}
+
+TEST_F(SqliteDBMemoryTest, QueriesFailCleanly) {
+  FailEachAllocation([](SqliteDB& scarce) {
+    SqliteValueList record;
+    scarce.SelectByCommand("SELECT n, s, NULL AS empty FROM t", record);
+  });
+  FailEachAllocation([](SqliteDB& scarce) {
+    std::vector<SqliteValueList> records;
+    scarce.SelectByCommand("SELECT n, s, abs(-9223372036854775808) FROM t", records);
+  });
+}
+
+TEST_F(SqliteDBMemoryTest, CommandsFailCleanly) {
+  const SqliteTableHandler table("t", "n, s");
+  FailEachAllocation([&](SqliteDB& scarce) {
+    InsertCommand insert;
+    insert.SetTable(table);
+    insert.AddFieldValue("n", 2);
+    insert.AddFieldValue("s", "it's a text");
+    scarce.InsertRecord(insert);
+  });
+  FailEachAllocation([&](SqliteDB& scarce) {
+    SelectCommand select;
+    select.SetTable(table);
+    select.SelectAll();
+    std::vector<SqliteValueList> records;
+    scarce.SelectRecords(select, records);
+  });
+}
+
+}  // namespace
