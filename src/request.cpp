@@ -1,5 +1,6 @@
 #include "kelodrcore/request.h"
 
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -55,7 +56,8 @@ void Request::setUploadFile(const UploadFileDescription& file) { uploadFile = fi
 bool Request::isValid() const { return !api.empty() && !method.empty() && version >= 1; }
 
 bool Request::isValidKey(const std::string& key) {
-  return key != kApi && key != kMethod && key != kVersion;
+  const std::string_view name(key);
+  return name != kApi && name != kMethod && name != kVersion;
 }
 
 bool Request::addParam(const std::string& key, const Json::Value& value) {
@@ -69,7 +71,7 @@ bool Request::addParam(const std::string& key, const Json::Value& value) {
 bool Request::addParam(const Json::Value& members) {
   if (!CanHoldMembers(params)) return false;
   if (!members.isObject()) return true;
-  // `members` may lie inside a member that it replaces, so what it replaces outlives the walk.
+  // `members` may lie inside a member that it replaces, so what may hold it outlives the walk.
   std::vector<Json::Value> replaced;
   const auto end = members.end();
   for (auto member = members.begin(); member != end; ++member) {
@@ -77,7 +79,7 @@ bool Request::addParam(const Json::Value& members) {
     if (!isValidKey(key)) continue;
     Json::Value value(*member);
     params[key].swap(value);
-    if (!value.isNull()) replaced.push_back(std::move(value));
+    if (value.isObject() || value.isArray()) replaced.push_back(std::move(value));
   }
   return true;
 }

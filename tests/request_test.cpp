@@ -320,6 +320,12 @@ TEST_F(RequestTest, MergesAnObjectThatTheMergeReplaces) {
   EXPECT_EQ(request.getParams(), Parse(R"({"a": 1, "m": {"long": "text"}, "z": [2]})"));
 }
 
+TEST_F(RequestTest, MergesAnObjectInsideAnArrayThatTheMergeReplaces) {
+  Request request = WithParams(Parse(R"({"m": [0, {"a": {"b": 1}, "m": "new", "z": [2]}]})"));
+  EXPECT_TRUE(request.addParam(request.getParams()["m"][1]));
+  EXPECT_EQ(request.getParams(), Parse(R"({"a": {"b": 1}, "m": "new", "z": [2]})"));
+}
+
 TEST_F(RequestTest, MergesAnObjectInsideAMemberThatTheMergeReplaces) {
   Request request =
       WithParams(Parse(R"({"m": {"n": {"a": {"b": 1}, "m": "new", "z": {"y": 2}}}, "z": 0})"));
