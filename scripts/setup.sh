@@ -20,7 +20,7 @@ cd "$(dirname "$0")/.."
 packages_of() {
   case $1 in
     build) echo g++ cmake ninja-build libsqlite3-dev libjsoncpp-dev uuid-runtime ;;
-    test) echo libgtest-dev libgmock-dev pkgconf valgrind ;;
+    test) echo libgtest-dev libgmock-dev locales pkgconf valgrind ;;
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
     lint) echo clang-tidy shellcheck ;;

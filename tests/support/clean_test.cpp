@@ -1,6 +1,8 @@
 #include "support/clean_test.h"
 
 #include <dirent.h>
+#include <sched.h>
+#include <sys/mount.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -59,6 +61,20 @@ int RunInChild(const std::function<void()>& body) {
   while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
   }
   return status;
+}
+
+bool RunWithOwnMounts(const std::function<void()>& body) {
+  constexpr int kNotAllowed = 77;
+  const int status = RunInChild([&] {
+    if (unshare(CLONE_NEWNS) != 0 ||
+        mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+      _exit(kNotAllowed);
+    }
+    body();
+  });
+  if (WIFEXITED(status) && WEXITSTATUS(status) == kNotAllowed) return false;
+  EXPECT_EQ(status, 0);
+  return true;
 }
 
 void CleanTest::SetUp() {

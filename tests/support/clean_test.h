@@ -26,6 +26,10 @@ void WriteText(const std::string& path, const std::string& text);
 // of it failed. Failed expectations of the child are printed by the child.
 int RunInChild(const std::function<void()>& body);
 
+// Runs `body` in a child whose mounts are its own, and expects it to pass; false when this process
+// may not do that. What `body` mounts is seen by nobody else and gone with the child.
+bool RunWithOwnMounts(const std::function<void()>& body);
+
 // Each test has an empty directory and an empty log record. Teardown fails when the test left a
 // descriptor open, a child (running or zombie) behind, other effective ids, or a log line that it
 // did not Take().

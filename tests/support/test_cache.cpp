@@ -1,7 +1,6 @@
 #include "support/test_cache.h"
 
 #include <fcntl.h>
-#include <sched.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -40,11 +39,10 @@ void CacheFixture::SetMtime(time_t seconds) const {
 }
 
 void CacheFixture::RunWithOwnTmp(const std::string& size, const std::function<void()>& body) {
-  EXPECT_EQ(RunInChild([&] {
-              ASSERT_EQ(unshare(CLONE_NEWNS), 0);
-              ASSERT_EQ(mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), 0);
-              ASSERT_EQ(mount("tmpfs", "/tmp", "tmpfs", 0, ("size=" + size).c_str()), 0);
-              body();
-            }),
-            0);
+  if (!RunWithOwnMounts([&] {
+        ASSERT_EQ(mount("tmpfs", "/tmp", "tmpfs", 0, ("size=" + size).c_str()), 0);
+        body();
+      })) {
+    GTEST_SKIP() << "needs the right to mount a file system";
+  }
 }

@@ -67,7 +67,8 @@ class CacheFixture : public CleanTest {
   // Sets the modification time of the cache file in seconds since the epoch.
   void SetMtime(time_t seconds) const;
 
-  // Runs `body` in a child that sees an empty /tmp of `size`.
+  // Runs `body` in a child that sees an empty /tmp of `size`; skips the test when this
+  // process may not mount one.
   static void RunWithOwnTmp(const std::string& size, const std::function<void()>& body);
 
   // The lines of a cache's course, for the cache of MakeCache().
