@@ -53,3 +53,14 @@ done
 wait
 echo "$(grep -l "answered from a fresh scan" "$scratch"/answer.* | wc -l) of them scanned," \
   "$(grep -l "answered from the cache file" "$scratch"/answer.* | wc -l) waited for it and read the file"
+
+call() {
+  printf '\n# %s\n$ echo %s | drctl --db registry.db call\n' "$1" "'$2'"
+  "$drctl" --db "$scratch/registry.db" call <<<"$2" || echo "exit status $?"
+}
+call "One call of the web API on standard input, one reply on standard output" \
+  '{"api":"Node","method":"create","version":1,"name":"nas2","address":"192.0.2.11","port":5566}'
+call "Again: the reply names the error" \
+  '{"api":"Node","method":"create","version":1,"name":"nas2","address":"192.0.2.11","port":5566}'
+call "A scan in the background, to be polled by its task id" \
+  '{"api":"Volume","method":"scan","version":1}'

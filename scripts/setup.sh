@@ -10,7 +10,6 @@
 #   lint      the static checkers
 #   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
 #   docs      the API documentation's generator
-#   web       a web server for the web API handler
 #   bench     the benchmark library
 #   fuzz      the fuzzing compiler
 #   coverage  the coverage report
@@ -20,13 +19,12 @@ cd "$(dirname "$0")/.."
 packages_of() {
   case $1 in
     build) echo g++ cmake ninja-build libsqlite3-dev libjsoncpp-dev uuid-runtime ;;
-    test) echo libgtest-dev libgmock-dev locales pkgconf valgrind ;;
+    test) echo libgtest-dev libgmock-dev locales pkgconf valgrind lighttpd curl ;;
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
     lint) echo clang-tidy shellcheck ;;
     i386) echo g++-multilib googletest ;;
     docs) echo doxygen graphviz ;;
-    web) echo lighttpd curl ;;
     bench) echo libbenchmark-dev ;;
     fuzz) echo clang libclang-rt-14-dev ;;
     coverage) echo gcovr ;;

@@ -25,6 +25,9 @@ struct Options {
   long maxAge = 60;
   int repeat = 1;
   std::string file;
+  std::string callFile;
+  std::string stateDir;
+  bool cgi = false;
 };
 
 // Each runs one subcommand and returns the program's exit status: 0, or 1 with a line on standard

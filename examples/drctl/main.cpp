@@ -6,6 +6,7 @@
 #include <limits>
 #include <string>
 
+#include "call.h"
 #include "commands.h"
 
 namespace drctl {
@@ -24,6 +25,7 @@ class CommandLine {
     AddVolumeCommands();
     AddSystemCommands();
     AddTransferCommands();
+    AddCallCommand();
   }
 
   int Run(int argc, char** argv) {
@@ -134,6 +136,19 @@ class CommandLine {
           ->add_option("file", options.file, "The JSON file")
           ->required();
     }
+  }
+
+  void AddCallCommand() {
+    CLI::App* const call = AddCommand(&app, "call", "Answers one call of the web API", Call);
+    CLI::Option* const file = call->add_option("--file", options.callFile,
+                                               "Read the call from a file, not standard input");
+    call->add_flag("--cgi", options.cgi, "Be a CGI program: the call is the body of a POST")
+        ->excludes(file);
+    call->add_option("--cache-dir", options.cacheDir, "Directory of the volume cache [DB.cache]");
+    call->add_option("--state-dir", options.stateDir, "Directory of the tasks' states [DB.tasks]");
+    call->add_option("--max-age", options.maxAge, "Seconds until the cache file is stale")
+        ->capture_default_str()
+        ->check(CLI::Range(0L, std::numeric_limits<long>::max()));
   }
 
   CLI::App app{"A registry of replication nodes and of this machine's volumes", "drctl"};
