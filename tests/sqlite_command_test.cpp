@@ -58,6 +58,16 @@ TEST_F(SqliteCommandTest, ShapeOfTheClasses) {
   static_assert(std::is_base_of_v<SqliteCommand, DeleteCommand>);
 }
 
+// Puts the class into the names of the tests that run for several.
+struct ClassName {
+  template <typename Command>
+  static std::string GetName(int /*index*/) {
+    if (std::is_same_v<Command, InsertCommand>) return "Insert";
+    if (std::is_same_v<Command, UpdateCommand>) return "Update";
+    return std::is_same_v<Command, SelectCommand> ? "Select" : "Delete";
+  }
+};
+
 // What all commands share.
 
 template <typename Command>
@@ -70,7 +80,7 @@ class AnyCommandTest : public SqliteCommandTest {
   }
 };
 using AllCommands = testing::Types<InsertCommand, UpdateCommand, SelectCommand, DeleteCommand>;
-TYPED_TEST_SUITE(AnyCommandTest, AllCommands);
+TYPED_TEST_SUITE(AnyCommandTest, AllCommands, ClassName);
 
 TYPED_TEST(AnyCommandTest, AFreshOneIsInvalidAndSaysSo) {
   const TypeParam command;
@@ -145,7 +155,7 @@ TYPED_TEST(AnyCommandTest, GetCommandAsksTheVirtualValidity) {
 template <typename Command>
 class FieldCommandTest : public SqliteCommandTest {};
 using FieldCommands = testing::Types<InsertCommand, UpdateCommand>;
-TYPED_TEST_SUITE(FieldCommandTest, FieldCommands);
+TYPED_TEST_SUITE(FieldCommandTest, FieldCommands, ClassName);
 
 TYPED_TEST(FieldCommandTest, FieldsWithoutATableAreInvalid) {
   TypeParam command;

@@ -30,6 +30,16 @@ class SqliteConditionTest : public CleanTest {
   }
 };
 
+// Puts the class into the names of the tests that run for several.
+struct ClassName {
+  template <typename Condition>
+  static std::string GetName(int /*index*/) {
+    if (std::is_same_v<Condition, SqliteEqual>) return "Equal";
+    if (std::is_same_v<Condition, SqliteNotEqual>) return "NotEqual";
+    return std::is_same_v<Condition, SqliteAnd> ? "And" : "Or";
+  }
+};
+
 void ExpectCondition(const SqliteCondition& condition, const std::string& text) {
   EXPECT_EQ(condition.GetText(), text);
   EXPECT_EQ(condition.IsValid(), !text.empty());
@@ -84,7 +94,7 @@ TEST_F(SqliteConditionTest, TheLeftSideIsWrittenAsGiven) {
 template <typename Comparison>
 class SqliteComparisonTest : public SqliteConditionTest {};
 using Comparisons = testing::Types<SqliteEqual, SqliteNotEqual>;
-TYPED_TEST_SUITE(SqliteComparisonTest, Comparisons);
+TYPED_TEST_SUITE(SqliteComparisonTest, Comparisons, ClassName);
 
 TYPED_TEST(SqliteComparisonTest, BadOperandsGiveAnEmptyCondition) {
   ExpectCondition(TypeParam("", "it's"), "");
@@ -148,7 +158,7 @@ class SqliteGroupTest : public SqliteConditionTest {
   }
 };
 using Groups = testing::Types<SqliteAnd, SqliteOr>;
-TYPED_TEST_SUITE(SqliteGroupTest, Groups);
+TYPED_TEST_SUITE(SqliteGroupTest, Groups, ClassName);
 
 TYPED_TEST(SqliteGroupTest, SettingAgainAppendsDirectlyBehind) {
   TypeParam condition("a=1", "b=2");

@@ -124,7 +124,7 @@ TEST_F(SelectCommandTest, ACountAloneStartsAtZero) {
 TEST_F(SelectCommandTest, ALimitOutOfRangeChangesNothing) {
   const int least = std::numeric_limits<int>::min();
   auto command = SelectOf({"id"});
-  const auto refuseAll = [&command, least] {
+  const auto refuseAll = [&command] {
     EXPECT_FALSE(command.SetLimit(0));
     EXPECT_FALSE(command.SetLimit(-1));
     EXPECT_FALSE(command.SetLimit(least));
@@ -190,6 +190,15 @@ TEST_F(SelectCommandTest, OnlyASelectLogsAValidConditionWithoutText) {
   ExpectLog({});
 }
 
+// Puts the class into the names of the tests that run for several.
+struct ClassName {
+  template <typename Command>
+  static std::string GetName(int /*index*/) {
+    if (std::is_same_v<Command, UpdateCommand>) return "Update";
+    return std::is_same_v<Command, SelectCommand> ? "Select" : "Delete";
+  }
+};
+
 // What update, select and delete share.
 
 template <typename Command>
@@ -202,7 +211,7 @@ class ConditionCommandTest : public SelectCommandTest {
   }
 };
 using ConditionCommands = testing::Types<UpdateCommand, SelectCommand, DeleteCommand>;
-TYPED_TEST_SUITE(ConditionCommandTest, ConditionCommands);
+TYPED_TEST_SUITE(ConditionCommandTest, ConditionCommands, ClassName);
 
 TYPED_TEST(ConditionCommandTest, TakesATextOrAConditionsText) {
   TypeParam command;
