@@ -7,6 +7,7 @@
 #   test      what the tests link and run
 #   examples  what the example programs link
 #   format    the formatter
+#   packages  what cpack needs for Debian packages
 #   lint      the static checkers
 #   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
 #   docs      the API documentation's generator
@@ -22,6 +23,7 @@ packages_of() {
     test) echo libgtest-dev libgmock-dev locales pkgconf valgrind lighttpd curl ;;
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
+    packages) echo abigail-tools dpkg-dev file ;;
     lint) echo clang-tidy shellcheck ;;
     i386) echo g++-multilib googletest ;;
     docs) echo doxygen graphviz ;;

@@ -99,6 +99,20 @@ constexpr const char* TypeName() {
   return std::is_integral_v<T> ? "int" : "string";
 }
 
+template <typename Value>
+bool SetField(std::map<std::string, SqliteValue>& values, const std::string& field,
+              Value&& fieldValue) {
+  if (field.empty() || !fieldValue.IsValid()) {
+    KELODR_LOG(ERR, "AddValue", "Bad Field[%s] or value [%s]", field.c_str(),
+               fieldValue.ToFormatedValue().c_str());
+    return false;
+  }
+  const auto [place, isNew] = values.try_emplace(field, std::forward<Value>(fieldValue));
+  // A failed try_emplace has not moved from its argument.
+  if (!isNew) place->second = std::forward<Value>(fieldValue);
+  return true;
+}
+
 }  // namespace
 
 SqliteValue::SqliteValue() : valid(false) {}
@@ -175,25 +189,12 @@ SqliteValueList& SqliteValueList::operator=(SqliteValueList&& other) noexcept {
   return *this;
 }
 
-template <typename Value>
-bool SqliteValueList::SetField(const std::string& field, Value&& fieldValue) {
-  if (field.empty() || !fieldValue.IsValid()) {
-    KELODR_LOG(ERR, "AddValue", "Bad Field[%s] or value [%s]", field.c_str(),
-               fieldValue.ToFormatedValue().c_str());
-    return false;
-  }
-  const auto [place, isNew] = values.try_emplace(field, std::forward<Value>(fieldValue));
-  // A failed try_emplace has not moved from its argument.
-  if (!isNew) place->second = std::forward<Value>(fieldValue);
-  return true;
-}
-
 bool SqliteValueList::AddValue(const std::string& field, const SqliteValue& fieldValue) {
-  return SetField(field, fieldValue);
+  return SetField(values, field, fieldValue);
 }
 
 bool SqliteValueList::AddValue(const std::string& field, SqliteValue&& fieldValue) {
-  return SetField(field, std::move(fieldValue));
+  return SetField(values, field, std::move(fieldValue));
 }
 
 SqliteValueList& SqliteValueList::operator+=(const SqliteValueList& other) {

@@ -10,6 +10,9 @@
 #include <vector>
 
 #include "kelodrcore/cache.h"
+#include "kelodrcore/file_lock.h"
+#include "kelodrcore/request.h"
+#include "kelodrcore/response.h"
 #include "kelodrcore/sqlite_command.h"
 #include "kelodrcore/sqlite_condition.h"
 #include "kelodrcore/sqlite_db.h"
@@ -61,6 +64,11 @@ FIELDS(DeleteCommand, &DeleteCommand::deleteAll, &DeleteCommand::condition);
 FIELDS(ErrRecorder, &ErrRecorder::errCode, &ErrRecorder::errMsg);
 FIELDS(SqliteDB, &SqliteDB::dbHandle, &SqliteDB::dbPath, &SqliteDB::retryLimit,
        &SqliteDB::logLabel);
+FIELDS(FileLock, &FileLock::fd, &FileLock::path);
+FIELDS(Request, &Request::version, &Request::timeout, &Request::api, &Request::method,
+       &Request::params, &Request::encryptRequired, &Request::uploadFile);
+FIELDS(UploadFileDescription, &UploadFileDescription::path, &UploadFileDescription::name);
+FIELDS(Response, &Response::nullValue, &Response::resp);
 FIELDS(Cache, &Cache::path, &Cache::timeout, &Cache::alwaysRequired, &Cache::retryLimit,
        &Cache::cachedData, &Cache::loadedMtime);
 
@@ -96,6 +104,10 @@ TEST(LayoutTest, FieldsStandInDeclaredOrder) {
   ExpectFieldsFrom<DeleteCommand>(sizeof(SqliteCommand));
   ExpectFieldsFrom<ErrRecorder>(kVirtuals);
   ExpectFieldsFrom<SqliteDB>(sizeof(ErrRecorder));
+  ExpectFieldsFrom<FileLock>(kNoVirtuals);
+  ExpectFieldsFrom<Request>(kVirtuals);
+  ExpectFieldsFrom<UploadFileDescription>(kNoVirtuals);
+  ExpectFieldsFrom<Response>(kVirtuals);
   ExpectFieldsFrom<Cache>(kVirtuals);
 }
 
@@ -139,6 +151,11 @@ size_t SlotsIn(const std::string& className) {
 TEST(LayoutTest, ValueListAndTableHandlerHaveOnlyADestructor) {
   EXPECT_EQ(SlotsIn("SqliteValueList"), 2U);
   EXPECT_EQ(SlotsIn("SqliteTableHandler"), 2U);
+}
+
+TEST(LayoutTest, RequestAndResponseHaveOnlyADestructor) {
+  EXPECT_EQ(SlotsIn("Request"), 2U);
+  EXPECT_EQ(SlotsIn("Response"), 2U);
 }
 
 TEST(LayoutTest, ARecordHasThreeSlotsAndNoDestructor) {

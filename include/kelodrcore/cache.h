@@ -116,12 +116,13 @@ class KELODR_EXPORT Cache {
   int Remove();
 
  private:
-  bool UpdateInBackground() const;
-  bool UpdateUnderClaim() const;
-  void WaitForUpdate() const;
-  bool SetUpdating() const;
-  void UnsetUpdating() const;
-  Json::Value MakeDocument(const Json::Value& data, long long begin, long long finish) const;
+  KELODR_LOCAL bool UpdateInBackground() const;
+  KELODR_LOCAL bool UpdateUnderClaim() const;
+  KELODR_LOCAL void WaitForUpdate() const;
+  KELODR_LOCAL bool SetUpdating() const;
+  KELODR_LOCAL void UnsetUpdating() const;
+  KELODR_LOCAL Json::Value MakeDocument(const Json::Value& data, long long begin,
+                                        long long finish) const;
 
   std::string path;
   long timeout;

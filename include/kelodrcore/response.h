@@ -139,7 +139,7 @@ class KELODR_EXPORT Response {
   const Json::Value& getField(const char* name) const;
 
  private:
-  const Json::Value& orNull(const Json::Value* member) const;
+  KELODR_LOCAL const Json::Value& orNull(const Json::Value* member) const;
 
   const Json::Value nullValue;
   Json::Value resp;

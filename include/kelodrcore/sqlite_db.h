@@ -161,19 +161,20 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// @}
 
  private:
-  void SetErr(int code) const;
+  KELODR_LOCAL void SetErr(int code) const;
 
   template <typename TakeRow>
-  bool Select(const std::string& sql, const TakeRow& takeRow);
-  bool SelectFirst(const std::string& sql, SqliteValueList& record, const char* function);
-  bool SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
-                 const char* function);
+  KELODR_LOCAL bool Select(const std::string& sql, const TakeRow& takeRow);
+  KELODR_LOCAL bool SelectFirst(const std::string& sql, SqliteValueList& record,
+                                const char* function);
+  KELODR_LOCAL bool SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
+                              const char* function);
 
   template <typename Attempt>
-  bool Retry(const Attempt& attempt, unsigned int& retries);
+  KELODR_LOCAL bool Retry(const Attempt& attempt, unsigned int& retries);
 
   template <typename Rows>
-  bool SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function);
+  KELODR_LOCAL bool SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function);
 
   sqlite3* dbHandle;
   std::string dbPath;

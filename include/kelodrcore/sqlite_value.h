@@ -142,9 +142,6 @@ class KELODR_EXPORT SqliteValueList {
   [[nodiscard]] std::string ToStr() const;
 
  private:
-  template <typename Value>
-  bool SetField(const std::string& field, Value&& fieldValue);
-
   SqliteValue nullValue;
   std::map<std::string, SqliteValue> values;
 };
