@@ -1,0 +1,102 @@
+#include "support/lock_test.h"
+
+#include <fcntl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <ctime>
+#include <filesystem>
+
+#include "kelodrcore/file_lock.h"
+
+namespace LockCalls {
+
+int flocks = 0;
+std::vector<useconds_t> sleeps;
+bool sleepAtOnce = false;
+std::function<void(int)> beforeFlock;
+
+void Forget() {
+  flocks = 0;
+  sleeps.clear();
+}
+
+}  // namespace LockCalls
+
+extern "C" int flock(int fd, int operation) noexcept {
+  ++LockCalls::flocks;
+  if (LockCalls::beforeFlock) LockCalls::beforeFlock(LockCalls::flocks);
+  return static_cast<int>(syscall(SYS_flock, fd, operation));
+}
+
+extern "C" int usleep(useconds_t microseconds) {
+  LockCalls::sleeps.push_back(microseconds);
+  if (LockCalls::sleepAtOnce) return 0;
+  const timespec time{0, static_cast<long>(microseconds) * 1000};
+  return nanosleep(&time, nullptr);
+}
+
+void LockTest::SetUp() {
+  CleanTest::SetUp();
+  const std::string lockDir = "/tmp/.kelodr_lock";
+  std::filesystem::create_directory(lockDir);
+  name = "test-" + dir.substr(dir.rfind('-') + 1);
+  path = lockDir + "/" + name;
+  LockCalls::Forget();
+}
+
+void LockTest::TearDown() {
+  LockCalls::beforeFlock = nullptr;
+  LockCalls::sleepAtOnce = false;
+  std::error_code error;
+  std::filesystem::remove_all(path, error);
+  CleanTest::TearDown();
+}
+
+bool LockTest::IsFree() const {
+  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  EXPECT_GE(fd, 0) << path;
+  const bool isFree = syscall(SYS_flock, fd, LOCK_EX | LOCK_NB) == 0;
+  close(fd);
+  return isFree;
+}
+
+int LockTest::DescriptorOf(const std::string& file) {
+  for (const int fd : OpenDescriptors()) {
+    std::error_code error;
+    const std::string link = "/proc/self/fd/" + std::to_string(fd);
+    if (std::filesystem::read_symlink(link, error) == file) return fd;
+  }
+  return -1;
+}
+
+bool LockTest::Hold(int type) const {
+  static KeloDRCore::FileLock lock;
+  return lock.setLockFile(name) && lock.lock(type, 0);
+}
+
+Holder::Holder(const std::function<bool()>& body) {
+  int ready[2];
+  EXPECT_EQ(pipe2(ready, O_CLOEXEC), 0);
+  fflush(nullptr);
+  pid = fork();
+  if (pid == 0) {
+    const char answer = body() ? 'y' : 'n';
+    if (write(ready[1], &answer, 1) != 1) _exit(1);
+    while (true) pause();
+  }
+  close(ready[1]);
+  char answer = 0;
+  EXPECT_EQ(read(ready[0], &answer, 1), 1);
+  EXPECT_EQ(answer, 'y') << "the child could not do its part";
+  close(ready[0]);
+}
+
+void Holder::Kill() {
+  if (pid <= 0) return;
+  kill(pid, SIGKILL);
+  waitpid(pid, nullptr, 0);
+  pid = -1;
+}

@@ -1,0 +1,65 @@
+// What the tests of the file lock share: counted calls, a fixture with a lock of its own, and
+// processes that hold a lock.
+
+#ifndef KELODRCORE_TESTS_SUPPORT_LOCK_TEST_H_
+#define KELODRCORE_TESTS_SUPPORT_LOCK_TEST_H_
+
+#include <sys/file.h>
+#include <sys/types.h>
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "support/clean_test.h"
+
+// This program's own flock and usleep stand before the C library's, for the shared library as well:
+// they count, let a test act at the worst moment, and go on to the kernel.
+namespace LockCalls {
+
+extern int flocks;                      // calls so far
+extern std::vector<useconds_t> sleeps;  // their microseconds
+extern bool sleepAtOnce;                // usleep returns without sleeping
+// Runs before each flock, with its number (from 1).
+extern std::function<void(int)> beforeFlock;
+
+// Forgets the calls so far.
+void Forget();
+
+}  // namespace LockCalls
+
+// Each test has a lock name of its own.
+class LockTest : public CleanTest {
+ protected:
+  void SetUp() override;
+  void TearDown() override;
+
+  // Whether the lock at the path is free for a newcomer.
+  bool IsFree() const;
+
+  // The descriptor that this process has open on the file named `file`, or -1.
+  static int DescriptorOf(const std::string& file);
+
+  // For a Holder: takes a lock that ends with the process.
+  bool Hold(int type) const;
+
+  std::string name;
+  std::string path;
+};
+
+// A child that runs `body`, which tells whether it could do its part, and then lives until it is
+// killed.
+class Holder {
+ public:
+  explicit Holder(const std::function<bool()>& body);
+  ~Holder() { Kill(); }
+  Holder(const Holder&) = delete;
+  Holder& operator=(const Holder&) = delete;
+
+  void Kill();
+
+ private:
+  pid_t pid;
+};
+
+#endif  // KELODRCORE_TESTS_SUPPORT_LOCK_TEST_H_
