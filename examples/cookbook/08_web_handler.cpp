@@ -1,0 +1,63 @@
+#include <kelodrcore/err.h>
+#include <kelodrcore/json_value.h>
+#include <kelodrcore/request.h>
+#include <kelodrcore/sqlite_db.h>
+
+#include <iostream>
+
+using namespace KeloDRCore;
+
+const SqliteTableHandler kNodes("node", "name TEXT PRIMARY KEY");
+
+Json::Value Succeed(const Json::Value& data) {
+  Json::Value reply;
+  reply["success"] = true;
+  reply["data"] = data;
+  return reply;
+}
+
+Json::Value Fail(int code, const Json::Value& errors) {
+  Json::Value reply;
+  reply["success"] = false;
+  reply["error"]["code"] = code;
+  reply["error"]["errors"] = errors;
+  return reply;
+}
+
+Json::Value CreateNode(SqliteDB& db, const Json::Value& params) {
+  const Json::Value& name = params["name"];
+  if (!name.isString()) return Fail(ERR::BAD_PARAMETER, "name is missing");
+  InsertCommand insert;
+  insert.SetTable(kNodes);
+  insert.AddFieldValue("name", name.asString());
+  if (!db.InsertRecord(insert)) return Fail(ERR::ERR_NODE_CREATE, db.GetErr());
+  return Succeed(params);
+}
+
+Json::Value CountNodes(SqliteDB& db) {
+  Json::Value data;
+  int count = 0;
+  if (!db.CreateTable(kNodes) || !db.GetCount(kNodes, count)) {
+    return Fail(ERR::ERR_NODE_LIST, db.GetErr());
+  }
+  data["count"] = count;
+  return Succeed(data);
+}
+
+Json::Value Answer(SqliteDB& db, const std::string& text) {
+  Json::Value call;
+  if (!JsonValue::fromString(call, text)) return Fail(ERR::BAD_PARAMETER, "not a JSON document");
+  const Request request(call);
+  if (!request.isValid()) return Fail(ERR::BAD_PARAMETER, "api, method and version are needed");
+  if (request.toStr() == "Node/create/1") return CreateNode(db, request.getParams());
+  if (request.toStr() == "Node/count/1") return CountNodes(db);
+  return Fail(ERR::ERR_NO_SUCH_API, request.toStr());
+}
+
+// Answers one call a line.
+int main() {
+  SqliteDB db("nodes.db", 3, "cookbook");
+  for (std::string line; std::getline(std::cin, line);) {
+    std::cout << JsonValue::toString(Answer(db, line)) << '\n';
+  }
+}
