@@ -94,12 +94,12 @@ class KELODR_EXPORT Cache {
   /// fetches. False when the fetch or the write failed for good.
   bool DoUpdate() const;
 
-  /// @name Writes valid data to the file, and takes it as the document in memory.
+  /// @{
+  /// Writes valid data to the file, and takes it as the document in memory.
   /// `begin` and `finish` are the seconds since the epoch at which the fetch began and ended; when
   /// one of them is below 1, or without them, both are written as unknown. Sleeps 300 to 1000 ms
   /// between two tries. False for data that is not valid, or when the file could not be written;
   /// the old file and the document in memory are then as they were.
-  /// @{
   bool UpdateWithData(const Json::Value& data, long long begin, long long finish) const;
   bool UpdateWithData(const Json::Value& data) const;
   /// @}

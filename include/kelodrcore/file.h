@@ -52,6 +52,7 @@ KELODR_EXPORT bool Write(int fd, const Json::Value& value);
 /// Makes sure that `path` is a directory, with all its parents, as root: it runs
 /// "/bin/mkdir -p PATH -m MODE" with the effective ids raised to 0 and restores them afterwards.
 /// The effective ids are those of the whole process, so threads must take turns.
+/// @param path the directory; it may be relative.
 /// @param mode permission bits of a directory that is created, at most 0777; the umask does not
 ///     apply to them. One that is there already keeps its own. Parents get those of the umask.
 /// @return true also when the directory is there already, whatever `mode` is; false for an empty

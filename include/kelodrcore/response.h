@@ -40,9 +40,11 @@ class KELODR_EXPORT Response {
   /// A null document.
   Response();
 
+  /// @{
   /// A copy of the other's document.
   Response(const Response& other);
   Response& operator=(const Response& other);
+  /// @}
 
   /// The document that `text` holds; a null one when it does not parse, which a null pointer never
   /// does. Implicit: a reply goes wherever a Response does. Use setResp() to learn whether it
