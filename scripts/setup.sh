@@ -24,7 +24,7 @@ packages_of() {
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
     packages) echo abigail-tools dpkg-dev file ;;
-    lint) echo clang-tidy shellcheck ;;
+    lint) echo clang clang-tidy shellcheck ;;
     i386) echo g++-multilib googletest ;;
     docs) echo doxygen graphviz ;;
     bench) echo libbenchmark-dev ;;

@@ -1,0 +1,17 @@
+#!/bin/bash
+# The static checks: clang-tidy over the library and the platform layer, a build with clang's own
+# warnings as errors, shellcheck over the scripts.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+scripts/setup.sh build examples lint
+mapfile -t scripts < <(git ls-files '*.sh' .ci/run)
+shellcheck "${scripts[@]}"
+
+cmake -S . -B build/lint -G Ninja -DCMAKE_CXX_COMPILER=clang++ -DCMAKE_BUILD_TYPE=Release \
+  -DCMAKE_EXPORT_COMPILE_COMMANDS=ON -DKELODR_WERROR=ON -DKELODR_BUILD_EXAMPLES=ON
+cmake --build build/lint
+mapfile -t sources < <(git ls-files 'src/*.cpp' 'platform/*.cpp')
+printf '%s\n' "${sources[@]}" |
+  xargs --max-args=4 --max-procs="$(nproc)" clang-tidy -p build/lint --quiet 2>/dev/null
+echo "lint.sh: nothing to complain about"
