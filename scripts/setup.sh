@@ -8,6 +8,7 @@
 #   examples  what the example programs link
 #   format    the formatter
 #   packages  what cpack needs for Debian packages
+#   scripts   the checker of shell scripts
 #   lint      the static checkers
 #   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
 #   docs      the API documentation's generator
@@ -24,7 +25,8 @@ packages_of() {
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
     packages) echo abigail-tools dpkg-dev file ;;
-    lint) echo clang clang-tidy shellcheck ;;
+    scripts) echo shellcheck ;;
+    lint) echo clang clang-tidy ;;
     i386) echo g++-multilib googletest ;;
     docs) echo doxygen graphviz ;;
     bench) echo libbenchmark-dev ;;

@@ -5,6 +5,7 @@ cd "$(dirname "$0")/../.."
 result=0
 
 for document in *.md docs/*.md; do
+  # shellcheck disable=SC2016  # the backticks are Markdown's
   while IFS= read -r target; do
     [ -e "$(dirname "$document")/$target" ] && continue
     echo "$document: there is no $target"
