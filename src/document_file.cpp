@@ -28,6 +28,8 @@
 #include <optional>
 #include <utility>
 
+#include "retry.h"
+
 namespace KeloDRCore {
 namespace {
 
@@ -37,14 +39,6 @@ constexpr useconds_t kPause = 1000;          // microseconds
 constexpr size_t kMaxNameInTemporary = 100;  // some file systems allow 143 bytes a name
 constexpr size_t kSmallestRead = 4096;
 constexpr mode_t kPermissionBits = 07777;
-
-// The one rule for calls that a signal interrupts: they are made again.
-template <typename Call>
-auto Retry(Call call) {
-  auto result = call();
-  while (result == -1 && errno == EINTR) result = call();
-  return result;
-}
 
 bool Fail(int error) {
   errno = error;

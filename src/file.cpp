@@ -19,6 +19,7 @@
 #include "kelodrcore/json_value.h"
 #include "log.h"
 #include "privilege.h"
+#include "retry.h"
 
 namespace KeloDRCore::File {
 namespace {
@@ -32,12 +33,27 @@ using Stream = std::unique_ptr<FILE, StreamCloser>;
 class InputFile {
  public:
   explicit InputFile(const std::string& path)
-      : buffer(open(path.c_str(), O_RDONLY | O_CLOEXEC), std::ios::in), lines(&buffer) {}
+      : fd(Retry([&] { return open(path.c_str(), O_RDONLY | O_CLOEXEC); })),
+        buffer(fd, std::ios::in),
+        lines(&buffer) {
+    // A buffer without a stream (no memory for one) does not own the descriptor.
+    if (fd >= 0 && !buffer.is_open()) close(fd);
+  }
 
   bool IsOpen() const { return buffer.is_open(); }
-  bool NextLine(std::string& line) { return static_cast<bool>(std::getline(lines, line)); }
+  bool NextLine(std::string& line) {
+    errno = 0;
+    if (std::getline(lines, line)) return true;
+    // A directory opens like a file and counts as an empty one.
+    isCut = lines.bad() && errno != EISDIR;
+    return false;
+  }
+  // Whether the lines ended before the file did.
+  bool IsCut() const { return isCut; }
 
  private:
+  int fd;
+  bool isCut = false;
   __gnu_cxx::stdio_filebuf<char> buffer;
   std::istream lines;
 };
@@ -68,7 +84,7 @@ WriteResult WriteAndSync(FILE* stream, int fd, const Json::Value& value) {
     return WriteResult::kWriteFailed;
   }
   if (fflush(stream) != 0) return WriteResult::kFlushFailed;
-  return fsync(fd) == 0 ? WriteResult::kDone : WriteResult::kSyncFailed;
+  return Retry([&] { return fsync(fd); }) == 0 ? WriteResult::kDone : WriteResult::kSyncFailed;
 }
 
 }  // namespace
@@ -89,7 +105,8 @@ bool Read(const std::string& path, Json::Value& value) {
   }
   std::string content;
   for (std::string line; file.NextLine(line);) content += line;
-  return JsonValue::fromString(value, content);
+  // The start of a document can be a document itself, "12" of "123".
+  return !file.IsCut() && JsonValue::fromString(value, content);
 }
 
 bool Read(int fd, Json::Value& value) {
@@ -101,7 +118,7 @@ bool Read(int fd, Json::Value& value) {
   std::string content;
   char chunk[1024];
   while (ReadChunk(stream.get(), chunk)) content += chunk;
-  return JsonValue::fromString(value, content);
+  return ferror(stream.get()) == 0 && JsonValue::fromString(value, content);
 }
 
 bool Write(const std::string& path, const Json::Value& value) {
@@ -109,7 +126,7 @@ bool Write(const std::string& path, const Json::Value& value) {
     KELODR_LOG(ERR, __func__, "%s", "Empty path to write.");
     return false;
   }
-  const Stream stream(fopen(path.c_str(), "we"));
+  const Stream stream(Retry([&] { return fopen(path.c_str(), "we"); }));
   if (!stream) {
     KELODR_LOG(ERR, __func__, "Failed to open file [%s]", path.c_str());
     return false;
@@ -282,6 +299,10 @@ int Read(const std::string& path, std::map<K, V>& map) {
       KELODR_LOG(NOTICE, __func__, "Failed to parse line[%s] from file [%s]", line.c_str(),
                  path.c_str());
     }
+  }
+  if (file.IsCut()) {
+    KELODR_LOG(WARN, __func__, "File[%s] is not opened.", path.c_str());
+    return -1;
   }
   map = std::move(entries);
   return static_cast<int>(map.size());

@@ -10,6 +10,7 @@
 #include "kelodrcore/file.h"
 #include "log.h"
 #include "privilege.h"
+#include "retry.h"
 
 namespace KeloDRCore {
 namespace {
@@ -89,7 +90,9 @@ bool FileLock::openLockedFile() {
   if (File::IsRegularFile(fd) && IsFileAt(path, fd)) return true;
 
   if (fd >= 0) close(fd);
-  fd = open(path.c_str(), O_RDONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, kLockFileMode);
+  fd = Retry([&] {
+    return open(path.c_str(), O_RDONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, kLockFileMode);
+  });
   if (fd < 0) {
     KELODR_LOG(ERR, __func__, "Failed to open lock file[%s], errno=%m", path.c_str());
     return false;
