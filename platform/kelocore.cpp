@@ -144,11 +144,19 @@ int Spawn(const char* program, char* const argv[], pid_t* pid) {
   return error;
 }
 
-// Leaves the standard streams and, above them, only the report.
-void ArrangeDescriptors(const Redirection* redirection, int report) {
-  if (redirection != nullptr) dup2(redirection->fd, redirection->target);
-  if (report != kFirstFreeDescriptor) dup3(report, kFirstFreeDescriptor, O_CLOEXEC);
+// Leaves the standard streams and, above them, only the report. After a failure nothing may be put
+// on the numbers meant: they are still files of the caller's.
+bool ArrangeDescriptors(const Redirection* redirection, int report) {
+  if (redirection != nullptr &&
+      Retry([&] { return dup2(redirection->fd, redirection->target); }) < 0) {
+    return false;
+  }
+  if (report != kFirstFreeDescriptor &&
+      Retry([&] { return dup3(report, kFirstFreeDescriptor, O_CLOEXEC); }) < 0) {
+    return false;
+  }
   closefrom(kFirstFreeDescriptor + 1);
+  return true;
 }
 
 // The supervisor's whole life, with every signal blocked. It lets go of the standard streams once
@@ -156,7 +164,10 @@ void ArrangeDescriptors(const Redirection* redirection, int report) {
 [[noreturn]] void Supervise(const char* program, char* const argv[], const Redirection* redirection,
                             int report) {
   signal(SIGCHLD, SIG_DFL);
-  ArrangeDescriptors(redirection, report);
+  if (!ArrangeDescriptors(redirection, report)) {
+    Send(report, errno);
+    _exit(0);
+  }
   pid_t pid = -1;
   const int error = Spawn(program, argv, &pid);
   Send(kFirstFreeDescriptor, error);
@@ -457,7 +468,9 @@ int KLIBCProcForkEx(int flags) {
   const pid_t pid = (flags & kForkDetached) != 0 ? ForkDetached() : fork();
   if (pid != 0 || (flags & kForkSession) == 0) return pid;
   setsid();
-  for (int fd = 0; fd < kFirstFreeDescriptor; ++fd) dup2(null.Get(), fd);
+  for (int fd = 0; fd < kFirstFreeDescriptor; ++fd) {
+    Retry([&] { return dup2(null.Get(), fd); });
+  }
   return 0;
 }
 
