@@ -20,6 +20,12 @@ namespace {
 std::mutex mutex;
 std::vector<LogLine> lines;
 std::string mirrorPath;
+thread_local bool recording = false;
+
+struct RecordingScope {
+  RecordingScope() { recording = true; }
+  ~RecordingScope() { recording = false; }
+};
 
 LogLine Parse(int priority, const std::string& text, const std::string& pid) {
   static const std::regex common(R"(^([^:\s]+):[1-9]\d*\((\w*|~\w+)\)\[(\w+)\]\[(\d+)\]: )");
@@ -49,6 +55,7 @@ void Mirror(int priority, const std::string& text) {
 
 void Record(int priority, const char* format, va_list arguments) {
   const int savedErrno = errno;
+  const RecordingScope scope;
   char* text = nullptr;
   errno = savedErrno;  // for "%m"
   if (vasprintf(&text, format, arguments) < 0) abort();
@@ -126,6 +133,8 @@ std::vector<LogLine> Take() {
 }
 
 void Clear() { Take(); }
+
+bool IsRecording() { return recording; }
 
 void MirrorTo(const std::string& path) {
   const std::lock_guard<std::mutex> guard(mutex);

@@ -40,6 +40,9 @@ std::vector<LogLine> Take();
 
 void Clear();
 
+// Whether this thread is inside the capture: what it calls there is not the library's doing.
+bool IsRecording();
+
 // Also appends every line that this process and its children send to `path`, each as one write, for
 // tests that look at other processes; an empty path stops it.
 void MirrorTo(const std::string& path);

@@ -1,0 +1,111 @@
+// Holds the fault injector against what the library really calls.
+
+#include <dlfcn.h>
+
+#include <cstdio>
+#include <set>
+#include <sstream>
+#include <string>
+
+#include "kelodrcore/file.h"
+#include "support/fault.h"
+
+namespace {
+
+// Calls that cannot fail, or not in a way that a caller could do anything about.
+const std::set<std::string> kHarmless = {
+    // Memory and text.
+    "free", "memchr", "memcmp", "memcpy", "memmove", "memset", "snprintf", "strchr", "strcmp",
+    "strerror", "strerror_r", "strlen", "strrchr", "strspn", "strtod_l", "__isoc99_sscanf",
+    "__snprintf_chk", "__memcpy_chk", "__memmove_chk",
+    // Numbers.
+    "fmod", "trunc", "difftime", "__difftime64", "__udivdi3", "__umoddi3", "__divdi3", "__moddi3",
+    // The process itself.
+    "_exit", "abort", "closefrom", "environ", "__environ", "getegid", "geteuid", "getpid", "kill",
+    "pthread_mutex_lock", "pthread_mutex_unlock", "pthread_sigmask", "setsid", "sigemptyset",
+    "sigfillset", "signal", "posix_spawnattr_destroy", "posix_spawnattr_setflags",
+    "posix_spawnattr_setsigdefault", "posix_spawnattr_setsigmask", "__errno_location",
+    "__stack_chk_fail", "__tls_get_addr", "___tls_get_addr",
+    // Streams that are there already.
+    "clearerr", "ferror", "fileno"};
+
+bool StartsWith(const std::string& text, const std::string& start) {
+  return text.compare(0, start.size(), start) == 0;
+}
+
+// Of other libraries, or of the compiler.
+bool IsForeign(const std::string& symbol) {
+  for (const char* const start : {"_Z", "_ITM_", "_Unwind_", "__cxa_", "__gmon_start__", "__gxx_",
+                                  "__asan_", "__ubsan_", "__sanitizer_", "KLIBC", "sqlite3_"}) {
+    if (StartsWith(symbol, start)) return true;
+  }
+  return false;
+}
+
+void* const thisProgram = [] {
+  Dl_info info = {};
+  dladdr(reinterpret_cast<void*>(&StartsWith), &info);
+  return info.dli_fbase;
+}();
+
+// Whether a library that calls `symbol` reaches this program.
+bool IsInterposed(const std::string& symbol) {
+  Dl_info info = {};
+  void* const found = dlsym(RTLD_DEFAULT, symbol.c_str());
+  return found != nullptr && dladdr(found, &info) != 0 && info.dli_fbase == thisProgram;
+}
+
+std::set<std::string> ImportsOfTheLibrary() {
+  Dl_info info = {};
+  dladdr(reinterpret_cast<void*>(&KeloDRCore::File::IsRegularFile), &info);
+  const std::string command =
+      std::string(KELODR_NM) + " -D --undefined-only '" + info.dli_fname + "'";
+  FILE* const output = popen(command.c_str(), "r");
+  std::set<std::string> imports;
+  char line[1024];
+  while (fgets(line, sizeof line, output) != nullptr) {
+    std::string mark;
+    std::string symbol;
+    std::istringstream(line) >> mark >> symbol;
+    imports.insert(symbol.substr(0, symbol.find('@')));
+  }
+  EXPECT_EQ(pclose(output), 0);
+  return imports;
+}
+
+using FaultCallsTest = FaultTest;
+
+}  // namespace
+
+TEST_F(FaultCallsTest, EveryCallThatTheLibraryMakesCanBeFailed) {
+  const std::set<std::string> imports = ImportsOfTheLibrary();
+  EXPECT_EQ(imports.count("syslog") + imports.count("__syslog_chk"), 1U);
+  for (const std::string& symbol : imports) {
+    if (IsForeign(symbol) || kHarmless.count(symbol) > 0) continue;
+    EXPECT_TRUE(IsInterposed(symbol)) << symbol;
+  }
+}
+
+TEST_F(FaultCallsTest, CallsFailFromTheOneNamedForAsManyAsNamed) {
+  Fault::Arm({EIO, 2, 2});
+  EXPECT_NE(access("/", F_OK), -1);
+  EXPECT_EQ(access("/", F_OK), -1);
+  EXPECT_EQ(errno, EIO);
+  EXPECT_EQ(access("/", F_OK), -1);
+  EXPECT_NE(access("/", F_OK), -1);
+  EXPECT_EQ(Fault::Disarm(), 2);
+  EXPECT_EQ(Fault::FailedCalls(), (std::vector<std::string>{"access", "access"}));
+}
+
+TEST_F(FaultCallsTest, OnlyCallsThatCanFailWithTheErrorCount) {
+  Fault::Arm({ENOSPC, 1, 1});
+  EXPECT_NE(access("/", F_OK), -1);
+  EXPECT_EQ(Fault::Disarm(), 0);
+}
+
+TEST_F(FaultCallsTest, CallsOfAForkedChildCountToo) {
+  Fault::Arm({EACCES, 2, 1});
+  EXPECT_EQ(RunInChild([] { EXPECT_NE(access("/", F_OK), -1); }), 0);
+  EXPECT_EQ(access("/", F_OK), -1);
+  EXPECT_EQ(Fault::Disarm(), 1);
+}

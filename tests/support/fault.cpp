@@ -1,0 +1,166 @@
+#include "support/fault.h"
+
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <atomic>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <iostream>
+#include <new>
+
+namespace {
+
+// Shared with forked children, so that their calls are part of one count.
+struct State {
+  std::atomic<bool> armed;
+  Fault::Plan plan;
+  std::atomic<int> calls;
+  std::atomic<int> failures;
+  std::array<const char*, 16> failed;  // literals, at the same place in a forked child
+};
+
+State* state = nullptr;
+thread_local int suspensions = 0;
+
+State* NewState() {
+  void* const memory =
+      mmap(nullptr, sizeof(State), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+  if (memory == MAP_FAILED) abort();
+  return new (memory) State{};
+}
+
+// A signal that never stops coming is no fault of the system's; this many in a row is bad enough.
+constexpr int kSignalsInARow = 10;
+
+void RunCaught(const Fault::Operation& operation, Fault::Outcome& outcome) {
+  try {
+    outcome.succeeded = operation.run();
+  } catch (const std::bad_alloc&) {
+    outcome.threw = true;
+  }
+}
+
+void ExpectNothingLeft(const std::set<int>& descriptors, uid_t uid, gid_t gid) {
+  EXPECT_EQ(OpenDescriptors(), descriptors) << "descriptors left open or closed";
+  EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1) << "a child was left behind";
+  EXPECT_EQ(geteuid(), uid) << "effective uid not restored";
+  EXPECT_EQ(getegid(), gid) << "effective gid not restored";
+}
+
+}  // namespace
+
+namespace Fault {
+
+void Arm(const Plan& plan) {
+  if (state == nullptr) state = NewState();
+  state->plan = plan;
+  state->calls = 0;
+  state->failures = 0;
+  state->armed = true;
+}
+
+int Disarm() {
+  state->armed = false;
+  return state->failures;
+}
+
+std::vector<std::string> FailedCalls() {
+  const size_t count = std::min(static_cast<size_t>(state->failures), state->failed.size());
+  return {state->failed.begin(), state->failed.begin() + static_cast<std::ptrdiff_t>(count)};
+}
+
+bool Outcome::Failed(const std::string& call) const {
+  return std::find(failed.begin(), failed.end(), call) != failed.end();
+}
+
+bool Hits(const char* call, std::initializer_list<int> errors) {
+  if (state == nullptr || !state->armed || suspensions > 0 || LogCapture::IsRecording()) {
+    return false;
+  }
+  const Plan& plan = state->plan;
+  if (std::find(errors.begin(), errors.end(), plan.error) == errors.end()) return false;
+  const int number = ++state->calls;
+  if (number < plan.first || number - plan.first >= plan.times) return false;
+  const auto failure = static_cast<size_t>(state->failures++);
+  if (failure < state->failed.size()) state->failed[failure] = call;
+  errno = plan.error == kNoMemory ? ENOMEM : plan.error;
+  return true;
+}
+
+bool Outcome::FailedForGood(const std::string& call) const {
+  return error != EINTR && Failed(call);
+}
+
+Suspension::Suspension() { ++suspensions; }
+Suspension::~Suspension() { --suspensions; }
+
+}  // namespace Fault
+
+void FaultTest::SetUp() {
+  CleanTest::SetUp();
+  bystander = memfd_create("bystander", MFD_CLOEXEC);
+}
+
+void FaultTest::TearDown() {
+  close(bystander);
+  std::cout << "[  faults  ] " << runs << " runs, " << failures << " failed calls\n";
+  CleanTest::TearDown();
+}
+
+void FaultTest::SweepCalls(const Fault::Operation& operation) {
+  for (const int error : {EINTR, EIO, ENOSPC, EMFILE, EACCES, EAGAIN, ENOMEM}) {
+    Sweep(operation, error, Fault::kOnce);
+    Sweep(operation, error, error == EINTR ? kSignalsInARow : forGood);
+  }
+}
+
+void FaultTest::SweepMemory(const Fault::Operation& operation) {
+  Sweep(operation, Fault::kNoMemory, Fault::kOnce);
+  Sweep(operation, Fault::kNoMemory, forGood);
+}
+
+void FaultTest::Sweep(const Fault::Operation& operation, int error, int times) {
+  for (int first = 1;; ++first) {
+    if (!RunFailing(operation, {error, first, times}) || HasFailure()) return;
+    RunUnfailed(operation);
+  }
+}
+
+// False when no call was left to fail.
+bool FaultTest::RunFailing(const Fault::Operation& operation, const Fault::Plan& plan) {
+  operation.prepare();
+  LogCapture::Clear();
+  const std::set<int> descriptors = OpenDescriptors();
+  const uid_t uid = geteuid();
+  const gid_t gid = getegid();
+  Fault::Outcome outcome{false, false, plan.error, {}, {}};
+  Fault::Arm(plan);
+  RunCaught(operation, outcome);
+  const int failed = Fault::Disarm();
+  outcome.failed = Fault::FailedCalls();
+  outcome.log = LogCapture::Take();
+  const std::string error = plan.error == Fault::kNoMemory ? "no memory" : strerror(plan.error);
+  SCOPED_TRACE("call " + std::to_string(plan.first) + " fails: " + error + ", " +
+               std::to_string(failed) + " failures: " + testing::PrintToString(outcome.failed));
+  ExpectNothingLeft(descriptors, uid, gid);
+  EXPECT_EQ(lseek(bystander, 0, SEEK_END), 0) << "written to a file of the caller's";
+  EXPECT_TRUE(!outcome.threw || plan.error == Fault::kNoMemory) << "an exception came out";
+  operation.check(outcome);
+  ++runs;
+  failures += failed;
+  return failed > 0;
+}
+
+void FaultTest::RunUnfailed(const Fault::Operation& operation) {
+  SCOPED_TRACE("the next call");
+  Fault::Outcome outcome{false, false, 0, {}, {}};
+  RunCaught(operation, outcome);
+  outcome.log = LogCapture::Take();
+  EXPECT_TRUE(outcome.succeeded);
+  operation.check(outcome);
+}

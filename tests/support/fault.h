@@ -1,0 +1,100 @@
+// Fails the calls that the library makes to the system, one after the other.
+//
+// This test binary's own definitions stand before those of the C library, for the library under
+// test and for the libraries that it uses alike (fault_calls.cpp). They pass every call on, but for
+// the one that is to fail. Only programs that are meant to sweep link them.
+
+#ifndef KELODRCORE_TESTS_SUPPORT_FAULT_H_
+#define KELODRCORE_TESTS_SUPPORT_FAULT_H_
+
+#include <climits>
+#include <functional>
+#include <initializer_list>
+#include <string>
+#include <vector>
+
+#include "support/clean_test.h"
+
+namespace Fault {
+
+// Stands in place of an errno: what fails is memory that operator new, malloc or SQLite asks for.
+constexpr int kNoMemory = -1;
+
+constexpr int kOnce = 1;
+constexpr int kForGood = INT_MAX;
+
+struct Plan {
+  int error;  // only calls that can fail with it count
+  int first;  // the number of the first call to fail, from 1
+  int times;  // how many calls fail in a row
+};
+
+// From now on counts the calls that can fail with `plan.error` and fails those that the plan names.
+// The calls of children forked later count too, until Disarm().
+void Arm(const Plan& plan);
+
+// The number of calls that failed.
+int Disarm();
+
+// The names of the calls that failed since Arm(), in order; of very many, the first.
+std::vector<std::string> FailedCalls();
+
+// Whether this call, one that can fail with `errors`, is to fail; errno is set then.
+bool Hits(const char* call, std::initializer_list<int> errors);
+
+// Calls made while it lives neither count nor fail.
+class Suspension {
+ public:
+  Suspension();
+  ~Suspension();
+  Suspension(const Suspension&) = delete;
+  Suspension& operator=(const Suspension&) = delete;
+};
+
+// What a run came to.
+struct Outcome {
+  bool succeeded;
+  bool threw;                       // std::bad_alloc came out
+  int error;                        // the error of the plan, 0 when nothing was to fail
+  std::vector<std::string> failed;  // the calls that failed, in order
+  std::vector<LogLine> log;         // everything logged
+
+  bool Failed(const std::string& call) const;
+  // Failed, and not just because of a signal, after which most calls are made again.
+  bool FailedForGood(const std::string& call) const;
+};
+
+struct Operation {
+  std::function<void()> prepare;  // makes the state in which the operation begins
+  std::function<bool()> run;      // the operation; only its calls fail
+  std::function<void(const Outcome&)> check;
+};
+
+}  // namespace Fault
+
+// Runs an operation with call 1 failing, then call 2, until no call is left to fail; once and for
+// good; with each errno. After each run nothing may be left open, running or raised, the
+// operation's own check must hold, and the next run, in which nothing fails, must succeed.
+class FaultTest : public CleanTest {
+ protected:
+  void SetUp() override;
+  void TearDown() override;
+
+  void SweepCalls(const Fault::Operation& operation);
+  void SweepMemory(const Fault::Operation& operation);
+
+  // How many calls fail "for good"; less where the operation waits until they no longer do.
+  int forGood = Fault::kForGood;
+
+ private:
+  void Sweep(const Fault::Operation& operation, int error, int times);
+  bool RunFailing(const Fault::Operation& operation, const Fault::Plan& plan);
+  void RunUnfailed(const Fault::Operation& operation);
+
+  // An empty file that the test's process happens to have open; nobody may write to it.
+  int bystander = -1;
+  int runs = 0;
+  int failures = 0;
+};
+
+#endif  // KELODRCORE_TESTS_SUPPORT_FAULT_H_
