@@ -1,5 +1,5 @@
 #!/bin/bash
-# Every file of the tree that a document links to is there.
+# Every file of the tree that a document links to is there, and so is every script that it names.
 set -euo pipefail
 cd "$(dirname "$0")/../.."
 result=0
@@ -13,4 +13,9 @@ for document in *.md docs/*.md; do
   done < <(sed -n '/^```/,/^```/!p' "$document" | grep --only-matching '\](\([^)#]*\)' | sed 's/^](//' |
     grep --invert-match --extended-regexp '^(https?:|$)')
 done
+while IFS=: read -r document script; do
+  [ -x "$script" ] && continue
+  echo "$document: there is no $script"
+  result=1
+done < <(grep --only-matching 'scripts/[a-z0-9-]*\.sh' ./*.md docs/*.md)
 exit $result
