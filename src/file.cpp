@@ -6,12 +6,14 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <cstdio>
 #include <ext/stdio_filebuf.h>
 #include <istream>
 #include <limits>
 #include <locale>
 #include <memory>
+#include <string_view>
 #include <type_traits>
 #include <utility>
 
@@ -199,52 +201,66 @@ bool IsRegularFile(int fd) {
 namespace {
 
 constexpr char kSeparator[] = "=";
-constexpr char kWhiteSpace[] = " \t\n\v\f\r";  // of the classic locale
 
-// What a formatted extraction does with a number, without a stream a number: the standard facet
-// reads straight from the text.
+// White space of the classic locale.
+bool IsSpace(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
+
+bool IsDigit(char c) { return c >= '0' && c <= '9'; }
+
+std::string_view SkipSpace(std::string_view text) {
+  const auto* const begin = std::find_if_not(text.begin(), text.end(), IsSpace);
+  return text.substr(static_cast<size_t>(begin - text.begin()));
+}
+
+// What `stream >> out` does with a text that is not empty, without a stream a text.
+void Extract(std::string_view text, std::string& out) {
+  const std::string_view rest = SkipSpace(text);
+  if (!rest.empty()) out.assign(rest.begin(), std::find_if(rest.begin(), rest.end(), IsSpace));
+}
+
+// The same for numbers, by the standard facet reading straight from the text.
 class NumberReader : private std::num_get<char, const char*> {
  public:
   NumberReader() : format(nullptr) { format.imbue(std::locale::classic()); }
 
-  void Extract(const std::string& text, double& out) const { Get(text, out); }
-
-  void Extract(const std::string& text, int& out) const {
+  void Extract(std::string_view text, int& out) {
     long wide = 0;
-    Get(text, wide);
+    Get(SkipSpace(text), wide);
     constexpr long kMin = std::numeric_limits<int>::min();
     constexpr long kMax = std::numeric_limits<int>::max();
     out = static_cast<int>(std::clamp(wide, kMin, kMax));
   }
 
+  void Extract(std::string_view text, double& out) {
+    const std::string_view rest = SkipSpace(text);
+    // A plain number is one to both and read faster; the facet knows what the rest means.
+    const char* const end = rest.data() + rest.size();
+    const auto [stop, error] = std::from_chars(rest.data(), end, out);
+    const bool plain = error == std::errc() && IsDigit(stop[-1]) && (stop == end || IsSpace(*stop));
+    if (!plain) Get(rest, out);
+  }
+
  private:
   template <typename Number>
-  void Get(const std::string& text, Number& out) const {
-    const size_t begin = text.find_first_not_of(kWhiteSpace);
-    if (begin == std::string::npos) return;
+  void Get(std::string_view text, Number& out) {
+    out = 0;
     std::ios_base::iostate ignored = std::ios_base::goodbit;
-    get(text.data() + begin, text.data() + text.size(), format, ignored, out);
+    if (!text.empty()) get(text.data(), text.data() + text.size(), format, ignored, out);
   }
 
-  // The facet takes flags and locale from here.
-  mutable std::basic_ios<char> format;
+  std::basic_ios<char> format;  // where the facet looks for flags and locale
 };
 
+// What turns the text of a value into a `V`.
+struct WordReader {
+  static void Extract(std::string_view text, std::string& out) { File::Extract(text, out); }
+};
 template <typename V>
-bool Convert(const NumberReader& reader, const std::string& text, V& out) {
-  if constexpr (std::is_arithmetic_v<V>) {
-    if (text.empty()) return false;
-    reader.Extract(text, out);
-    return true;
-  } else {
-    return toType(text, out, V());
-  }
-}
+using ReaderOf = std::conditional_t<std::is_arithmetic_v<V>, NumberReader, WordReader>;
 
-// `key` and `value` come in empty or 0. `text` is room that is used again for the next line.
+// `key` and `value` come in empty or 0.
 template <typename V>
-bool parseLineKeyValue(const NumberReader& reader, const std::string& line, std::string& text,
-                       std::string& key, V& value) {
+bool parseLineKeyValue(const std::string& line, ReaderOf<V>& reader, std::string& key, V& value) {
   if (line.empty()) {
     KELODR_LOG(WARN, __func__, "%s", "Bad Parameter.");
     return false;
@@ -254,10 +270,13 @@ bool parseLineKeyValue(const NumberReader& reader, const std::string& line, std:
     KELODR_LOG(NOTICE, __func__, "Cannot find separator[%s] in line[%s]", kSeparator, line.c_str());
     return false;
   }
-  text.assign(line, 0, end);
-  if (!toType(text, key, std::string())) return false;
-  text.assign(line, end + 1);
-  return Convert(reader, text, value);
+  const std::string_view whole(line);
+  const std::string_view keyText = whole.substr(0, end);
+  const std::string_view valueText = whole.substr(end + 1);
+  if (keyText.empty() || valueText.empty()) return false;
+  Extract(keyText, key);
+  reader.Extract(valueText, value);
+  return true;
 }
 
 }  // namespace
@@ -268,10 +287,7 @@ bool toType(const K& text, V& out, const V& defaultValue) {
     out = defaultValue;
     return false;
   }
-  const size_t begin = text.find_first_not_of(kWhiteSpace);
-  if (begin != std::string::npos) {
-    out = text.substr(begin, text.find_first_of(kWhiteSpace, begin) - begin);
-  }
+  Extract(text, out);
   return true;
 }
 
@@ -288,13 +304,13 @@ int Read(const std::string& path, std::map<K, V>& map) {
     return -1;
   }
   std::map<K, V> entries;  // apart from `map`, of which `path` may be a part
-  const NumberReader reader;
-  std::string text;
+  ReaderOf<V> reader;
   for (std::string line; file.NextLine(line);) {
     K key{};
     V value{};
-    if (parseLineKeyValue(reader, line, text, key, value)) {
-      entries[std::move(key)] = std::move(value);
+    if (parseLineKeyValue(line, reader, key, value)) {
+      // Most files are sorted: look at the end first.
+      entries.insert_or_assign(entries.end(), std::move(key), std::move(value));
     } else {
       KELODR_LOG(NOTICE, __func__, "Failed to parse line[%s] from file [%s]", line.c_str(),
                  path.c_str());
