@@ -245,6 +245,11 @@ TEST_F(FileTest, ANulByteHidesTheRestOfItsPieceOfADescriptor) {
   value = Json::Value();
   EXPECT_TRUE(ReadDescriptor(std::string("[1,\n\0hidden\n2]", 14), value));
   EXPECT_EQ(value, Parse("[1,2]"));
+  // A piece ends after 1023 bytes, so that the NUL byte before its end hides nothing.
+  value = Json::Value();
+  const std::string piece = std::string(1019, ' ') + "[1," + '\0';
+  EXPECT_TRUE(ReadDescriptor(piece + "2]", value));
+  EXPECT_EQ(value, Parse("[1,2]"));
 }
 
 std::atomic<int>* signalsHandled = nullptr;
