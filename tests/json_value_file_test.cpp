@@ -5,14 +5,11 @@
 #include <sys/file.h>
 #include <sys/inotify.h>
 #include <sys/mount.h>
-#include <sys/ptrace.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <csignal>
-#include <functional>
 #include <set>
 #include <string>
 #include <vector>
@@ -384,50 +381,6 @@ TEST_P(Writers, DoNotDisturbEachOtherAndReadersSeeWholeDocuments) {
   EXPECT_EQ(last["number"].asInt(), kEach) << "the last document is not the last of any writer";
   EXPECT_GT(reads, 10);
   EXPECT_EQ(NamesIn(dir), Names{"a"});
-}
-
-// Runs `body` in a child and kills it at its `stop`-th entry into or return from the kernel. True
-// when the child had ended before.
-bool KilledAt(int stop, const std::function<void()>& body) {
-  const pid_t child = fork();
-  if (child == 0) {
-    ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
-    raise(SIGSTOP);
-    body();
-    _exit(0);
-  }
-  int status = 0;
-  waitpid(child, &status, 0);
-  for (int i = 0; i < stop && WIFSTOPPED(status); ++i) {
-    ptrace(PTRACE_SYSCALL, child, nullptr, nullptr);
-    waitpid(child, &status, 0);
-  }
-  if (!WIFSTOPPED(status)) return true;
-  kill(child, SIGKILL);
-  while (waitpid(child, &status, 0) == child && !WIFSIGNALED(status)) {
-  }
-  return false;
-}
-
-TEST_F(JsonValueFileTest, AWriterKilledAnywhereLeavesAWholeDocumentAndOneTemporaryAtMost) {
-  bool sawTemporary = false;
-  bool ended = false;
-  for (int stop = 0; !ended; ++stop) {
-    ASSERT_LT(stop, 1000);
-    ASSERT_TRUE(toFile(Document("old"), Path("a")));
-    ASSERT_EQ(chmod(Path("a").c_str(), 04750), 0);
-    ended = KilledAt(stop, [this] { toFile(Document("new"), Path("a")); });
-    Json::Value value;
-    ASSERT_TRUE(fromFile(value, Path("a"))) << stop;
-    EXPECT_TRUE(value == Document("old") || value == Document("new")) << stop;
-    EXPECT_EQ(ModeOf(Path("a")), 04750U) << stop;
-    EXPECT_LE(NamesIn(dir).size(), 2U) << stop;
-    sawTemporary = sawTemporary || NamesIn(dir).size() == 2;
-    ASSERT_TRUE(toFile(Document("next"), Path("a"))) << stop;
-    ExpectDocument(Path("a"), Document("next"));
-    EXPECT_EQ(NamesIn(dir), Names{"a"}) << stop;
-  }
-  EXPECT_TRUE(sawTemporary);
 }
 
 }  // namespace

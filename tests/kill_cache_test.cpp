@@ -1,0 +1,170 @@
+// Cache updates and lock cycles killed at every system call of every process that they involve.
+
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <numeric>
+#include <string>
+#include <vector>
+
+#include "kelodrcore/file_lock.h"
+#include "kelodrcore/json_value.h"
+#include "support/recovery.h"
+#include "support/test_cache.h"
+#include "support/test_clock.h"
+#include "support/tracer.h"
+
+namespace {
+
+using KeloDRCore::FileLock;
+using KeloDRCore::JsonValue::fromFile;
+using Tracer::Moment;
+
+constexpr int kStale = 1100;  // seconds; above the time-out of MakeCache()
+
+int Sum(const std::vector<int>& numbers) {
+  return std::accumulate(numbers.begin(), numbers.end(), 0);
+}
+
+class KilledUpdateTest : public CacheFixture {
+ protected:
+  void Prepare() const {
+    std::filesystem::remove_all(cacheDir);
+    std::filesystem::create_directory(cacheDir);
+    WriteCacheFile("\"old\"", kStale);
+  }
+
+  // The lock directory is missing as well, so that claiming the update runs mkdir.
+  void PrepareFirst() const {
+    Prepare();
+    RemoveLockDir();
+  }
+
+  void RemoveLockDir() const { std::filesystem::remove_all("/tmp/.kelodr_lock" + dir); }
+
+  // For a child: a lock that it cannot make, because its mkdir was killed, is not waited for.
+  void Refresh(const std::string& data, bool waits = true) const {
+    TestClock::SkipSleeps();
+    TestCache cache = MakeCache(waits);
+    cache.FetchGives(data);
+    cache.Read();
+  }
+
+  void ExpectOneOf(const std::vector<std::string>& data, const Moment& moment) const {
+    Json::Value document;
+    EXPECT_TRUE(fromFile(document, path)) << moment;
+    const std::string found = document["cached_data"].asString();
+    EXPECT_EQ(std::count(data.begin(), data.end(), found), 1) << found << " at " << moment;
+  }
+
+  // The cache file, a pid file that names nobody alive, one temporary.
+  void ExpectFewLeftovers(const Moment& moment) const {
+    for (const std::string& name : NamesIn(cacheDir)) {
+      EXPECT_TRUE(name == "c.cached" || name == "c.cached.pid" || name == ".c.cached.kelodr-0")
+          << name << " at " << moment;
+    }
+  }
+
+  void ExpectWhole(const std::vector<std::string>& data, const Moment& moment) const {
+    ExpectOneOf(data, moment);
+    ExpectFewLeftovers(moment);
+    ExpectFree(lockName);
+    LogCapture::Clear();
+  }
+
+  void ExpectNextUpdateSucceeds(const Moment& moment) const {
+    TestCache cache = MakeCache();
+    cache.FetchGives("next");
+    ExpectPrompt([&] { EXPECT_TRUE(cache.Update()) << moment; });
+    EXPECT_EQ(MakeCache().Read(), "next") << moment;
+    EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{"c.cached"}) << moment;
+    LogCapture::Clear();
+  }
+
+  std::vector<int> SweepRefresh(bool waits) {
+    return Tracer::Sweep([this] { Prepare(); }, [&] { Refresh("new", waits); },
+                         [this](const Moment& moment) {
+                           ExpectWhole({"old", "new"}, moment);
+                           ExpectNextUpdateSucceeds(moment);
+                         });
+  }
+};
+
+TEST_F(KilledUpdateTest, LeavesTheOldDocumentOrTheNewOneAndNoLockHeld) {
+  PrepareFirst();
+  ExpectNextUpdateSucceeds({});  // makes the lock directory
+  const std::vector<int> kills = SweepRefresh(true);
+  ASSERT_EQ(kills.size(), 1U);
+  EXPECT_GT(kills[0], 60);
+  RecordProperty("kills", kills[0]);
+}
+
+TEST_F(KilledUpdateTest, MayBeTheFirstOneSinceTheStart) {
+  const std::vector<int> kills =
+      Tracer::Sweep([this] { PrepareFirst(); }, [this] { Refresh("new"); },
+                    [this](const Moment& moment) {
+                      ExpectWhole({"old", "new"}, moment);
+                      ExpectNextUpdateSucceeds(moment);
+                    });
+  ASSERT_EQ(kills.size(), 3U) << "not the updater, the supervisor of mkdir, and mkdir";
+  RecordProperty("kills", Sum(kills));
+}
+
+TEST_F(KilledUpdateTest, MayBeADetachedOneOrItsCaller) {
+  const std::vector<int> kills = SweepRefresh(false);
+  ASSERT_GE(kills.size(), 3U) << "not the caller, the process in between, and the refresher";
+  EXPECT_GT(kills[2], 60);
+  RecordProperty("kills", Sum(kills));
+}
+
+TEST_F(KilledUpdateTest, MayBeFollowedByAnotherKilledUpdate) {
+  const int kills = SweepPairs(
+      {7, 5}, [this] { Prepare(); }, [this] { Refresh("new"); }, [this] { Refresh("newer"); },
+      [this](const Moment& second) {
+        ExpectWhole({"old", "new", "newer"}, second);
+        ExpectNextUpdateSucceeds(second);
+      });
+  EXPECT_GT(kills, 50);
+  RecordProperty("kills", kills);
+}
+
+TEST_F(KilledUpdateTest, ReachesTheDiskBeforeItsName) {
+  Prepare();
+  const std::string temporary = ".c.cached.kelodr-0";
+  EXPECT_EQ(
+      Tracer::FileCalls(cacheDir, [this] { Refresh("new"); }),
+      (std::vector<std::string>{
+          "remove c.cached.pid", "create c.cached.pid", "mode c.cached.pid", "write c.cached.pid",
+          "create " + temporary, "write " + temporary, "mode " + temporary, "sync " + temporary,
+          "rename " + temporary + " c.cached", "sync .", "remove c.cached.pid"}));
+}
+
+class KilledLockCycleTest : public KilledUpdateTest {
+ protected:
+  void Cycle() const {
+    FileLock lock(lockName);
+    if (lock.lock(LOCK_EX | LOCK_NB, 0)) lock.unlock();
+  }
+
+  int Sweep(const std::function<void()>& prepare) {
+    return Sum(Tracer::Sweep(
+        prepare, [this] { Cycle(); }, [this](const Moment&) { ExpectFree(lockName); }));
+  }
+};
+
+TEST_F(KilledLockCycleTest, LeavesTheLockFree) {
+  Cycle();
+  const int kills = Sweep([] {});
+  EXPECT_GE(kills, 8);
+  RecordProperty("kills", kills);
+}
+
+TEST_F(KilledLockCycleTest, LeavesTheLockFreeWhenItMakesTheDirectory) {
+  const int kills = Sweep([this] { RemoveLockDir(); });
+  EXPECT_GT(kills, 60);
+  RecordProperty("kills", kills);
+}
+
+}  // namespace

@@ -1,0 +1,34 @@
+// What the kill sweeps share: files in memory, pairs of kills, and what is asked of the world
+// after.
+
+#ifndef KELODRCORE_TESTS_SUPPORT_RECOVERY_H_
+#define KELODRCORE_TESTS_SUPPORT_RECOVERY_H_
+
+#include <functional>
+#include <string>
+
+#include "support/tracer.h"
+
+// Of the instants of a first and of a second process, one in so many.
+struct Sample {
+  int first;
+  int second;
+};
+
+// Kills `first` and then `second` at pairs of their instants and runs `check` after each pair;
+// `prepare` runs before it. The second one's instants start elsewhere for each of the first one's,
+// so that neighbours differ. With KELODR_EVERY_PAIR in the environment every pair is taken, under
+// AddressSanitizer fewer than the sample. Returns how many pairs there were. Only process 0 of
+// either is killed.
+int SweepPairs(const Sample& sample, const std::function<void()>& prepare,
+               const std::function<void()>& first, const std::function<void()>& second,
+               const std::function<void(const Tracer::Moment&)>& check);
+
+// Runs `action` and expects it to be done at once: well below the shortest time that the library
+// waits for anybody, the five seconds of a lock.
+void ExpectPrompt(const std::function<void()>& action);
+
+// Expects that the lock can be had, at once.
+void ExpectFree(const std::string& lockName);
+
+#endif  // KELODRCORE_TESTS_SUPPORT_RECOVERY_H_
