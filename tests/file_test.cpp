@@ -55,7 +55,7 @@ class FileTest : public CleanTest {
 
   // A path that exists but that nobody can open, root included.
   std::string Unopenable() const {
-    const std::string path = Path("socket");
+    std::string path = Path("socket");
     sockaddr_un address = {};
     address.sun_family = AF_UNIX;
     strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
@@ -149,7 +149,8 @@ TEST_F(FileTest, ReadOfADirectoryFailsSilently) {
 
 TEST_F(FileTest, ReadOfALargeDocumentIsWhole) {
   Json::Value written;
-  for (int i = 0; i < 2000; ++i) written["k" + std::to_string(i)] = std::string(size_t(i), 'x');
+  for (int i = 0; i < 2000; ++i)
+    written["k" + std::to_string(i)] = std::string(static_cast<size_t>(i), 'x');
   std::string text = JsonValue::toString(written);
   for (size_t at = text.find(','); at != std::string::npos; at = text.find(',', at + 2)) {
     text.insert(at + 1, "\n");
