@@ -404,12 +404,12 @@ char* KLIBCStrTrim(char* text, const char* set, ...) {
 
 int KLIBCFileExist(const char* path) {
   struct stat info;
-  return stat(path, &info) == 0 ? 1 : 0;
+  return Retry([&] { return stat(path, &info); }) == 0 ? 1 : 0;
 }
 
 int KLIBCFileCheckDir(const char* path) {
   struct stat info;
-  return stat(path, &info) == 0 && S_ISDIR(info.st_mode) ? 1 : 0;
+  return Retry([&] { return stat(path, &info); }) == 0 && S_ISDIR(info.st_mode) ? 1 : 0;
 }
 
 int KLIBCReadPidFile(const char* path) {

@@ -107,7 +107,10 @@ bool FileLock::lock(int type, unsigned int timeout) {
   for (uint64_t elapsedMs = 0; usable;) {
     if (flock(fd, type) == 0) {
       if (IsFileAt(path, fd)) return true;
-      // Newcomers stand on another file: this lock excludes nobody. Opening anew gives it up.
+      // Newcomers stand on another file: this lock excludes nobody. It is given up whatever comes
+      // of the next file.
+      close(fd);
+      fd = -1;
       usable = openLockedFile();
       if (!usable || ++replaced <= kReplacedLimit) continue;
     }
@@ -127,7 +130,7 @@ bool FileLock::tryLock(int type) {
 
 void FileLock::unlock() const {
   KELODR_PRIVILEGED();
-  if (fd > 0 && flock(fd, LOCK_UN) < 0) {
+  if (fd > 0 && Retry([this] { return flock(fd, LOCK_UN); }) < 0) {
     KELODR_LOG(ERR, __func__, "Failed to unlock [%s] with fd [%d], errno=[%m]", path.c_str(), fd);
   }
 }
