@@ -21,7 +21,7 @@ struct State {
   Fault::Plan plan;
   std::atomic<int> calls;
   std::atomic<int> failures;
-  std::array<const char*, 16> failed;  // literals, at the same place in a forked child
+  std::array<const char*, 64> failed;  // literals, at the same place in a forked child
 };
 
 State* state = nullptr;
@@ -61,6 +61,7 @@ void Arm(const Plan& plan) {
   state->plan = plan;
   state->calls = 0;
   state->failures = 0;
+  state->failed = {};
   state->armed = true;
 }
 
@@ -70,8 +71,7 @@ int Disarm() {
 }
 
 std::vector<std::string> FailedCalls() {
-  const size_t count = std::min(static_cast<size_t>(state->failures), state->failed.size());
-  return {state->failed.begin(), state->failed.begin() + static_cast<std::ptrdiff_t>(count)};
+  return {state->failed.begin(), std::find(state->failed.begin(), state->failed.end(), nullptr)};
 }
 
 bool Outcome::Failed(const std::string& call) const {
@@ -86,8 +86,10 @@ bool Hits(const char* call, std::initializer_list<int> errors) {
   if (std::find(errors.begin(), errors.end(), plan.error) == errors.end()) return false;
   const int number = ++state->calls;
   if (number < plan.first || number - plan.first >= plan.times) return false;
-  const auto failure = static_cast<size_t>(state->failures++);
-  if (failure < state->failed.size()) state->failed[failure] = call;
+  ++state->failures;
+  size_t known = 0;
+  while (state->failed[known] != nullptr && state->failed[known] != call) ++known;
+  state->failed.at(known) = call;
   errno = plan.error == kNoMemory ? ENOMEM : plan.error;
   return true;
 }

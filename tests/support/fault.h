@@ -36,7 +36,7 @@ void Arm(const Plan& plan);
 // The number of calls that failed.
 int Disarm();
 
-// The names of the calls that failed since Arm(), in order; of very many, the first.
+// The names of the calls that failed since Arm(), each once, in the order of the first failures.
 std::vector<std::string> FailedCalls();
 
 // Whether this call, one that can fail with `errors`, is to fail; errno is set then.
@@ -56,7 +56,7 @@ struct Outcome {
   bool succeeded;
   bool threw;                       // std::bad_alloc came out
   int error;                        // the error of the plan, 0 when nothing was to fail
-  std::vector<std::string> failed;  // the calls that failed, in order
+  std::vector<std::string> failed;  // the calls that failed, see FailedCalls()
   std::vector<LogLine> log;         // everything logged
 
   bool Failed(const std::string& call) const;
