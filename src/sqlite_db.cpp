@@ -42,6 +42,15 @@ auto ThrowOnlyBadAlloc(const Action& action) {
 
 const char* OrEmpty(const char* text) { return text != nullptr ? text : ""; }
 
+// SQLite answers null too when it has no memory for a text; that must not turn into an empty one.
+const char* ColumnText(sqlite3_stmt* stmt, int column) {
+  const auto* const text = reinterpret_cast<const char*>(sqlite3_column_text(stmt, column));
+  if (text == nullptr && sqlite3_errcode(sqlite3_db_handle(stmt)) == SQLITE_NOMEM) {
+    throw std::bad_alloc();
+  }
+  return OrEmpty(text);
+}
+
 void AddColumn(sqlite3_stmt* stmt, int column, SqliteValueList& record, const char* function) {
   const char* const name = OrEmpty(sqlite3_column_name(stmt, column));
   const int type = sqlite3_column_type(stmt, column);
@@ -50,8 +59,7 @@ void AddColumn(sqlite3_stmt* stmt, int column, SqliteValueList& record, const ch
       record.AddValue(name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
       break;
     case SQLITE_TEXT:
-      record.AddValue(name,
-                      OrEmpty(reinterpret_cast<const char*>(sqlite3_column_text(stmt, column))));
+      record.AddValue(name, ColumnText(stmt, column));
       break;
     case SQLITE_NULL:
       KELODR_LOG(WARN, function, "field [%s] has null value", name);
