@@ -234,6 +234,33 @@ TEST_F(SqliteDBFaultTest, RowsComeWholeOrNotAtAll) {
   SweepReading(selectAll, {"n:1, s:'one'", "n:2, s:'two'"});
 }
 
+// Such a text, and a name like it, is converted when it is asked for.
+TEST_F(SqliteDBFaultTest, AWideTextComesWholeOrNotAtAll) {
+  const std::string base = Path("wide");
+  const std::string text(3000, 'x');
+  ASSERT_TRUE(SqliteDB(base, 0, "label")
+                  .Exec("PRAGMA encoding = 'UTF-16'; CREATE TABLE t (s TEXT);"
+                        "INSERT INTO t VALUES ('" +
+                        text + "')"));
+  std::string selected;
+  const auto run = [&] {
+    SqliteDB db(base, kRetries, "label");
+    SqliteValueList record;
+    if (!db.SelectByCommand("SELECT s FROM t", record)) return false;
+    const Fault::Suspension suspension;
+    selected.clear();
+    EXPECT_TRUE(record.GetValue("s", selected));
+    return true;
+  };
+  const auto check = [&](const Outcome& outcome) {
+    EXPECT_EQ(sqlite3_memory_used(), memoryBefore);
+    if (outcome.succeeded) {
+      EXPECT_EQ(selected, text);
+    }
+  };
+  SweepMemory({[] {}, run, check});
+}
+
 TEST_F(SqliteDBFaultTest, RecordsComeWholeOrNotAtAll) {
   missingIsNotTold = true;
   SelectCommand select;
