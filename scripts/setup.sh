@@ -12,7 +12,7 @@
 #   lint      the static checkers
 #   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
 #   docs      the API documentation's generator
-#   bench     the benchmark library
+#   bench     the benchmark library, the libraries it compares with, the plotter
 #   fuzz      the fuzzing compiler
 #   coverage  the coverage report
 set -euo pipefail
@@ -29,7 +29,7 @@ packages_of() {
     lint) echo clang clang-tidy ;;
     i386) echo g++-multilib googletest ;;
     docs) echo doxygen graphviz ;;
-    bench) echo libbenchmark-dev ;;
+    bench) echo libbenchmark-dev libsqlitecpp-dev libsoci-dev libboost-dev gnuplot-nox python3 ;;
     fuzz) echo clang libclang-rt-14-dev ;;
     coverage) echo gcovr ;;
     *) echo "setup.sh: there is no group '$1'; scripts/setup.sh without one lists them" >&2; return 1 ;;

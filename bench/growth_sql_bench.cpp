@@ -1,0 +1,148 @@
+// How the cost of SQL work grows: with the rows, and with the size of one value; and what a
+// selected row takes of memory.
+
+#include <malloc.h>
+
+#include <cstdio>
+#include <fstream>
+
+#include "kelodrcore/sqlite_db.h"
+#include "nodes.h"
+#include "processes.h"
+#include "raw_calls.h"
+#include "support.h"
+
+namespace bench {
+namespace {
+
+constexpr char kSelect[] = "SELECT  * FROM nodes";
+
+KeloDRCore::SelectCommand SelectAllNodes() {
+  KeloDRCore::SelectCommand command;
+  command.SetTable(NodeTable());
+  command.SelectAll();
+  return command;
+}
+
+void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes) {
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  const KeloDRCore::SqliteTableHandler table = NodeTable();
+  db.Exec("BEGIN");
+  for (const Node& node : nodes) Require(db.InsertRecord(InsertOf(table, node)), "InsertRecord");
+  db.Exec("COMMIT");
+}
+
+void InsertByHand(const std::string& path, const std::vector<Node>& nodes) {
+  sqlite3* const db = OpenRaw(path);
+  ExecRaw(db, "BEGIN");
+  std::string sql;
+  for (const Node& node : nodes) {
+    RenderInsert(node, sql);
+    InsertRaw(db, sql);
+  }
+  ExecRaw(db, "COMMIT");
+  sqlite3_close(db);
+}
+
+size_t SelectWithLibrary(const std::string& path) {
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  std::vector<KeloDRCore::SqliteValueList> records;
+  Require(db.SelectRecords(SelectAllNodes(), records), "SelectRecords");
+  return records.size();
+}
+
+size_t SelectByHand(const std::string& path) {
+  sqlite3* const db = OpenRaw(path);
+  std::vector<Record> records;
+  SelectRaw(db, kSelect, records);
+  sqlite3_close(db);
+  return records.size();
+}
+
+void MeasureInsert(int rows, const char* contestant,
+                   void (*insertAll)(const std::string&, const std::vector<Node>&)) {
+  Register("growth insert", std::to_string(rows), contestant, [=](benchmark::State& state) {
+    const std::vector<Node> nodes = MakeNodes(rows);
+    const std::string path = ScratchPath("growth.db");
+    for (auto _ : state) {
+      state.PauseTiming();
+      MakeDatabase(path);
+      state.ResumeTiming();
+      insertAll(path, nodes);
+    }
+  });
+}
+
+void MeasureSelect(int rows, const char* contestant, size_t (*selectAll)(const std::string&)) {
+  Register("growth select", std::to_string(rows), contestant, [=](benchmark::State& state) {
+    const std::string path = DatabaseOf(rows);
+    for (auto _ : state) Require(selectAll(path) == static_cast<size_t>(rows), "select");
+  });
+}
+
+// The highest resident memory of this process in bytes, counted from this moment on when `reset`.
+size_t PeakMemory(bool reset) {
+  if (reset) {
+    malloc_trim(0);
+    std::ofstream("/proc/self/clear_refs") << "5";
+  }
+  std::ifstream status("/proc/self/status");
+  for (std::string line; std::getline(status, line);) {
+    size_t kilobytes = 0;
+    if (sscanf(line.c_str(), "VmHWM: %zu", &kilobytes) == 1) return kilobytes * 1024;
+  }
+  return 0;
+}
+
+// In a child, so that no earlier work has left memory to use again.
+void MeasureMemory(int rows, const char* contestant, size_t (*selectAll)(const std::string&)) {
+  Register("growth memory", std::to_string(rows), contestant, [=](benchmark::State& state) {
+    const std::string path = DatabaseOf(rows);
+    double bytes = 0;
+    for (auto _ : state) {
+      bytes = NumberFromChild([&] {
+        const size_t before = PeakMemory(true);
+        selectAll(path);
+        return static_cast<double>(PeakMemory(false) - before);
+      });
+    }
+    state.counters["bytes_per_row"] = bytes / rows;
+  });
+}
+
+void MeasureValueInsert(size_t size, const char* contestant,
+                        void (*insertAll)(const std::string&, const std::vector<Node>&)) {
+  Register("growth value", std::to_string(size), contestant, [=](benchmark::State& state) {
+    const std::vector<Node> nodes = {{"10.0.0.1", 1, std::string(size, 'x'), true, 5566}};
+    const std::string path = ScratchPath("value.db");
+    for (auto _ : state) {
+      state.PauseTiming();
+      MakeDatabase(path);
+      state.ResumeTiming();
+      insertAll(path, nodes);
+      Require((contestant == std::string(kLibrary) ? SelectWithLibrary : SelectByHand)(path) == 1,
+              "select");
+    }
+  })->UseRealTime();
+}
+
+}  // namespace
+
+void RegisterSqlGrowth() {
+  for (const int rows : {1000, 10000, 100000, 1000000}) {
+    MeasureInsert(rows, kLibrary, InsertWithLibrary);
+    MeasureInsert(rows, kLimit, InsertByHand);
+    MeasureSelect(rows, kLibrary, SelectWithLibrary);
+    MeasureSelect(rows, kLimit, SelectByHand);
+    MeasureMemory(rows, kLibrary, SelectWithLibrary);
+    MeasureMemory(rows, kLimit, SelectByHand);
+  }
+  for (size_t size = 16; size <= size_t{64} << 20; size *= 16) {
+    MeasureValueInsert(size, kLibrary, InsertWithLibrary);
+    MeasureValueInsert(size, kLimit, InsertByHand);
+  }
+  MeasureValueInsert(size_t{64} << 20, kLibrary, InsertWithLibrary);
+  MeasureValueInsert(size_t{64} << 20, kLimit, InsertByHand);
+}
+
+}  // namespace bench

@@ -1,0 +1,83 @@
+// InsertRecord: rows of five fields inside one transaction, into an empty table.
+
+#include <SQLiteCpp/SQLiteCpp.h>
+#include <sqlite3.h>
+
+#include <functional>
+
+#include "kelodrcore/sqlite_db.h"
+#include "nodes.h"
+#include "raw_calls.h"
+#include "soci_peer.h"
+#include "support.h"
+
+namespace bench {
+namespace {
+
+constexpr char kInsert[] = "INSERT INTO nodes (address,id,name,online,port) VALUES (?,?,?,?,?)";
+
+using InsertAll = std::function<void(const std::string& path, const std::vector<Node>& nodes)>;
+
+void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes) {
+  const KeloDRCore::SqliteTableHandler table = NodeTable();
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  Require(db.Exec("BEGIN"), "BEGIN");
+  for (const Node& node : nodes) Require(db.InsertRecord(InsertOf(table, node)), "InsertRecord");
+  Require(db.Exec("COMMIT"), "COMMIT");
+}
+
+void InsertByHand(const std::string& path, const std::vector<Node>& nodes) {
+  sqlite3* const db = OpenRaw(path);
+  ExecRaw(db, "BEGIN");
+  std::string sql;
+  for (const Node& node : nodes) {
+    RenderInsert(node, sql);
+    InsertRaw(db, sql);
+  }
+  ExecRaw(db, "COMMIT");
+  sqlite3_close(db);
+}
+
+// The peers do less: they look for no table, log nothing, and prepare one statement for all rows.
+
+void InsertWithSqliteCpp(const std::string& path, const std::vector<Node>& nodes) {
+  SQLite::Database db(path, SQLite::OPEN_READWRITE);
+  SQLite::Transaction transaction(db);
+  SQLite::Statement statement(db, kInsert);
+  for (const Node& node : nodes) {
+    statement.bind(1, node.address);
+    statement.bind(2, node.id);
+    statement.bind(3, node.name);
+    statement.bind(4, node.online ? 1 : 0);
+    statement.bind(5, node.port);
+    statement.exec();
+    statement.reset();
+  }
+  transaction.commit();
+}
+
+void Measure(const std::string& contestant, const InsertAll& insertAll) {
+  Register("InsertRecord", "20,000 rows", contestant, [=](benchmark::State& state) {
+    static const std::vector<Node> nodes = MakeNodes(kRows);
+    static const std::string expected = Contents(DatabaseOf(kRows));
+    const std::string path = ScratchPath("insert.db");
+    for (auto _ : state) {
+      state.PauseTiming();
+      MakeDatabase(path);
+      state.ResumeTiming();
+      insertAll(path, nodes);
+    }
+    Require(Contents(path) == expected, contestant + " inserts other rows");
+  })->Unit(benchmark::kMillisecond);
+}
+
+}  // namespace
+
+void RegisterInsert() {
+  Measure(kLibrary, InsertWithLibrary);
+  Measure(kLimit, InsertByHand);
+  Measure("SQLiteCpp", InsertWithSqliteCpp);
+  Measure("SOCI", InsertWithSoci);
+}
+
+}  // namespace bench

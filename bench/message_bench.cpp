@@ -1,0 +1,117 @@
+// Request and Response: building a call as text, reading a call, asking a reply; beside the same
+// with JsonCpp alone.
+
+#include "kelodrcore/json_value.h"
+#include "kelodrcore/request.h"
+#include "kelodrcore/response.h"
+#include "support.h"
+
+namespace bench {
+namespace {
+
+constexpr char kApi[] = "DR.Node";
+
+struct Call {
+  explicit Call(size_t size) {
+    Require(ParseWithJsonCpp(NodesDocument(size), nodes), "JsonCpp refuses the document");
+    text = KeloDRCore::JsonValue::toString(KeloDRCore::Request(kApi, 1, "set", Params()).toJson());
+    Json::Value document(Json::objectValue);
+    document["success"] = true;
+    document["data"]["task_id"] = "task_7";
+    document["data"]["finish"] = true;
+    document["data"]["nodes"] = nodes;
+    reply = KeloDRCore::JsonValue::toString(document);
+  }
+
+  Json::Value Params() const {
+    Json::Value params(Json::objectValue);
+    params["id"] = 7;
+    params["nodes"] = nodes;
+    return params;
+  }
+
+  Json::Value nodes;
+  std::string text;
+  std::string reply;
+};
+
+std::string BuildWithLibrary(const Call& call) {
+  KeloDRCore::Request request;
+  request.setAPI(kApi);
+  request.setMethod("set");
+  request.setVersion(1);
+  request.addParam("id", 7);
+  request.addParam("nodes", call.nodes);
+  return KeloDRCore::JsonValue::toString(request.toJson());
+}
+
+std::string BuildByHand(const Call& call) {
+  Json::Value json(Json::objectValue);
+  json["api"] = kApi;
+  json["method"] = "set";
+  json["version"] = 1;
+  json["id"] = 7;
+  json["nodes"] = call.nodes;
+  return WriteWithJsonCpp(json);
+}
+
+size_t ParseWithLibrary(const Call& call) {
+  Json::Value json;
+  Require(KeloDRCore::JsonValue::fromString(json, call.text), "fromString");
+  const KeloDRCore::Request request(json);
+  Require(request.isValid() && request.getAPI() == kApi && request.getVersion() == 1, "request");
+  return request.getParams()["nodes"].size();
+}
+
+size_t ParseByHand(const Call& call) {
+  Json::Value json;
+  Require(ParseWithJsonCpp(call.text, json), "parse");
+  const std::string api = json["api"].asString();
+  const std::string method = json["method"].asString();
+  const int version = json["version"].asInt();
+  Require(api == kApi && !method.empty() && version == 1, "request");
+  return json["nodes"].size();
+}
+
+size_t AskWithLibrary(const Call& call) {
+  const KeloDRCore::Response response(call.reply);
+  Require(response.isSuccess() && response.getErrCode() == 0 && response.isPollFinish(), "reply");
+  return response.getTaskId().size() + response.getDataField("nodes").size();
+}
+
+size_t AskByHand(const Call& call) {
+  Json::Value reply;
+  Require(ParseWithJsonCpp(call.reply, reply), "parse");
+  const Json::Value& answer = reply;
+  const bool succeeded = answer.isMember("success") && answer["success"].asBool();
+  const int code = succeeded ? 0 : answer["error"]["code"].asInt();
+  Require(succeeded && code == 0, "reply");
+  const Json::Value& data = answer["data"];
+  Require(data.isMember("finish") && data["finish"].asBool(), "reply");
+  return data["task_id"].asString().size() + data["nodes"].size();
+}
+
+template <typename Run>
+void Measure(const char* operation, const char* step, size_t size, const char* contestant,
+             const Run& run) {
+  Register(operation, std::string(step) + ", " + SizeName(size), contestant,
+           [=](benchmark::State& state) {
+             const Call call(size);
+             for (auto _ : state) benchmark::DoNotOptimize(run(call));
+           });
+}
+
+}  // namespace
+
+void RegisterMessages() {
+  for (const size_t size : {size_t{1} << 10, size_t{1} << 20}) {
+    Measure("Request", "build to text", size, kLibrary, BuildWithLibrary);
+    Measure("Request", "build to text", size, kLimit, BuildByHand);
+    Measure("Request", "parse and query", size, kLibrary, ParseWithLibrary);
+    Measure("Request", "parse and query", size, kLimit, ParseByHand);
+    Measure("Response", "parse and query", size, kLibrary, AskWithLibrary);
+    Measure("Response", "parse and query", size, kLimit, AskByHand);
+  }
+}
+
+}  // namespace bench

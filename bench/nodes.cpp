@@ -1,0 +1,89 @@
+#include "nodes.h"
+
+#include <sqlite3.h>
+#include <unistd.h>
+
+#include "raw_calls.h"
+#include "support.h"
+
+namespace bench {
+namespace {
+
+constexpr char kColumns[] =
+    "address TEXT, id INTEGER PRIMARY KEY, name TEXT, online INTEGER, port INTEGER";
+
+int AppendRow(void* contents, int columns, char** values, char** /*names*/) {
+  for (int i = 0; i < columns; ++i) static_cast<std::string*>(contents)->append(values[i]) += '\n';
+  return 0;
+}
+
+}  // namespace
+
+std::vector<Node> MakeNodes(int count) {
+  std::vector<Node> nodes;
+  nodes.reserve(static_cast<size_t>(count));
+  for (int i = 0; i < count; ++i) {
+    const std::string number = std::to_string(i);
+    nodes.push_back({"192.168." + std::to_string(i / 250 % 250) + "." + std::to_string(i % 250), i,
+                     i % 8 == 0 ? "node " + number + " of O'Brien" : "node " + number + " of site",
+                     i % 3 != 0, static_cast<unsigned int>(5566 + i % 10)});
+  }
+  return nodes;
+}
+
+KeloDRCore::SqliteTableHandler NodeTable() { return {"nodes", kColumns}; }
+
+KeloDRCore::InsertCommand InsertOf(const KeloDRCore::SqliteTableHandler& table, const Node& node) {
+  KeloDRCore::InsertCommand command;
+  command.SetTable(table);
+  command.AddFieldValue("address", node.address);
+  command.AddFieldValue("id", node.id);
+  command.AddFieldValue("name", node.name);
+  command.AddFieldValue("online", node.online);
+  command.AddFieldValue("port", node.port);
+  return command;
+}
+
+sqlite3* OpenRaw(const std::string& path) {
+  sqlite3* db = nullptr;
+  Require(sqlite3_open(path.c_str(), &db) == SQLITE_OK, "cannot open " + path);
+  sqlite3_busy_timeout(db, 1000);
+  return db;
+}
+
+void ExecRaw(sqlite3* db, const char* sql) {
+  Require(sqlite3_exec(db, sql, nullptr, nullptr, nullptr) == SQLITE_OK, sqlite3_errmsg(db));
+}
+
+void MakeDatabase(const std::string& path) {
+  unlink(path.c_str());
+  sqlite3* const db = OpenRaw(path);
+  ExecRaw(db, (std::string("CREATE TABLE nodes (") + kColumns + ")").c_str());
+  sqlite3_close(db);
+}
+
+std::string DatabaseOf(int count) {
+  const std::string path = ScratchPath("nodes" + std::to_string(count) + ".db");
+  if (access(path.c_str(), F_OK) == 0) return path;
+  MakeDatabase(path);
+  sqlite3* const db = OpenRaw(path);
+  ExecRaw(db, "BEGIN");
+  std::string text;
+  for (const Node& node : MakeNodes(count)) {
+    RenderInsert(node, text);
+    ExecRaw(db, text.c_str());
+  }
+  ExecRaw(db, "COMMIT");
+  sqlite3_close(db);
+  return path;
+}
+
+std::string Contents(const std::string& path) {
+  std::string contents;
+  sqlite3* const db = OpenRaw(path);
+  sqlite3_exec(db, "SELECT * FROM nodes ORDER BY id", AppendRow, &contents, nullptr);
+  sqlite3_close(db);
+  return contents;
+}
+
+}  // namespace bench

@@ -1,0 +1,212 @@
+#!/usr/bin/env python3
+"""Makes the table of ratios, and the curves, from the JSON files that scripts/bench.sh measured.
+
+usage: report.py RESULTS [DOCS]    with DOCS, writes DOCS/performance.md's table and DOCS/*.svg
+"""
+
+import collections
+import json
+import pathlib
+import statistics
+import subprocess
+import sys
+
+LIBRARY = "kelodrcore"
+LIMIT = "limit"
+
+# The largest ratio to the limit that an operation may take.
+BOUNDS = {
+    "InsertRecord": 1.10,
+    "SelectRecords": 1.05,
+    "GetCommand": 1.2,
+    "fromString": 1.05,
+    "toString": 1.05,
+    "File::Read": 1.15,
+    "File::Write": 1.15,
+    "File::Read<K, V>": 1.5,
+    "Cache::Read": 1.2,
+    "FileLock": 1.2,
+    "Request": 1.1,
+    "Response": 1.1,
+}
+# The largest ratio to a peer: faster than it, or as many times faster.
+PEER_BOUNDS = {
+    ("SelectRecords", "SQLiteCpp"): 1,
+    ("SelectRecords", "SOCI"): 1,
+    ("ToFormatedValue", "sqlite3_mprintf"): 1,
+    ("ToFormatedValue", "regex_replace"): 1 / 50,
+    ("File::Read<K, V>", "a stream a token"): 1 / 4,
+}
+NANOSECONDS = {"ns": 1, "us": 1e3, "ms": 1e6, "s": 1e9}
+
+
+class Comparison:
+    """One piece of work: the times of each contestant, in the order of the repetitions."""
+
+    def __init__(self):
+        self.times = collections.defaultdict(list)
+        self.counters = {}
+
+    def add(self, contestant, run):
+        kind = "cpu_time" if run["name"].endswith(contestant) else "real_time"
+        self.times[contestant].append(run[kind] * NANOSECONDS[run["time_unit"]])
+        if "bytes_per_row" in run:
+            self.counters[contestant] = run["bytes_per_row"]
+
+    def median(self, contestant):
+        return statistics.median(self.times[contestant])
+
+    def ratios(self, contestant):
+        """Lower quartile, median and upper quartile of the library's time over the contestant's."""
+        pairs = zip(self.times[LIBRARY], self.times[contestant])
+        ratios = [ours / theirs for ours, theirs in pairs]
+        return statistics.quantiles(ratios, n=4, method="inclusive")
+
+
+def load(results):
+    comparisons = collections.OrderedDict()
+    context = {}
+    for path in sorted(pathlib.Path(results).glob("*.json"), key=lambda p: p.stat().st_mtime_ns):
+        document = json.loads(path.read_text())
+        context = document["context"]
+        for run in document["benchmarks"]:
+            if run["run_type"] != "iteration":
+                continue
+            operation, work, contestant = run["name"].split("/")[:3]
+            comparisons.setdefault((operation, work), Comparison()).add(contestant, run)
+    return comparisons, context
+
+
+def time_text(nanoseconds):
+    for unit, factor in (("s", 1e9), ("ms", 1e6), ("µs", 1e3)):
+        if nanoseconds >= factor:
+            return f"{nanoseconds / factor:.3g} {unit}"
+    return f"{nanoseconds:.3g} ns"
+
+
+def ratio_text(low, middle, high):
+    return f"{middle:.3f} ({low:.3f}–{high:.3f})"
+
+
+def bound_text(bound):
+    return f"≤ 1/{1 / bound:.0f}" if bound < 1 else "< 1" if bound == 1 else f"≤ {bound:.2f}"
+
+
+def rows_of(operation, work, comparison):
+    for contestant in comparison.times:
+        if contestant == LIBRARY:
+            continue
+        bound = PEER_BOUNDS.get((operation, contestant))
+        if contestant == LIMIT:
+            bound = BOUNDS[operation]
+        if contestant == "regex_replace" and not work.startswith("4 KiB"):
+            bound = None
+        low, middle, high = comparison.ratios(contestant)
+        missed = bound is not None and middle > bound
+        yield [
+            operation, work, time_text(comparison.median(LIBRARY)), contestant,
+            ratio_text(low, middle, high), bound_text(bound) if bound else "",
+            "missed" if missed else "",
+        ]
+
+
+def table(comparisons):
+    head = ["operation", "work", "time", "beside", "ratio (quartiles)", "bound", ""]
+    rows = [head]
+    for (operation, work), comparison in comparisons.items():
+        if not operation.startswith("growth"):
+            rows.extend(rows_of(operation, work, comparison))
+    widths = [max(len(row[i]) for row in rows) for i in range(len(head))]
+    rows.insert(1, ["-" * width for width in widths])
+    lines = []
+    for row in rows:
+        cells = (cell.ljust(width) for cell, width in zip(row, widths))
+        lines.append("| " + " | ".join(cells) + " |")
+    return "\n".join(lines) + "\n"
+
+
+def machine(context):
+    keys = ["processor", "system", "compiler", "build", "kelodrcore", "sqlite", "jsoncpp",
+            "sqlitecpp", "soci", "boost"]
+    lines = [f"{context['num_cpus']} processors"]
+    lines += [f"{key}: {context[key]}" for key in keys]
+    return "".join(f"    {line}\n" for line in lines)
+
+
+def curve(comparisons, operation, contestant, value):
+    """The points of one curve: what the work counts, and the value of its comparison."""
+    return [
+        (int(work), value(int(work), comparison, contestant))
+        for (name, work), comparison in comparisons.items()
+        if name == operation and contestant in comparison.times
+    ]
+
+
+def plot(path, title, x, y, curves, extra=""):
+    """Draws curves (title, points) with gnuplot."""
+    script = [
+        "set terminal svg size 720,440 font 'sans-serif,13' background rgb 'white'",
+        f"set output '{path}'", f"set title '{title}'", f"set xlabel '{x}'", f"set ylabel '{y}'",
+        "set key left top", "set grid", "set logscale x 10", extra,
+    ]
+    script += [
+        f"$curve{i} << end\n" + "\n".join(f"{a} {b}" for a, b in points) + "\nend"
+        for i, (_, points) in enumerate(curves)
+    ]
+    lines = (f"$curve{i} with linespoints pt 7 ps 0.5 dt {1 + ('limit' in name)} title '{name}'"
+             for i, (name, _) in enumerate(curves))
+    script.append("plot " + ", ".join(lines))
+    subprocess.run(["gnuplot"], input="\n".join(script), text=True, check=True)
+
+
+def draw(comparisons, docs):
+    def both(operation, label, value):
+        return [(f"{label}{name}", curve(comparisons, operation, name, value))
+                for name in (LIBRARY, LIMIT)]
+
+    def per_row(rows, comparison, name):
+        return comparison.median(name) / rows / 1e3
+
+    def whole(_, comparison, name):
+        return comparison.median(name) / 1e3
+
+    def bytes_per_row(_, comparison, name):
+        return comparison.counters[name]
+
+    plot(docs / "growth-rows.svg", "Inserts and selects", "rows", "µs a row",
+         both("growth insert", "insert, ", per_row) + both("growth select", "select, ", per_row),
+         "set yrange [0:*]; set format x '10^{%T}'")
+    plot(docs / "growth-value.svg", "One row with a large text: inserted and selected",
+         "bytes of the text", "µs", both("growth value", "", whole),
+         "set logscale y 10; set format x '10^{%T}'")
+    powers = "set logscale x 2; set yrange [0:*]"
+    plot(docs / "growth-cache.svg", "Fresh cache reads by many processes", "processes",
+         "µs a read, whole machine", both("growth cache", "", whole), powers)
+    plot(docs / "growth-lock.svg", "One lock wanted by many processes", "processes",
+         "µs a lock, whole machine",
+         both("growth lock waiting", "waiting in the kernel, ", whole) +
+         both("growth lock polling", "polling, ", whole), powers)
+    plot(docs / "growth-memory.svg", "Peak memory of SelectRecords", "rows", "bytes a row",
+         both("growth memory", "", bytes_per_row), "set yrange [0:*]; set format x '10^{%T}'")
+
+
+def replace_section(text, name, section):
+    """Puts `section` between the comments that mark its place."""
+    begin, end = f"<!-- {name} -->\n", f"<!-- end of {name} -->\n"
+    head, rest = text.split(begin)
+    return head + begin + "\n" + section + "\n" + end + rest.split(end)[1]
+
+
+def main():
+    comparisons, context = load(sys.argv[1])
+    print(machine(context))
+    print(table(comparisons))
+    if len(sys.argv) > 2:
+        docs = pathlib.Path(sys.argv[2])
+        page = docs / "performance.md"
+        text = replace_section(page.read_text(), "table", table(comparisons))
+        page.write_text(replace_section(text, "machine", machine(context)))
+        draw(comparisons, docs)
+
+
+main()

@@ -1,0 +1,111 @@
+// SelectRecords: rows of five columns, each into a record of its own.
+
+#include <SQLiteCpp/SQLiteCpp.h>
+#include <sqlite3.h>
+
+#include "kelodrcore/sqlite_db.h"
+#include "nodes.h"
+#include "raw_calls.h"
+#include "soci_peer.h"
+#include "support.h"
+
+namespace bench {
+namespace {
+
+constexpr char kSelect[] = "SELECT address,id,name,online,port FROM nodes";
+
+KeloDRCore::SelectCommand SelectAllNodes() {
+  KeloDRCore::SelectCommand command;
+  command.SetTable(NodeTable());
+  for (const char* field : {"address", "id", "name", "online", "port"}) command.AddField(field);
+  return command;
+}
+
+// The records as log lines show them.
+std::string ExpectedText() {
+  std::string text;
+  for (const Node& node : MakeNodes(kRows)) {
+    text += "address:";
+    AppendLiteral(text, node.address.data(), node.address.data() + node.address.size());
+    text += ", id:" + std::to_string(node.id) + ", name:";
+    AppendLiteral(text, node.name.data(), node.name.data() + node.name.size());
+    text += ", online:" + std::to_string(node.online) + ", port:" + std::to_string(node.port);
+  }
+  return text;
+}
+
+void SelectWithLibrary(benchmark::State& state) {
+  KeloDRCore::SqliteDB db(DatabaseOf(kRows), 3, "bench");
+  const KeloDRCore::SelectCommand command = SelectAllNodes();
+  std::vector<KeloDRCore::SqliteValueList> first;
+  db.SelectRecords(command, first);
+  std::string contents;
+  for (const KeloDRCore::SqliteValueList& record : first) contents += record.ToStr();
+  Require(contents == ExpectedText(), "SelectRecords selects other records");
+  for (auto _ : state) {
+    std::vector<KeloDRCore::SqliteValueList> records;
+    Require(db.SelectRecords(command, records) && records.size() == kRows, "SelectRecords");
+  }
+}
+
+// The contestants that fill `std::map<std::string, Json::Value>`.
+template <typename Fill>
+void FillRecords(benchmark::State& state, const Fill& fill) {
+  static const std::vector<Record> expected = [] {
+    std::vector<Record> records;
+    SelectRaw(OpenRaw(DatabaseOf(kRows)), kSelect, records);
+    return records;
+  }();
+  std::vector<Record> first;
+  fill(first);
+  Require(first == expected, "the records differ");
+  for (auto _ : state) {
+    std::vector<Record> records;
+    fill(records);
+  }
+}
+
+void SelectByHand(benchmark::State& state) {
+  sqlite3* const db = OpenRaw(DatabaseOf(kRows));
+  FillRecords(state, [db](std::vector<Record>& records) { SelectRaw(db, kSelect, records); });
+  sqlite3_close(db);
+}
+
+void SelectWithSqliteCpp(benchmark::State& state) {
+  const SQLite::Database db(DatabaseOf(kRows));
+  FillRecords(state, [&db](std::vector<Record>& records) {
+    SQLite::Statement statement(db, kSelect);
+    while (statement.executeStep()) {
+      Record record;
+      for (int i = 0; i < statement.getColumnCount(); ++i) {
+        const SQLite::Column column = statement.getColumn(i);
+        if (column.isInteger()) {
+          record.emplace(column.getName(), static_cast<Json::Int64>(column.getInt64()));
+        } else {
+          record.emplace(column.getName(), column.getText());
+        }
+      }
+      records.push_back(std::move(record));
+    }
+  });
+}
+
+void SelectWithSoci(benchmark::State& state) {
+  SociSession session(DatabaseOf(kRows));
+  FillRecords(state,
+              [&session](std::vector<Record>& records) { session.Select(kSelect, records); });
+}
+
+}  // namespace
+
+void RegisterSelect() {
+  const auto measure = [](const char* contestant, void (*run)(benchmark::State&)) {
+    Register("SelectRecords", "20,000 rows", contestant, run)->Unit(benchmark::kMillisecond);
+  };
+  measure(kLibrary, SelectWithLibrary);
+  measure(kLimit, SelectByHand);
+  measure("SQLiteCpp", SelectWithSqliteCpp);
+  measure("SOCI", SelectWithSoci);
+}
+
+}  // namespace bench

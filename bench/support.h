@@ -1,0 +1,64 @@
+// What all benchmarks share: how they are named and registered, where their files lie, and how a
+// result is held against another one.
+
+#ifndef KELODRCORE_BENCH_SUPPORT_H_
+#define KELODRCORE_BENCH_SUPPORT_H_
+
+#include <benchmark/benchmark.h>
+#include <json/json.h>
+
+#include <functional>
+#include <string>
+
+namespace bench {
+
+// The two contestants that every operation has; peers go by their own names. The limit makes the
+// system and library calls that the work itself needs, written by hand.
+inline constexpr char kLibrary[] = "kelodrcore";
+inline constexpr char kLimit[] = "limit";
+
+// Registers "OPERATION/WORK/CONTESTANT". The table of ratios and the curves are made from these
+// names, so no part contains a slash.
+benchmark::internal::Benchmark* Register(const std::string& operation, const std::string& work,
+                                         const std::string& contestant,
+                                         const std::function<void(benchmark::State&)>& run);
+
+// Ends the program when contestants do not do the same work.
+void Require(bool condition, const std::string& what);
+
+// A file in a directory of this run, which is removed at its end.
+std::string ScratchPath(const std::string& name);
+
+std::string ReadWhole(const std::string& path);
+void WriteWhole(const std::string& path, const std::string& text);
+
+// "16 B", "4 KiB", "1 MiB"
+std::string SizeName(size_t bytes);
+
+// The JSON text of about `size` bytes of a list of nodes: texts, numbers, truths, nested objects.
+std::string NodesDocument(size_t size);
+
+// JsonCpp's own reader on a buffer.
+bool ParseWithJsonCpp(const std::string& text, Json::Value& value);
+
+// JsonCpp's own writer into a buffer, with UTF-8 as it is, on one line.
+std::string WriteWithJsonCpp(const Json::Value& value);
+
+// The writer that JsonCpp calls fast: it builds the text without a stream. It is deprecated, and
+// escapes everything that is not ASCII, so that its text is another one.
+std::string WriteFastWithJsonCpp(const Json::Value& value);
+
+void RegisterCache();
+void RegisterCommand();
+void RegisterFile();
+void RegisterFileLock();
+void RegisterInsert();
+void RegisterJson();
+void RegisterMessages();
+void RegisterProcessGrowth();
+void RegisterSelect();
+void RegisterSqlGrowth();
+
+}  // namespace bench
+
+#endif  // KELODRCORE_BENCH_SUPPORT_H_

@@ -1,0 +1,51 @@
+#!/bin/bash
+# Installs what is missing, builds the benchmarks, runs them, and prints one table of ratios.
+#
+# usage: scripts/bench.sh [--docs] [PATTERN]   the benchmarks whose names match; all without one
+#        scripts/bench.sh --once               each benchmark once, only to see that it works
+#
+# The measurements go to build/bench/results, a JSON file for each comparison. --docs also writes
+# the table and the curves into docs.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+mode=table
+case ${1:-} in
+  --once | --docs) mode=${1#--}; shift ;;
+esac
+pattern=${1:-.}
+bench=build/bench/bench/kelodrcore_bench
+results=build/bench/results
+
+scripts/setup.sh build bench
+cmake --preset bench
+cmake --build --preset bench
+
+if [ "$mode" = once ]; then
+  # Without the largest rows and values, which take minutes.
+  "$bench" --benchmark_min_time=0.001 '--benchmark_filter=-^growth.*/(1[0]{5,6}|1[0-9]{7}|67108864)/'
+  exit
+fi
+
+# The contestants of one comparison run in one process, their repetitions in random turns: what the
+# machine does besides strikes all of them alike.
+compare() {
+  local repetitions=15
+  case $1 in growth*) repetitions=3 ;; esac
+  echo "bench.sh: $1" >&2
+  "$bench" "--benchmark_filter=^$1/" --benchmark_min_time=0.05 \
+    --benchmark_repetitions=$repetitions --benchmark_enable_random_interleaving \
+    "--benchmark_out=$results/${1//[^[:alnum:]]/_}.json" >"$results/log" 2>&1 ||
+    { cat "$results/log" >&2; return 1; }
+}
+
+rm -rf "$results"
+mkdir -p "$results"
+"$bench" --benchmark_list_tests | cut -d/ -f1,2 | awk '!seen[$0]++' | grep -E -- "$pattern" |
+  while read -r comparison; do compare "$comparison" </dev/null; done
+
+if [ "$mode" = docs ]; then
+  bench/report.py "$results" docs
+else
+  bench/report.py "$results"
+fi
