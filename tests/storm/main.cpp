@@ -29,7 +29,7 @@ struct Kind {
 const std::map<std::string, Kind> kKinds = {
     {"operations", {RandomOperations, {"", 8, 3, 0, 1}}},
     {"holders", {KilledHolders, {"", 8, 0, 100, 1}}},
-    {"expiries", {Expiries, {"", 20, 0, 3, 1}}},
+    {"expiries", {Expiries, {"", 50, 0, 4, 1}}},
     {"readers", {Readers, {"", 5, 0, 50000, 1}}},
 };
 

@@ -1,5 +1,6 @@
 #include "storm/storm.h"
 
+#include <sys/prctl.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -81,6 +82,7 @@ void Workers::Start(size_t worker) {
   fflush(nullptr);
   pids[worker] = fork();
   if (pids[worker] != 0) return;
+  prctl(PR_SET_PDEATHSIG, SIGKILL);  // a storm that is broken off leaves nobody behind
   body(static_cast<int>(worker), lives[worker]);
   _exit(0);
 }
