@@ -1,5 +1,5 @@
 #!/bin/bash
-# The long storms, ten minutes in all. Each prints a line of figures; the first that finds
+# The long storms, five minutes in all. Each prints a line of figures; the first that finds
 # anything wrong ends it.
 #
 # usage: scripts/storm.sh [SEED]       1 without one

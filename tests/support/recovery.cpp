@@ -18,15 +18,9 @@ namespace {
 [[maybe_unused]] const bool inMemory =
     access("/dev/shm", W_OK | X_OK) == 0 && setenv("TMPDIR", "/dev/shm", 0) == 0;
 
-#ifdef __SANITIZE_ADDRESS__
-constexpr int kThinning = 6;  // a fork costs ten times as much
-#else
-constexpr int kThinning = 1;
-#endif
-
 Sample StepsOf(const Sample& sample) {
   if (getenv("KELODR_EVERY_PAIR") != nullptr) return {1, 1};
-  return {sample.first * kThinning, sample.second};
+  return {sample.first * KELODR_THINNING, sample.second};
 }
 
 }  // namespace

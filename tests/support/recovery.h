@@ -17,9 +17,9 @@ struct Sample {
 
 // Kills `first` and then `second` at pairs of their instants and runs `check` after each pair;
 // `prepare` runs before it. The second one's instants start elsewhere for each of the first one's,
-// so that neighbours differ. With KELODR_EVERY_PAIR in the environment every pair is taken, under
-// AddressSanitizer fewer than the sample. Returns how many pairs there were. Only process 0 of
-// either is killed.
+// so that neighbours differ. With KELODR_EVERY_PAIR in the environment every pair is taken, in
+// builds whose processes fork slowly fewer than the sample. Returns how many pairs there were. Only
+// process 0 of either is killed.
 int SweepPairs(const Sample& sample, const std::function<void()>& prepare,
                const std::function<void()>& first, const std::function<void()>& second,
                const std::function<void(const Tracer::Moment&)>& check);
