@@ -2,6 +2,7 @@
 // the _exit here writes it first. The library and the test program are counted apart, and each
 // hands in how its own counts are written (coverage_hook.cpp).
 
+#include <sys/resource.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -10,6 +11,14 @@ namespace {
 constexpr int kMaxDumps = 8;
 void (*dumps[kMaxDumps])();
 int count = 0;
+
+// The limits of a test are not meant for the counts.
+void LiftLimits() {
+  const rlimit files{64, 64};
+  const rlimit size{RLIM_INFINITY, RLIM_INFINITY};
+  setrlimit(RLIMIT_NOFILE, &files);
+  setrlimit(RLIMIT_FSIZE, &size);
+}
 
 }  // namespace
 
@@ -23,6 +32,7 @@ void KelodrDumpAtExit(void (*dump)()) {
 }
 
 void _exit(int status) {
+  LiftLimits();
   if (KelodrSuspendFaults != nullptr) KelodrSuspendFaults();
   while (count > 0) dumps[--count]();
   for (;;) syscall(SYS_exit_group, status);
