@@ -292,7 +292,7 @@ bool ReadProcStat(int pid, ProcStat* stat) {
       sscanf(nameEnd + 1,
              " %c %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %d %*s %llu",
              &stat->state, &stat->threads, &startTime) != 3) {
-    errno = ENOENT;
+    errno = ENOENT;  // not what proc(5) describes: no kernel of the tests
     return false;
   }
   stat->startTime = startTime;

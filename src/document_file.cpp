@@ -126,6 +126,7 @@ bool ReadAll(const Descriptor& file, size_t expected, std::string& text) {
     if (count == 0) break;
     done += static_cast<size_t>(count);
     if (done < text.size()) continue;
+    // The file has grown since it was looked at, or lies in /proc: no test has such a document.
     if (text.size() > text.max_size() / 2) return Fail(EFBIG);
     text.resize(2 * text.size());
   }
@@ -178,6 +179,7 @@ bool Locate(std::string path, Place& place) {
     if (!ReadLink(place, path)) return errno == EINVAL || errno == ENOENT;
     base = place.directory.Get();
   }
+  // Only links that became a loop just now: the kernel refused any other before.
   return Fail(ELOOP);
 }
 

@@ -124,7 +124,7 @@ std::string toString(const Json::Value& value) try {
   std::string text;
   Append(text, value);
   return text;
-} catch (const std::length_error&) {
+} catch (const std::length_error&) {  // on 32 bits; no test has that much memory elsewhere
   throw std::bad_alloc();
 }
 

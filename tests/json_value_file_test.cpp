@@ -298,6 +298,13 @@ void WaitUntilClosed(const std::string& path, int times) {
 }
 
 // The temporary of a living writer is locked; here the test is that writer.
+TEST_F(JsonValueFileTest, TheTemporaryOfALongNameThatIsNoUtf8KeepsItsFirstByte) {
+  const std::string name(120, '\x80');
+  WriteText(Path(TemporaryOf("\x80")), "half");
+  ASSERT_TRUE(toFile(Document("x"), Path(name)));
+  EXPECT_EQ(NamesIn(dir), Names{name});
+}
+
 TEST_F(JsonValueFileTest, TheTemporaryOfALivingWriterIsWaitedFor) {
   WriteText(Path(TemporaryOf("a")), "half");
   const int held = open(Path(TemporaryOf("a")).c_str(), O_RDONLY | O_CLOEXEC);

@@ -255,6 +255,13 @@ TEST_F(JsonValueTest, ReadsValuesOfEveryType) {
   EXPECT_EQ(Parsed(R"({"a":[1,{}]})")["a"].size(), 2U);
 }
 
+TEST_F(JsonValueTest, ReadsEscapesAtEachBoundOfTheUtf8Lengths) {
+  EXPECT_EQ(Parsed(R"("\u007f\u0080")"), Json::Value("\x7F\xC2\x80"));
+  EXPECT_EQ(Parsed(R"("\u07ff\u0800")"), Json::Value("\xDF\xBF\xE0\xA0\x80"));
+  EXPECT_EQ(Parsed(R"("\uffff\ud800\udc00")"), Json::Value("\xEF\xBF\xBF\xF0\x90\x80\x80"));
+  EXPECT_EQ(Parsed(R"("\udbff\udfff")"), Json::Value("\xF4\x8F\xBF\xBF"));
+}
+
 TEST_F(JsonValueTest, ReplacesWhatTheValueHeldCommentsIncluded) {
   Json::Value value;
   value["old"] = 1;

@@ -122,6 +122,16 @@ TYPED_TEST(AnyCommandTest, TheTableIsCopied) {
   EXPECT_EQ(command.GetTable().columnDefs, "");
 }
 
+TYPED_TEST(AnyCommandTest, ACopyKeepsTheTableWhateverBecomesOfTheOriginal) {
+  auto command = OnTable<TypeParam>("first");
+  const TypeParam copy = command;
+  TypeParam assigned;
+  assigned = command;
+  EXPECT_TRUE(command.SetTable(SqliteTableHandler("second", "")));
+  EXPECT_EQ(copy.GetTable().tableName, "first");
+  EXPECT_EQ(assigned.GetTable().tableName, "first");
+}
+
 TYPED_TEST(AnyCommandTest, TheDumpStartsWithTheTableAndAClosingBracket) {
   const auto command = OnTable<TypeParam>("a b");
   EXPECT_EQ(command.ToStr(), "a b]" + Dump(command));
