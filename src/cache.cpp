@@ -10,6 +10,7 @@
 #include <climits>
 #include <cstring>
 #include <ctime>
+#include <new>
 #include <utility>
 
 #include "kelodrcore/file.h"
@@ -28,6 +29,8 @@ const char kFallbackPath[] = "/tmp/default_dr_cache";
 // behind stops every update until its process ends.
 constexpr unsigned int kLockTimeout = 5;
 constexpr unsigned int kReleaseTimeout = 60;
+
+constexpr int kRemoveAttempts = 3;
 
 // Flags of KLIBCProcForkEx: nobody's zombie, in a session of its own, streams on /dev/null.
 constexpr int kDetached = 1 | 64;
@@ -58,8 +61,8 @@ time_t ModificationTime(const std::string& path) {
 int ModificationStamp(const std::string& path) { return static_cast<int>(ModificationTime(path)); }
 
 // The caller holds the lock, shared or exclusive.
-bool IsClaimed(const std::string& path) {
-  const int pid = KLIBCReadPidFile(PidFile(path).c_str());
+bool IsClaimed(const std::string& pidFile) {
+  const int pid = KLIBCReadPidFile(pidFile.c_str());
   return pid > 0 && KLIBCProcAlive(pid) == 1;
 }
 
@@ -67,7 +70,24 @@ bool IsClaimed(const std::string& path) {
 // is closed on return, so that no forked child inherits it.
 bool IsBusy(const std::string& path) {
   FileLock lock(LockName(path));
-  return !lock.lock(LOCK_SH | LOCK_NB, kLockTimeout) || IsClaimed(path);
+  return !lock.lock(LOCK_SH | LOCK_NB, kLockTimeout) || IsClaimed(PidFile(path));
+}
+
+bool LockToRelease(FileLock& lock) {
+  try {
+    return lock.lock(LOCK_EX | LOCK_NB, kReleaseTimeout);
+  } catch (const std::bad_alloc&) {
+    return false;
+  }
+}
+
+// What stays behind stops every update while this process lives: one failure is not the last word.
+int RemovePidFile(const std::string& pidFile) {
+  int ret = unlink(pidFile.c_str());
+  for (int attempt = 1; ret != 0 && errno != ENOENT && attempt < kRemoveAttempts; ++attempt) {
+    ret = unlink(pidFile.c_str());
+  }
+  return ret;
 }
 
 bool CreatePidFile(const std::string& path) {
@@ -183,15 +203,18 @@ bool Cache::UpdateInBackground() const {
 }
 
 bool Cache::UpdateUnderClaim() const {
+  // What releases the claim is made before it: the release must not fail for want of memory.
+  const std::string pidFile = PidFile(path);
+  FileLock lock(LockName(path));
   if (!SetUpdating()) return false;
   bool updated = false;
   try {
     updated = DoUpdate();
   } catch (...) {
-    UnsetUpdating();
+    UnsetUpdating(pidFile, lock);
     throw;
   }
-  UnsetUpdating();
+  UnsetUpdating(pidFile, lock);
   return updated;
 }
 
@@ -212,7 +235,7 @@ bool Cache::SetUpdating() const {
     return false;
   }
   // Another process may have claimed the update between the look above and the lock.
-  if (IsClaimed(path)) {
+  if (IsClaimed(PidFile(path))) {
     KELODR_LOG(DEBUG, __func__, "there is other process to update cache [%s]", path.c_str());
     return false;
   }
@@ -224,15 +247,14 @@ bool Cache::SetUpdating() const {
   return true;
 }
 
-void Cache::UnsetUpdating() const {
-  const std::string pidFile = PidFile(path);
-  FileLock lock(LockName(path));
-  if (!lock.lock(LOCK_EX | LOCK_NB, kReleaseTimeout)) {
+void Cache::UnsetUpdating(const std::string& pidFile, FileLock& lock) const {
+  if (!LockToRelease(lock)) {
     KELODR_LOG(NOTICE, __func__, "Failed to lock to unset cache[%s]", path.c_str());
   }
-  if (IsClaimed(path)) {
+  if (IsClaimed(pidFile)) {
     const int pid = KLIBCReadPidFile(pidFile.c_str());
-    if (pid != getpid()) {
+    // A pid file that can no longer be read is removed: it would name this process while it lives.
+    if (pid > 0 && pid != getpid()) {
       KELODR_LOG(DEBUG, __func__, "Failed to unset updating cache [%s] since different pid[%d]",
                  pidFile.c_str(), pid);
       return;
@@ -240,7 +262,7 @@ void Cache::UnsetUpdating() const {
   }
   {
     KELODR_PRIVILEGED();
-    const int ret = unlink(pidFile.c_str());
+    const int ret = RemovePidFile(pidFile);
     if (ret != 0) {
       KELODR_LOG(NOTICE, __func__, "Failed to unlink [%s] with ret[%d](%s)", pidFile.c_str(), ret,
                  strerror(errno));

@@ -12,6 +12,8 @@
 
 namespace KeloDRCore {
 
+class FileLock;
+
 /// A cached JSON document: read by every process, refreshed by one at a time.
 ///
 /// A subclass tells how fresh data is fetched and judged. This class keeps the file, answers from
@@ -120,7 +122,7 @@ class KELODR_EXPORT Cache {
   KELODR_LOCAL bool UpdateUnderClaim() const;
   KELODR_LOCAL void WaitForUpdate() const;
   KELODR_LOCAL bool SetUpdating() const;
-  KELODR_LOCAL void UnsetUpdating() const;
+  KELODR_LOCAL void UnsetUpdating(const std::string& pidFile, FileLock& lock) const;
   KELODR_LOCAL Json::Value MakeDocument(const Json::Value& data, long long begin,
                                         long long finish) const;
 
