@@ -54,8 +54,9 @@ class Suspension {
 // What a run came to.
 struct Outcome {
   bool succeeded;
-  bool threw;                       // std::bad_alloc came out
-  int error;                        // the error of the plan, 0 when nothing was to fail
+  bool threw;  // std::bad_alloc came out
+  int error;   // the error of the plan, 0 when nothing was to fail
+  int failures;
   std::vector<std::string> failed;  // the calls that failed, see FailedCalls()
   std::vector<LogLine> log;         // everything logged
 
@@ -82,6 +83,9 @@ class FaultTest : public CleanTest {
 
   void SweepCalls(const Fault::Operation& operation);
   void SweepMemory(const Fault::Operation& operation);
+
+  // Whether JsonCpp's own exception may come out where it finds no memory.
+  bool mayThrowJsonError = false;
 
   // How many calls fail "for good"; less where the operation waits until they no longer do.
   int forGood = Fault::kForGood;

@@ -1,0 +1,214 @@
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <memory>
+
+#include "kelodrcore/file_lock.h"
+#include "kelodrcore/json_value.h"
+#include "support/fault.h"
+#include "support/process.h"
+#include "support/test_cache.h"
+
+namespace JsonValue = KeloDRCore::JsonValue;
+using Fault::Outcome;
+using KeloDRCore::FileLock;
+
+namespace {
+
+constexpr long kTimeout = 1000;
+constexpr char kOld[] = R"({"cached_data":"old","max_updated_time":7})";
+
+class CacheFaultTest : public FaultTest {
+ protected:
+  void SetUp() override {
+    if (!IsRoot()) GTEST_SKIP() << "needs root";
+    FaultTest::SetUp();
+    cacheDir = Path("caches");
+    path = cacheDir + "/c.cached";
+    // A wait for an updater lasts as long as the failures, which therefore end, but not before the
+    // longest wait for a lock (a minute) has.
+    forGood = 1500;
+    mayThrowJsonError = true;
+  }
+  void TearDown() override {
+    const std::filesystem::path lock = FileLock::getLockFilePath(path + ".lock");
+    std::filesystem::remove_all(lock.parent_path());
+    FaultTest::TearDown();
+  }
+
+  // A cache that is in memory and, unless it is to be fresh, too old in its file.
+  void MakeCache(bool alwaysRequired, bool isFresh);
+  void WriteOld(bool isFresh) const;
+
+  // What the file holds, "old" or "new"; anything else is a failure.
+  std::string Document() const;
+  void CheckState(const Outcome& outcome) const;
+
+  std::string cacheDir;
+  std::string path;
+  std::unique_ptr<TestCache> cache;
+};
+
+void CacheFaultTest::WriteOld(bool isFresh) const {
+  WriteText(path, kOld);
+  const time_t modified = time(nullptr) - (isFresh ? 0 : 2 * kTimeout);
+  const timespec times[2] = {{modified, 0}, {modified, 0}};
+  EXPECT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
+}
+
+void CacheFaultTest::MakeCache(bool alwaysRequired, bool isFresh) {
+  std::filesystem::remove_all(cacheDir);
+  std::filesystem::create_directory(cacheDir);  // faster than the cache, which runs a program
+  cache = std::make_unique<TestCache>(cacheDir, "c", kTimeout, alwaysRequired, 0);
+  cache->fetch = [](Json::Value& out) {
+    const Fault::Suspension suspension;
+    out = "new";
+    return true;
+  };
+  WriteOld(isFresh);
+  EXPECT_EQ(cache->GetCachedData(), "old");
+}
+
+std::string CacheFaultTest::Document() const {
+  Json::Value document;
+  EXPECT_TRUE(JsonValue::fromFile(document, path)) << ReadText(path);
+  const std::string data = document["cached_data"].asString();
+  EXPECT_TRUE(data == "old" || (data == "new" && document["max_updated_time"].isInt())) << data;
+  return data;
+}
+
+// The document is whole, and nothing of an update stays: no lock, no claim, no temporary, unless
+// its removal itself failed, again and again.
+void CacheFaultTest::CheckState(const Outcome& outcome) const {
+  Document();
+  FileLock lock(path + ".lock");
+  EXPECT_TRUE(lock.tryLock(LOCK_EX | LOCK_NB));
+  const bool pidFileKept =
+      outcome.Failed("unlink") && (outcome.failures >= 3 || ReadText(path + ".pid").empty());
+  const bool temporaryKept = outcome.Failed("unlinkat") || outcome.Failed("flock");
+  for (const std::string& name : NamesIn(cacheDir)) {
+    EXPECT_TRUE(name == "c.cached" || (pidFileKept && name == "c.cached.pid") ||
+                (temporaryKept && name == ".c.cached.kelodr-0"))
+        << name;
+  }
+  // It names this process, which would wait for itself.
+  unlink((path + ".pid").c_str());
+}
+
+}  // namespace
+
+TEST_F(CacheFaultTest, ACacheHasItsPathOrTheFallback) {
+  const auto prepare = [this] { std::filesystem::remove_all(cacheDir); };
+  const auto run = [this] {
+    const TestCache made(cacheDir, "c", kTimeout, false, 0);
+    return true;
+  };
+  const auto check = [this](const Outcome& outcome) {
+    const LogLine told = Err("cache.cpp", "GetCachedPath", "Failed to create [" + cacheDir + "]");
+    const bool isTold = std::count(outcome.log.begin(), outcome.log.end(), told) == 1;
+    const bool isThere = std::filesystem::is_directory(cacheDir);
+    EXPECT_TRUE(isThere || isTold || outcome.threw);
+  };
+  SweepCalls({prepare, run, check});
+  SweepMemory({prepare, run, check});
+}
+
+TEST_F(CacheFaultTest, AReadGivesTheDocumentOrTheDefault) {
+  Json::Value read;
+  const auto prepare = [this] {
+    MakeCache(false, true);
+    cache = std::make_unique<TestCache>(cacheDir, "c", kTimeout, false, 0);
+    cache->defaultValue = "default";
+  };
+  const auto run = [&] {
+    read = cache->GetCachedData();
+    return true;
+  };
+  const auto check = [&](const Outcome& outcome) {
+    EXPECT_TRUE(outcome.threw || read == "old" || (read == "default" && !outcome.log.empty()));
+    EXPECT_TRUE(!outcome.failed.empty() || read == "old");
+    CheckState(outcome);
+  };
+  SweepCalls({prepare, run, check});
+  SweepMemory({prepare, run, check});
+}
+
+TEST_F(CacheFaultTest, AnUpdateIsMadeOrFails) {
+  const auto prepare = [this] { MakeCache(true, false); };
+  const auto run = [this] {
+    {
+      const Fault::Suspension suspension;
+      WriteOld(false);
+    }
+    return cache->Update();
+  };
+  const auto check = [this](const Outcome& outcome) {
+    // An updater that could not be told apart from none is waited for, and then there is no news.
+    const bool waited = std::any_of(
+        outcome.log.begin(), outcome.log.end(),
+        [](const LogLine& line) { return line.message.find("start to block wait cache") == 0; });
+    EXPECT_TRUE(!outcome.succeeded || waited || Document() == "new");
+    CheckState(outcome);
+  };
+  SweepCalls({prepare, run, check});
+  SweepMemory({prepare, run, check});
+}
+
+TEST_F(CacheFaultTest, AWriteIsMadeOrTold) {
+  const auto prepare = [this] { MakeCache(true, false); };
+  const auto run = [this] { return cache->UpdateWithData("new"); };
+  const auto check = [this](const Outcome& outcome) {
+    EXPECT_TRUE(!outcome.succeeded || Document() == "new");
+    EXPECT_EQ(outcome.log.empty(), outcome.succeeded || outcome.threw);
+    CheckState(outcome);
+  };
+  SweepCalls({prepare, run, check});
+  SweepMemory({prepare, run, check});
+}
+
+// The refresher holds the write end until it has ended.
+TEST_F(CacheFaultTest, ARefreshInTheBackgroundLeavesTheOldOrTheNewDocument) {
+  const auto prepare = [this] { MakeCache(false, false); };
+  const auto run = [this] {
+    int life[2];
+    {
+      const Fault::Suspension suspension;
+      WriteOld(false);
+      EXPECT_EQ(pipe2(life, O_CLOEXEC), 0);
+    }
+    const auto wait = [](const int* ends) {
+      const Fault::Suspension suspension;
+      close(ends[1]);
+      char byte = 0;
+      EXPECT_EQ(read(ends[0], &byte, 1), 0);
+      close(ends[0]);
+    };
+    const std::unique_ptr<int, decltype(wait)> waitAtEnd(life, wait);
+    return cache->Update();
+  };
+  const auto check = [this](const Outcome& outcome) {
+    EXPECT_TRUE(!outcome.failed.empty() || Document() == "new");
+    CheckState(outcome);
+  };
+  SweepCalls({prepare, run, check});
+  SweepMemory({prepare, run, check});
+}
+
+TEST_F(CacheFaultTest, ARemovalAnswersWhatUnlinkDid) {
+  const auto prepare = [this] { MakeCache(false, true); };
+  const auto run = [this] {
+    {
+      const Fault::Suspension suspension;
+      WriteOld(true);
+    }
+    return cache->Remove() == 0;
+  };
+  const auto check = [this](const Outcome& outcome) {
+    EXPECT_EQ(access(path.c_str(), F_OK) == 0, !outcome.succeeded);
+  };
+  SweepCalls({prepare, run, check});
+}
