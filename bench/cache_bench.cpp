@@ -1,10 +1,5 @@
 // Cache::Read while the file is fresh: the answer comes from memory.
 
-#include <sys/stat.h>
-#include <unistd.h>
-
-#include <ctime>
-
 #include "contenders.h"
 #include "kelodrcore/cache.h"
 #include "support.h"
@@ -23,7 +18,9 @@ void Measure(size_t size) {
     for (auto _ : state) benchmark::DoNotOptimize(cache.Read());
   });
   Register("Cache::Read", work, kLimit, [=](benchmark::State& state) {
-    const CacheByHand cache(ScratchPath("cache/" + name + ".by_hand"), data);
+    const std::string path = ScratchPath(name + ".by_hand");
+    WriteWhole(path, WriteWithJsonCpp(data));
+    const CacheByHand cache(path, data);
     Require(cache.Read() == data, "the documents differ");
     for (auto _ : state) benchmark::DoNotOptimize(cache.Read());
   });

@@ -13,8 +13,7 @@ namespace bench {
 
 CacheByHand::CacheByHand(const std::string& file, const Json::Value& document)
     : path(file), data(document), loaded(-1) {
-  WriteWhole(path, WriteWithJsonCpp(document));
-  Look(loaded);
+  Require(Look(loaded), "there is no file " + path);
 }
 
 bool CacheByHand::Look(time_t& modified) const {

@@ -23,7 +23,7 @@ class DocumentCache : public KeloDRCore::Cache {
   bool IsValidData(const Json::Value& data) const override { return data.isArray(); }
 };
 
-// The system calls of a fresh read, and one copy of the document.
+// The system calls of a fresh read, and one copy of the document, which the file is taken to hold.
 class CacheByHand {
  public:
   CacheByHand(const std::string& path, const Json::Value& document);

@@ -2,19 +2,28 @@
 
 #include <utility>
 
+#include "field_setter.h"
 #include "kelodrcore/container.h"
 #include "log.h"
 
 namespace KeloDRCore {
 namespace {
 
-bool AddField(SqliteValueList& list, const std::string& field, SqliteValue&& value) {
-  if (field.empty() || !value.IsValid()) {
+template <typename T>
+constexpr bool IsNull(const T& /*value*/) {
+  return false;
+}
+bool IsNull(const char* value) { return value == nullptr; }
+
+template <typename T>
+bool AddField(SqliteValueList& list, const std::string& field, const T& value) {
+  if (field.empty() || IsNull(value)) {
     KELODR_LOG(ERR, "AddFieldValue", "Bad Field [%s] /value[%s]", field.c_str(),
-               value.ToFormatedValue().c_str());
+               SqliteValue(value).ToFormatedValue().c_str());
     return false;
   }
-  return list.AddValue(field, std::move(value));
+  FieldSetter::Set(list, field, value);
+  return true;
 }
 
 // Checks the condition; what its text means to the command stays with the command.
@@ -37,6 +46,25 @@ void AppendAssignments(std::string& text, const SqliteValueList& list) {
     text += '=';
     value.AppendFormatedValue(text);
   }
+}
+
+// None of the names is empty.
+void AppendNames(std::string& text, const std::vector<std::string>& names) {
+  bool isFirst = true;
+  for (const std::string& name : names) {
+    if (!isFirst) text += ',';
+    isFirst = false;
+    text += name;
+  }
+}
+
+// Room for a statement, so that most are built without growing.
+constexpr size_t kFixedRoom = 64;
+constexpr size_t kFieldRoom = 40;
+constexpr size_t kNameRoom = 16;
+
+void Reserve(std::string& text, const SqliteValueList& list) {
+  text.reserve(kFixedRoom + kFieldRoom * list.GetValues().size());
 }
 
 void AppendWhere(std::string& text, const std::string& condition) {
@@ -101,7 +129,9 @@ std::string InsertCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad insert parameter");
     return "";
   }
-  std::string text = replacable ? "INSERT OR REPLACE INTO " : "INSERT INTO ";
+  std::string text;
+  Reserve(text, fieldValues);
+  text += replacable ? "INSERT OR REPLACE INTO " : "INSERT INTO ";
   text.append(GetTable().tableName) += ' ';
   AppendInsertValues(text, fieldValues);
   text += ';';
@@ -122,11 +152,11 @@ void InsertCommand::SetReplacable(bool isReplacable) { replacable = isReplacable
 
 template <typename T, typename>
 bool InsertCommand::AddFieldValue(const std::string& field, const T& value) {
-  return AddField(fieldValues, field, SqliteValue(value));
+  return AddField(fieldValues, field, value);
 }
 
 bool InsertCommand::AddFieldValue(const std::string& field, const char* value) {
-  return AddField(fieldValues, field, SqliteValue(value));
+  return AddField(fieldValues, field, value);
 }
 
 UpdateCommand::UpdateCommand() = default;
@@ -140,7 +170,9 @@ std::string UpdateCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad update command");
     return "";
   }
-  std::string text = "UPDATE ";
+  std::string text;
+  Reserve(text, fieldValues);
+  text += "UPDATE ";
   text.append(GetTable().tableName).append(" SET ");
   AppendAssignments(text, fieldValues);
   AppendWhere(text, condition);
@@ -156,11 +188,11 @@ void UpdateCommand::SetFieldValues(const SqliteValueList& list) { fieldValues = 
 
 template <typename T, typename>
 bool UpdateCommand::AddFieldValue(const std::string& field, const T& value) {
-  return AddField(fieldValues, field, SqliteValue(value));
+  return AddField(fieldValues, field, value);
 }
 
 bool UpdateCommand::AddFieldValue(const std::string& field, const char* value) {
-  return AddField(fieldValues, field, SqliteValue(value));
+  return AddField(fieldValues, field, value);
 }
 
 bool UpdateCommand::SetCondition(const std::string& text) {
@@ -184,16 +216,20 @@ std::string SelectCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad select command");
     return "";
   }
-  std::string text = "SELECT ";
+  std::string text;
+  text.reserve(kFixedRoom + kNameRoom * fields.size());
+  text += "SELECT ";
   if (!fields.empty()) {
-    text.append(Container::ToString(fields, ",")) += ' ';
+    AppendNames(text, fields);
+    text += ' ';
   } else if (selectAll) {
     text += " * ";  // two blanks in front of the asterisk, as readers of the statements expect it
   }
   text.append("FROM ").append(GetTable().tableName);
   AppendWhere(text, condition);
   if (!orderFields.empty()) {
-    text.append(" ORDER BY ").append(Container::ToString(orderFields, ","));
+    text += " ORDER BY ";
+    AppendNames(text, orderFields);
     text += orderByASC ? " ASC" : " DESC";
   }
   if (limit >= 1) {

@@ -4,8 +4,10 @@
 
 #include <memory>
 #include <new>
+#include <optional>
 #include <utility>
 
+#include "field_setter.h"
 #include "kelocore.h"
 #include "kelodrcore/err.h"
 #include "kelodrcore/json_value.h"
@@ -51,32 +53,57 @@ const char* ColumnText(sqlite3_stmt* stmt, int column) {
   return OrEmpty(text);
 }
 
-void AddColumn(sqlite3_stmt* stmt, int column, SqliteValueList& record, const char* function) {
-  const char* const name = OrEmpty(sqlite3_column_name(stmt, column));
-  const int type = sqlite3_column_type(stmt, column);
-  switch (type) {
-    case SQLITE_INTEGER:
-      record.AddValue(name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
-      break;
-    case SQLITE_TEXT:
-      record.AddValue(name, ColumnText(stmt, column));
-      break;
-    case SQLITE_NULL:
-      KELODR_LOG(WARN, function, "field [%s] has null value", name);
-      break;
-    default:
-      KELODR_LOG(WARN, function, "Not supported type [%d] with field [%s]", type, name);
-  }
-}
-
-SqliteValueList ParseRecord(sqlite3_stmt* stmt, const char* function) {
-  return ThrowOnlyBadAlloc([&] {
-    SqliteValueList record;
+// Turns the rows of one statement into records. Made at a row: before the first one the statement
+// may still be prepared anew, with other columns.
+class RowReader {
+ public:
+  RowReader(sqlite3_stmt* statement, const char* operation) : stmt(statement), function(operation) {
     const int columns = sqlite3_column_count(stmt);
-    for (int column = 0; column < columns; ++column) AddColumn(stmt, column, record, function);
-    return record;
-  });
-}
+    names.reserve(static_cast<size_t>(columns));
+    for (int column = 0; column < columns; ++column) {
+      names.emplace_back(OrEmpty(sqlite3_column_name(stmt, column)));
+    }
+  }
+
+  // Fills a record that is empty.
+  void Read(SqliteValueList& record) const {
+    ThrowOnlyBadAlloc([&] {
+      int column = 0;
+      for (const std::string& name : names) AddColumn(record, name, column++);
+    });
+  }
+
+ private:
+  void AddColumn(SqliteValueList& record, const std::string& name, int column) const {
+    const int type = sqlite3_column_type(stmt, column);
+    switch (type) {
+      case SQLITE_INTEGER:
+        Add(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
+        break;
+      case SQLITE_TEXT:
+        Add(record, name, ColumnText(stmt, column));
+        break;
+      case SQLITE_NULL:
+        KELODR_LOG(WARN, function, "field [%s] has null value", name.c_str());
+        break;
+      default:
+        KELODR_LOG(WARN, function, "Not supported type [%d] with field [%s]", type, name.c_str());
+    }
+  }
+
+  template <typename Payload>
+  static void Add(SqliteValueList& record, const std::string& name, const Payload& payload) {
+    if (name.empty()) {
+      record.AddValue(name, payload);  // refuses and logs
+    } else {
+      FieldSetter::Set(record, name, payload);
+    }
+  }
+
+  sqlite3_stmt* stmt;
+  const char* function;
+  std::vector<std::string> names;
+};
 
 }  // namespace
 
@@ -124,7 +151,7 @@ bool SqliteDB::IsExisted() const { return KLIBCFileExist(dbPath.c_str()) == 1; }
 
 void SqliteDB::SetErr(int code) const {
   errCode = code;
-  errMsg = Json::Value();
+  if (!errMsg.isNull()) errMsg = Json::Value();
 }
 
 void SqliteDB::SetDBErr(int code, const char* msg) const {
@@ -170,15 +197,25 @@ bool SqliteDB::Select(const std::string& sql, const TakeRow& takeRow) {
 
 bool SqliteDB::SelectFirst(const std::string& sql, SqliteValueList& record, const char* function) {
   return Select(sql, [&](sqlite3_stmt* stmt) {
-    record = ParseRecord(stmt, function);
+    SqliteValueList row;
+    RowReader(stmt, function).Read(row);
+    record = std::move(row);
     return false;
   });
 }
 
 bool SqliteDB::SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
                          const char* function) {
+  std::optional<RowReader> reader;
   return Select(sql, [&](sqlite3_stmt* stmt) {
-    records.push_back(ParseRecord(stmt, function));
+    if (!reader) reader.emplace(stmt, function);
+    records.emplace_back();
+    try {
+      reader->Read(records.back());
+    } catch (...) {
+      records.pop_back();
+      throw;
+    }
     return true;
   });
 }
@@ -260,33 +297,42 @@ bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) 
   return true;
 }
 
-bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records) {
+// Selects many rows with `attempt`, in the name of SelectByCommand.
+template <typename Attempt>
+bool SqliteDB::SelectRows(const std::string& sql, const Attempt& attempt) {
+  const char* const function = "SelectByCommand";
   if (sql.empty()) {
     SetErr(ERR::BAD_PARAMETER);
-    KELODR_LOG(ERR, __func__, "%s", "Empty command to select records");
+    KELODR_LOG(ERR, function, "%s", "Empty command to select records");
     return false;
   }
   if (!Open()) {
-    KELODR_LOG(ERR, __func__, "Failed to open db [%s]", dbPath.c_str());
+    KELODR_LOG(ERR, function, "Failed to open db [%s]", dbPath.c_str());
     return false;
   }
   unsigned int retries = 0;
-  if (!Retry([&] { return SelectAll(sql, records, "SelectByCommand"); }, retries)) {
-    KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
+  if (!Retry(attempt, retries)) {
+    KELODR_LOG(ERR, function, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
                retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
     return false;
   }
   if (retries > 0) {
-    KELODR_LOG(INFO, __func__, "After retry [%u] times, success to select command", retries);
+    KELODR_LOG(INFO, function, "After retry [%u] times, success to select command", retries);
   }
   return true;
 }
 
+bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records) {
+  return SelectRows(sql, [&] { return SelectAll(sql, records, "SelectByCommand"); });
+}
+
 bool SqliteDB::IsTableExisted(const std::string& tableName) {
-  std::vector<SqliteValueList> rows;
-  SelectByCommand("SELECT 1 FROM sqlite_master WHERE type='table' AND name='" + tableName + "';",
-                  rows);
-  return !rows.empty();
+  const std::string sql =
+      "SELECT 1 FROM sqlite_master WHERE type='table' AND name='" + tableName + "';";
+  bool isFound = false;
+  const auto takeRow = [&isFound](sqlite3_stmt* /*stmt*/) { return isFound = true; };
+  SelectRows(sql, [&] { return Select(sql, takeRow); });
+  return isFound;
 }
 
 bool SqliteDB::GetCount(const SqliteTableHandler& table, int& count) {

@@ -19,20 +19,59 @@ Json::Value ToJson(unsigned long long number) {
   return Json::Value(static_cast<Json::UInt64>(number));
 }
 
-// Doubles each quote, byte for byte as a regular expression would; a pass over the bytes costs a
-// hundredth of it.
-void AppendQuoted(std::string& text, const char* begin, const char* end) {
-  const auto quotes = static_cast<size_t>(std::count(begin, end, '\''));
-  text.reserve(text.size() + static_cast<size_t>(end - begin) + quotes + 2);
-  text += '\'';
-  while (const void* found = std::memchr(begin, '\'', static_cast<size_t>(end - begin))) {
-    const char* const next = static_cast<const char*>(found) + 1;
-    text.append(begin, next);
-    text += '\'';
-    begin = next;
+// Quotes are rare when there is less than one in so many bytes.
+constexpr size_t kRare = 16;
+
+// In blocks whose count fits a byte, so that the compiler can take many bytes at a time.
+size_t CountQuotes(const char* at, const char* end) {
+  size_t count = 0;
+  while (at != end) {
+    const char* const stop = at + std::min<std::ptrdiff_t>(end - at, 255);
+    unsigned char inBlock = 0;
+    for (; at != stop; ++at) inBlock = static_cast<unsigned char>(inBlock + (*at == '\''));
+    count += inBlock;
   }
-  text.append(begin, end);
-  text += '\'';
+  return count;
+}
+
+// `out` has room for the result and one byte more. Run by run where quotes are rare, else byte by
+// byte without a branch.
+char* CopyDoublingQuotes(const char* at, const char* end, bool areRare, char* out) {
+  while (areRare) {
+    const void* const found = std::memchr(at, '\'', static_cast<size_t>(end - at));
+    if (found == nullptr) return std::copy(at, end, out);
+    const char* const next = static_cast<const char*>(found) + 1;
+    out = std::copy(at, next, out);
+    *out++ = '\'';
+    at = next;
+  }
+  for (; at != end; ++at) {
+    const char byte = *at;
+    out[0] = byte;
+    out[1] = '\'';
+    out += byte == '\'' ? 2 : 1;
+  }
+  return out;
+}
+
+// Doubles each quote, byte for byte as a regular expression would; two passes over the bytes cost a
+// fiftieth of it.
+void AppendQuoted(std::string& text, const char* begin, const char* end) {
+  const size_t quotes = CountQuotes(begin, end);
+  const auto length = static_cast<size_t>(end - begin);
+  if (quotes == 0) {
+    text.reserve(text.size() + length + 2);
+    text += '\'';
+    text.append(begin, length);
+    text += '\'';
+    return;
+  }
+  const size_t start = text.size();
+  text.resize(start + length + quotes + 2);
+  char* out = &text[start];
+  *out++ = '\'';
+  out = CopyDoublingQuotes(begin, end, quotes * kRare < length, out);
+  *out = '\'';
 }
 
 template <typename Integer>
@@ -176,7 +215,8 @@ bool SqliteValue::GetValue(T& out) const {
 
 SqliteValueList::SqliteValueList() = default;
 SqliteValueList::SqliteValueList(const SqliteValueList& other) = default;
-SqliteValueList::SqliteValueList(SqliteValueList&& other) noexcept = default;
+SqliteValueList::SqliteValueList(SqliteValueList&& other) noexcept
+    : values(std::move(other.values)) {}
 SqliteValueList::~SqliteValueList() = default;
 
 SqliteValueList& SqliteValueList::operator=(const SqliteValueList& other) {

@@ -171,6 +171,9 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
                               const char* function);
 
   template <typename Attempt>
+  KELODR_LOCAL bool SelectRows(const std::string& sql, const Attempt& attempt);
+
+  template <typename Attempt>
   KELODR_LOCAL bool Retry(const Attempt& attempt, unsigned int& retries);
 
   template <typename Rows>

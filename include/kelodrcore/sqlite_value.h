@@ -142,6 +142,8 @@ class KELODR_EXPORT SqliteValueList {
   [[nodiscard]] std::string ToStr() const;
 
  private:
+  friend class FieldSetter;
+
   SqliteValue nullValue;
   std::map<std::string, SqliteValue> values;
 };
