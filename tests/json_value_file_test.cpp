@@ -298,6 +298,19 @@ void WaitUntilClosed(const std::string& path, int times) {
 }
 
 // The temporary of a living writer is locked; here the test is that writer.
+TEST_F(JsonValueFileTest, NothingStaysOpenWhereTheStandardStreamsWereClosed) {
+  EXPECT_EQ(RunInChild([this] {
+              for (int fd = 0; fd < 3; ++fd) close(fd);
+              const bool written = toFile(Document("x"), Path("a"));
+              Json::Value value;
+              if (!written || !fromFile(value, Path("a"))) _exit(1);
+              for (int fd = 0; fd < 3; ++fd) {
+                if (fcntl(fd, F_GETFD) != -1) _exit(2);
+              }
+            }),
+            0);
+}
+
 TEST_F(JsonValueFileTest, TheTemporaryOfALongNameThatIsNoUtf8KeepsItsFirstByte) {
   const std::string name(120, '\x80');
   WriteText(Path(TemporaryOf("\x80")), "half");
