@@ -175,6 +175,27 @@ TEST_F(FileLockTest, TheFileStaysOpenUntilTheDestructor) {
   EXPECT_TRUE(IsFree());
 }
 
+TEST_F(FileLockTest, ARemovedFileIsMadeAnewWhenItIsOpenedAgain) {
+  FileLock lock(name);
+  ASSERT_TRUE(lock.openLockedFile());
+  ASSERT_EQ(unlink(path.c_str()), 0);
+  EXPECT_TRUE(lock.openLockedFile());
+  EXPECT_GE(DescriptorOf(path), 0);
+}
+
+TEST_F(FileLockTest, ARemovedFileIsClosedWhateverItsDescriptor) {
+  EXPECT_EQ(RunInChild([this] {
+              close(0);
+              FileLock lock(name);
+              ASSERT_TRUE(lock.openLockedFile());
+              ASSERT_EQ(DescriptorOf(path), 0);
+              ASSERT_EQ(unlink(path.c_str()), 0);
+              ASSERT_TRUE(lock.openLockedFile());
+              EXPECT_EQ(DescriptorOf(path), 0);
+            }),
+            0);
+}
+
 // --- taking and releasing ------------------------------------------------------------------------
 
 TEST_F(FileLockTest, AnExclusiveLockExcludesOtherProcesses) {
