@@ -17,7 +17,7 @@ included() {
          s/^validator /utils /; s/ kelo\(core\|random\)$/ platform/' |
     awk -v families="$(basename -s .cpp -a src/*.cpp) platform" '
       BEGIN { split(families, names, /[ \n]/); for (i in names) isFamily[names[i]] = 1 }
-      $1 != $2 && isFamily[$2] { print $1 " -> " $2 }' | sort -u
+      $1 != $2 && isFamily[$1] && isFamily[$2] { print $1 " -> " $2 }' | sort -u
 }
 
 diff --label docs/architecture.dot <(drawn) --label "the sources' includes" <(included)
