@@ -19,6 +19,9 @@ namespace {
 
 constexpr int kBusyTimeoutInMSec = 1000;
 
+// Every command asks for its table: the query is built without growing.
+constexpr size_t kTableQueryRoom = 64;
+
 struct Finalizer {
   void operator()(sqlite3_stmt* stmt) const { sqlite3_finalize(stmt); }
 };
@@ -327,8 +330,10 @@ bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueLi
 }
 
 bool SqliteDB::IsTableExisted(const std::string& tableName) {
-  const std::string sql =
-      "SELECT 1 FROM sqlite_master WHERE type='table' AND name='" + tableName + "';";
+  std::string sql;
+  sql.reserve(kTableQueryRoom + tableName.size());
+  sql.append("SELECT 1 FROM sqlite_master WHERE type='table' AND name='").append(tableName);
+  sql += "';";
   bool isFound = false;
   const auto takeRow = [&isFound](sqlite3_stmt* /*stmt*/) { return isFound = true; };
   SelectRows(sql, [&] { return Select(sql, takeRow); });

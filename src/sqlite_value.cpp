@@ -57,15 +57,16 @@ char* CopyDoublingQuotes(const char* at, const char* end, bool areRare, char* ou
 // Doubles each quote, byte for byte as a regular expression would; two passes over the bytes cost a
 // fiftieth of it.
 void AppendQuoted(std::string& text, const char* begin, const char* end) {
-  const size_t quotes = CountQuotes(begin, end);
   const auto length = static_cast<size_t>(end - begin);
-  if (quotes == 0) {
+  const void* const first = std::memchr(begin, '\'', length);
+  if (first == nullptr) {
     text.reserve(text.size() + length + 2);
     text += '\'';
     text.append(begin, length);
     text += '\'';
     return;
   }
+  const size_t quotes = CountQuotes(static_cast<const char*>(first), end);
   const size_t start = text.size();
   text.resize(start + length + quotes + 2);
   char* out = &text[start];
