@@ -24,26 +24,6 @@ KeloDRCore::SelectCommand SelectAllNodes() {
   return command;
 }
 
-void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes) {
-  KeloDRCore::SqliteDB db(path, 3, "bench");
-  const KeloDRCore::SqliteTableHandler table = NodeTable();
-  db.Exec("BEGIN");
-  for (const Node& node : nodes) Require(db.InsertRecord(InsertOf(table, node)), "InsertRecord");
-  db.Exec("COMMIT");
-}
-
-void InsertByHand(const std::string& path, const std::vector<Node>& nodes) {
-  sqlite3* const db = OpenRaw(path);
-  ExecRaw(db, "BEGIN");
-  std::string sql;
-  for (const Node& node : nodes) {
-    RenderInsert(node, sql);
-    InsertRaw(db, sql);
-  }
-  ExecRaw(db, "COMMIT");
-  sqlite3_close(db);
-}
-
 size_t SelectWithLibrary(const std::string& path) {
   KeloDRCore::SqliteDB db(path, 3, "bench");
   std::vector<KeloDRCore::SqliteValueList> records;

@@ -18,26 +18,6 @@ constexpr char kInsert[] = "INSERT INTO nodes (address,id,name,online,port) VALU
 
 using InsertAll = std::function<void(const std::string& path, const std::vector<Node>& nodes)>;
 
-void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes) {
-  const KeloDRCore::SqliteTableHandler table = NodeTable();
-  KeloDRCore::SqliteDB db(path, 3, "bench");
-  Require(db.Exec("BEGIN"), "BEGIN");
-  for (const Node& node : nodes) Require(db.InsertRecord(InsertOf(table, node)), "InsertRecord");
-  Require(db.Exec("COMMIT"), "COMMIT");
-}
-
-void InsertByHand(const std::string& path, const std::vector<Node>& nodes) {
-  sqlite3* const db = OpenRaw(path);
-  ExecRaw(db, "BEGIN");
-  std::string sql;
-  for (const Node& node : nodes) {
-    RenderInsert(node, sql);
-    InsertRaw(db, sql);
-  }
-  ExecRaw(db, "COMMIT");
-  sqlite3_close(db);
-}
-
 // The peers do less: they look for no table, log nothing, and prepare one statement for all rows.
 
 void InsertWithSqliteCpp(const std::string& path, const std::vector<Node>& nodes) {

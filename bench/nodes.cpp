@@ -3,6 +3,7 @@
 #include <sqlite3.h>
 #include <unistd.h>
 
+#include "kelodrcore/sqlite_db.h"
 #include "raw_calls.h"
 #include "support.h"
 
@@ -84,6 +85,26 @@ std::string Contents(const std::string& path) {
   sqlite3_exec(db, "SELECT * FROM nodes ORDER BY id", AppendRow, &contents, nullptr);
   sqlite3_close(db);
   return contents;
+}
+
+void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes) {
+  const KeloDRCore::SqliteTableHandler table = NodeTable();
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  Require(db.Exec("BEGIN"), "BEGIN");
+  for (const Node& node : nodes) Require(db.InsertRecord(InsertOf(table, node)), "InsertRecord");
+  Require(db.Exec("COMMIT"), "COMMIT");
+}
+
+void InsertByHand(const std::string& path, const std::vector<Node>& nodes) {
+  sqlite3* const db = OpenRaw(path);
+  ExecRaw(db, "BEGIN");
+  std::string sql;
+  for (const Node& node : nodes) {
+    RenderInsert(node, sql);
+    InsertRaw(db, sql);
+  }
+  ExecRaw(db, "COMMIT");
+  sqlite3_close(db);
 }
 
 }  // namespace bench

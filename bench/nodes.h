@@ -44,6 +44,10 @@ std::string DatabaseOf(int count);
 sqlite3* OpenRaw(const std::string& path);
 void ExecRaw(sqlite3* db, const char* sql);
 
+// Insert the nodes into the empty table inside one transaction: with the library, and at its limit.
+void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes);
+void InsertByHand(const std::string& path, const std::vector<Node>& nodes);
+
 // All rows of the table as one text, to hold databases against each other.
 std::string Contents(const std::string& path);
 
