@@ -108,6 +108,21 @@ class RowReader {
   std::vector<std::string> names;
 };
 
+// What Exec says when its attempts end. Each of the two queries shares one of these lines and has
+// one of its own: they cross their wordings, as log readers know them.
+
+void LogExecFailed(const char* function, unsigned int retries, const std::string& sql,
+                   const Json::Value& err) {
+  KELODR_LOG(ERR, function, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
+             retries, sql.c_str(), JsonValue::toString(err).c_str());
+}
+
+void LogExecRetried(const char* function, unsigned int retries, const std::string& sql) {
+  if (retries == 0) return;
+  KELODR_LOG(INFO, function, "After retry [%u] times, success to exec command [%s]", retries,
+             sql.c_str());
+}
+
 }  // namespace
 
 ErrRecorder::ErrRecorder() : errCode(0) {}
@@ -232,10 +247,11 @@ bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
   return SelectAll(sql, records, __func__);
 }
 
-// Leaves the classified error of the last attempt behind. `retries` counts one past the limit when
-// the limit ends the loop, and is what the callers' messages show.
+// Makes attempts until one succeeds, one fails otherwise than by a lock, or the limit is reached.
+// Leaves the classified error of the last one behind. `retries` counts one past the limit when the
+// limit ends the loop, and is what the callers' messages show.
 template <typename Attempt>
-bool SqliteDB::Retry(const Attempt& attempt, unsigned int& retries) {
+bool SqliteDB::RetryWhileLocked(const Attempt& attempt, unsigned int& retries) {
   retries = 0;
   while (!attempt()) {
     const ErrRecorder raw = ThrowOnlyBadAlloc([this] { return ErrRecorder(*this); });
@@ -264,39 +280,38 @@ bool SqliteDB::Exec(const std::string& sql) {
     return false;
   }
   unsigned int retries = 0;
-  if (!Retry([&] { return DoExecSqliteCommand(sql); }, retries)) {
-    KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
-               retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
+  if (!RetryWhileLocked([&] { return DoExecSqliteCommand(sql); }, retries)) {
+    LogExecFailed(__func__, retries, sql, GetErr());
     return false;
   }
   SetErr(0);
-  if (retries > 0) {
-    KELODR_LOG(INFO, __func__, "After retry [%u] times, success to exec command [%s]", retries,
-               sql.c_str());
-  }
+  LogExecRetried(__func__, retries, sql);
   return true;
 }
 
-bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) {
+// How both queries begin. Other than Exec, they leave the error of a failed Open as it was and do
+// not look at the handle after it.
+bool SqliteDB::OpenForQuery(const std::string& sql, const char* emptyMessage) {
+  const char* const function = "SelectByCommand";
   if (sql.empty()) {
     SetErr(ERR::BAD_PARAMETER);
-    KELODR_LOG(ERR, __func__, "%s", "Empty command to select record");
+    KELODR_LOG(ERR, function, "%s", emptyMessage);
     return false;
   }
-  if (!Open()) {
-    KELODR_LOG(ERR, __func__, "Failed to open db [%s]", dbPath.c_str());
-    return false;
-  }
+  if (Open()) return true;
+  KELODR_LOG(ERR, function, "Failed to open db [%s]", dbPath.c_str());
+  return false;
+}
+
+bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) {
+  if (!OpenForQuery(sql, "Empty command to select record")) return false;
   unsigned int retries = 0;
-  if (!Retry([&] { return SelectFirst(sql, record, "SelectByCommand"); }, retries)) {
+  if (!RetryWhileLocked([&] { return SelectFirst(sql, record, "SelectByCommand"); }, retries)) {
     KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to select command[%s] with err [%s]",
                retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
     return false;
   }
-  if (retries > 0) {
-    KELODR_LOG(INFO, __func__, "After retry [%u] times, success to exec command [%s]", retries,
-               sql.c_str());
-  }
+  LogExecRetried(__func__, retries, sql);
   return true;
 }
 
@@ -304,19 +319,10 @@ bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) 
 template <typename Attempt>
 bool SqliteDB::SelectRows(const std::string& sql, const Attempt& attempt) {
   const char* const function = "SelectByCommand";
-  if (sql.empty()) {
-    SetErr(ERR::BAD_PARAMETER);
-    KELODR_LOG(ERR, function, "%s", "Empty command to select records");
-    return false;
-  }
-  if (!Open()) {
-    KELODR_LOG(ERR, function, "Failed to open db [%s]", dbPath.c_str());
-    return false;
-  }
+  if (!OpenForQuery(sql, "Empty command to select records")) return false;
   unsigned int retries = 0;
-  if (!Retry(attempt, retries)) {
-    KELODR_LOG(ERR, function, "Reach retry limit [%u], failed to exec command [%s] with err [%s]",
-               retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
+  if (!RetryWhileLocked(attempt, retries)) {
+    LogExecFailed(function, retries, sql, GetErr());
     return false;
   }
   if (retries > 0) {

@@ -171,10 +171,11 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
                               const char* function);
 
   template <typename Attempt>
-  KELODR_LOCAL bool SelectRows(const std::string& sql, const Attempt& attempt);
+  KELODR_LOCAL bool RetryWhileLocked(const Attempt& attempt, unsigned int& retries);
 
+  KELODR_LOCAL bool OpenForQuery(const std::string& sql, const char* emptyMessage);
   template <typename Attempt>
-  KELODR_LOCAL bool Retry(const Attempt& attempt, unsigned int& retries);
+  KELODR_LOCAL bool SelectRows(const std::string& sql, const Attempt& attempt);
 
   template <typename Rows>
   KELODR_LOCAL bool SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function);
