@@ -188,6 +188,18 @@ TYPED_TEST(FieldCommandTest, TakesTheFiveTypesAndLiteralsAndNothingElse) {
   static_assert(!TakesFieldValue<TypeParam, const unsigned char*>(0));
 }
 
+// Any literal 0 could also be a null pointer, and so a null text.
+TYPED_TEST(FieldCommandTest, AZeroOfAnotherIntegerTypeDoesNotCompile) {
+  const auto addLongLong = [](auto& command) -> decltype(command.AddFieldValue("", 0LL)) {
+    return true;
+  };
+  const auto addUnsignedLong = [](auto& command) -> decltype(command.AddFieldValue("", 0UL)) {
+    return true;
+  };
+  static_assert(!std::is_invocable_v<decltype(addLongLong), TypeParam&>);
+  static_assert(!std::is_invocable_v<decltype(addUnsignedLong), TypeParam&>);
+}
+
 TYPED_TEST(FieldCommandTest, EveryTypeIsRenderedAsItsLiteral) {
   TypeParam command;
   EXPECT_TRUE(command.AddFieldValue("a", std::string("it's")));

@@ -83,6 +83,9 @@ class KELODR_EXPORT InsertCommand : public SqliteCommand {
   bool AddFieldValue(const std::string& field, const char* value);
   /// @}
 
+  /// A literal 0 of another integer type would be a null text.
+  bool AddFieldValue(const std::string& field, long long number) = delete;
+
   /// The part of the statement with columns and values: "(names) VALUES (literals)". A literal that
   /// is the empty text (an integer outside 32 bits) in the first place is followed by no comma; the
   /// database refuses such a statement.
@@ -112,6 +115,9 @@ class KELODR_EXPORT UpdateCommand : public SqliteCommand {
   bool AddFieldValue(const std::string& field, const T& value);
   bool AddFieldValue(const std::string& field, const char* value);
   /// @}
+
+  /// A literal 0 of another integer type would be a null text.
+  bool AddFieldValue(const std::string& field, long long number) = delete;
 
   /// False for an empty text, without a line.
   bool SetCondition(const std::string& text);
