@@ -32,9 +32,9 @@ int main() {
   AddNode(db, "nas1");
 
   SqliteDB other("nodes.db", 0, "cookbook");
-  other.Exec("BEGIN EXCLUSIVE");
+  if (!other.Exec("BEGIN EXCLUSIVE")) return 1;
   AddNode(db, "nas2");
-  other.Exec("COMMIT");
+  if (!other.Exec("COMMIT")) return 1;
   AddNode(db, "nas2");
 
   std::ofstream("notes.db") << "This file is not a database, whatever its name says.\n";

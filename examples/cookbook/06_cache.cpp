@@ -1,6 +1,7 @@
 #include <kelodrcore/cache.h>
 
 #include <cstdio>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -17,11 +18,13 @@ class Release : public Cache {
 
   bool GetUpdatedData(Json::Value& out) const override {
     ++runs;
-    FILE* const command = popen("sleep 0.3; uname -r", "r");
+    FILE* const command = popen("sleep 0.3; uname -r", "re");
     if (command == nullptr) return false;
     char line[256];
-    if (fgets(line, sizeof line, command) != nullptr) out["release"] = line;
-    return pclose(command) == 0;
+    const bool hasLine = fgets(line, sizeof line, command) != nullptr;
+    if (pclose(command) != 0 || !hasLine) return false;
+    out["release"] = std::string(line, strcspn(line, "\n"));
+    return true;
   }
 
   bool IsValidData(const Json::Value& data) const override {

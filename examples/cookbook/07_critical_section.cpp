@@ -1,3 +1,4 @@
+#include <kelodrcore/file.h>
 #include <kelodrcore/file_lock.h>
 #include <kelodrcore/json_value.h>
 #include <sys/file.h>
@@ -19,7 +20,7 @@ bool Count(const std::string& file) {
   FileLock lock(file + ".lock");
   if (!lock.lock(LOCK_EX | LOCK_NB, kTimeoutSeconds)) return false;
   Json::Value document;
-  JsonValue::fromFile(document, file);  // the first process finds no file, and starts at 0
+  if (!File::Read(file, document)) return false;  // the first process finds no file: that is a 0
   document["count"] = document["count"].asInt() + 1;
   return JsonValue::toFile(document, file);
 }  // the destructor releases the lock
@@ -28,7 +29,9 @@ int main() {
   // An absolute path: whoever counts in this file takes the same lock, from wherever it runs.
   const std::string file = std::filesystem::absolute("counter.json").string();
   for (int process = 0; process < kProcesses; ++process) {
-    if (fork() != 0) continue;
+    const pid_t child = fork();
+    if (child < 0) return 1;
+    if (child > 0) continue;
     for (int round = 0; round < kRounds; ++round) {
       if (!Count(file)) _exit(1);
     }

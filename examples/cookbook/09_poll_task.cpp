@@ -27,6 +27,10 @@ Response Call(const std::string& method, const Json::Value& params) {
 int main() {
   constexpr int kMaxPolls = 100;
   const Response started = Call("start", Json::Value());
+  if (!started.isSuccess()) {
+    std::cout << "not started, error " << started.getErrCode() << '\n';
+    return 1;
+  }
   Json::Value params;
   params["task_id"] = started.getTaskId();
   std::cout << "started " << started.getTaskId() << '\n';
