@@ -9,7 +9,7 @@ cmake --build --preset release
 
 drctl=build/release/examples/drctl/drctl
 scratch=$(mktemp -d)
-trap 'rm -r "$scratch" "/tmp/.kelodr_lock$scratch"' EXIT
+trap 'rm -rf "$scratch" "/tmp/.kelodr_lock$scratch"' EXIT
 
 # Says what comes, shows the command, runs it.
 show() {
@@ -36,7 +36,7 @@ show "A name that is taken" node add "o'brien's nas" --address nas.example --por
 show "Reads the system's own key=value file; a value is its first word" system info
 
 exported=$scratch/registry.json
-show "Writes the registry to a JSON file, in place" export "$exported"
+show "Writes the registry to a JSON file, which is replaced in one step" export "$exported"
 show "And reads it back; a bad document changes nothing" import "$exported"
 echo '{"format":"drctl registry","version":1,"volumes":[],"nodes":[{"name":"x"}]}' >"$scratch/bad.json"
 show "As here" import "$scratch/bad.json" || echo "exit status $?"
@@ -54,9 +54,13 @@ wait
 echo "$(grep -l "answered from a fresh scan" "$scratch"/answer.* | wc -l) of them scanned," \
   "$(grep -l "answered from the cache file" "$scratch"/answer.* | wc -l) waited for it and read the file"
 
+# Says what comes, shows the call, makes it; keeps the reply.
 call() {
   printf '\n# %s\n$ echo %s | drctl --db registry.db call\n' "$1" "'$2'"
-  "$drctl" --db "$scratch/registry.db" call <<<"$2" || echo "exit status $?"
+  local status=0
+  reply=$("$drctl" --db "$scratch/registry.db" call <<<"$2") || status=$?
+  echo "$reply"
+  [ "$status" -eq 0 ] || echo "exit status $status"
 }
 call "One call of the web API on standard input, one reply on standard output" \
   '{"api":"Node","method":"create","version":1,"name":"nas2","address":"192.0.2.11","port":5566}'
@@ -64,3 +68,8 @@ call "Again: the reply names the error" \
   '{"api":"Node","method":"create","version":1,"name":"nas2","address":"192.0.2.11","port":5566}'
 call "A scan in the background, to be polled by its task id" \
   '{"api":"Volume","method":"scan","version":1}'
+id=$(grep -oE '[0-9a-f-]{36}' <<<"$reply")
+while
+  call "How far is it?" '{"api":"Volume","method":"poll","version":1,"task_id":"'"$id"'"}'
+  [[ $reply == *'"finish":false'* ]]
+do sleep 0.1; done

@@ -24,6 +24,22 @@ SqliteValueList GivenFields(const Options& options) {
   return fields;
 }
 
+// The exit status; a failure is told with the registry's reason.
+int Finish(bool isDone, const std::string& what, const Registry& registry) {
+  return isDone ? 0 : Complain("cannot " + what, registry.GetErr());
+}
+
+using List = bool (Registry::*)(const Query& query, Rows& rows);
+
+int PrintList(const Options& options, List list, const std::vector<Column>& columns,
+              const std::string& what) {
+  Registry registry(options.db);
+  Rows rows;
+  const bool isDone = (registry.*list)(options.query, rows);
+  if (isDone) Print(rows, columns, options.json);
+  return Finish(isDone, "list the " + what, registry);
+}
+
 int ListCachedVolumes(const Options& options) {
   VolumeCache cache(options.cacheDir, options.maxAge);
   Json::Value volumes;
@@ -49,38 +65,31 @@ int AddNode(const Options& options) {
   SqliteValueList node = GivenFields(options);
   node.AddValue("name", options.name);
   if (!options.state) node.AddValue("state", "unknown");
-  if (registry.AddNode(node)) return 0;
-  return Complain("cannot add node '" + options.name + "'", registry.GetErr());
+  return Finish(registry.AddNode(node), "add node '" + options.name + "'", registry);
 }
 
 int SetNode(const Options& options) {
   Registry registry(options.db);
-  if (registry.SetNode(options.name, GivenFields(options))) return 0;
-  return Complain("cannot change node '" + options.name + "'", registry.GetErr());
+  const bool isDone = registry.SetNode(options.name, GivenFields(options));
+  return Finish(isDone, "change node '" + options.name + "'", registry);
 }
 
 int RemoveNode(const Options& options) {
   Registry registry(options.db);
-  if (registry.RemoveNode(options.name)) return 0;
-  return Complain("cannot remove node '" + options.name + "'", registry.GetErr());
+  const bool isDone = registry.RemoveNode(options.name);
+  return Finish(isDone, "remove node '" + options.name + "'", registry);
 }
 
 int ListNodes(const Options& options) {
-  Registry registry(options.db);
-  Rows rows;
-  if (!registry.ListNodes(options.query, rows)) {
-    return Complain("cannot list the nodes", registry.GetErr());
-  }
-  Print(rows, NodeColumns(), options.json);
-  return 0;
+  return PrintList(options, &Registry::ListNodes, NodeColumns(), "nodes");
 }
 
 int CountNodes(const Options& options) {
   Registry registry(options.db);
   int count = 0;
-  if (!registry.CountNodes(count)) return Complain("cannot count the nodes", registry.GetErr());
-  std::cout << count << '\n';
-  return 0;
+  const bool isDone = registry.CountNodes(count);
+  if (isDone) std::cout << count << '\n';
+  return Finish(isDone, "count the nodes", registry);
 }
 
 int ScanVolumes(const Options& options) {
@@ -90,22 +99,14 @@ int ScanVolumes(const Options& options) {
     std::cerr << "drctl: cannot read the mounts from /proc/self/mountinfo\n";
     return 1;
   }
-  if (!registry.ReplaceVolumes(volumes)) {
-    return Complain("cannot store the volumes", registry.GetErr());
-  }
-  std::cout << volumes.size() << " mount points stored\n";
-  return 0;
+  const bool isDone = registry.ReplaceVolumes(volumes);
+  if (isDone) std::cout << volumes.size() << " mount points stored\n";
+  return Finish(isDone, "store the volumes", registry);
 }
 
 int ListVolumes(const Options& options) {
   if (options.cached) return ListCachedVolumes(options);
-  Registry registry(options.db);
-  Rows rows;
-  if (!registry.ListVolumes(options.query, rows)) {
-    return Complain("cannot list the volumes", registry.GetErr());
-  }
-  Print(rows, VolumeColumns(), options.json);
-  return 0;
+  return PrintList(options, &Registry::ListVolumes, VolumeColumns(), "volumes");
 }
 
 int ShowSystem(const Options& options) {

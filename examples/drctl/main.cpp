@@ -3,6 +3,7 @@
 #include <syslog.h>
 
 #include <CLI/CLI.hpp>
+#include <iostream>
 #include <limits>
 #include <string>
 
@@ -12,6 +13,7 @@
 namespace drctl {
 namespace {
 
+constexpr int kFailure = 1;
 constexpr int kUsageError = 2;
 
 // The command line: a tree of subcommands, of which the leaf that was named runs.
@@ -19,7 +21,9 @@ class CommandLine {
  public:
   CommandLine() {
     app.require_subcommand(1);
-    app.add_option("--db", options.db, "The registry's SQLite file");
+    app.footer("Exit status: 0 done, 1 failed, 2 wrong usage.");
+    app.add_option("--db", options.db,
+                   "The registry's SQLite file; only system and volume list --cached go without");
     app.add_flag("--verbose", options.verbose, "Show the library's log lines on standard error");
     AddNodeCommands();
     AddVolumeCommands();
@@ -36,7 +40,10 @@ class CommandLine {
       return app.exit(error) == 0 ? 0 : kUsageError;
     }
     openlog("drctl", LOG_PID | (options.verbose ? LOG_PERROR : 0), LOG_USER);
-    return run(options);
+    const int status = run(options);
+    if (std::cout.flush()) return status;
+    std::cerr << "drctl: cannot write to standard output\n";
+    return kFailure;
   }
 
  private:
@@ -76,6 +83,12 @@ class CommandLine {
         ->check(CLI::NonNegativeNumber);
   }
 
+  CLI::Option* AddMaxAge(CLI::App* command) {
+    return command->add_option("--max-age", options.maxAge, "Seconds until the cache file is stale")
+        ->capture_default_str()
+        ->check(CLI::Range(0L, std::numeric_limits<long>::max()));
+  }
+
   void AddCacheOptions(CLI::App* command) {
     CLI::Option* const cached = command->add_flag(
         "--cached", options.cached, "Ask the mounts themselves, through a cache file");
@@ -85,10 +98,7 @@ class CommandLine {
     for (const char* const name : {"--filter", "--order", "--desc", "--limit", "--offset"}) {
       cached->excludes(command->get_option(name));
     }
-    command->add_option("--max-age", options.maxAge, "Seconds until the cache file is stale")
-        ->capture_default_str()
-        ->needs(cached)
-        ->check(CLI::Range(0L, std::numeric_limits<long>::max()));
+    AddMaxAge(command)->needs(cached);
     command->add_option("--repeat", options.repeat, "Ask that many times")
         ->needs(cached)
         ->check(CLI::PositiveNumber);
@@ -128,13 +138,12 @@ class CommandLine {
   }
 
   void AddTransferCommands() {
-    for (const auto& [name, description, action] :
-         {std::make_tuple("export", "Writes the registry to a JSON file", ExportRegistry),
-          std::make_tuple("import", "Replaces the registry by that of a JSON file",
-                          ImportRegistry)}) {
-      AddCommand(&app, name, description, action)
-          ->add_option("file", options.file, "The JSON file")
-          ->required();
+    CLI::App* const to =
+        AddCommand(&app, "export", "Writes the registry to a JSON file", ExportRegistry);
+    CLI::App* const from =
+        AddCommand(&app, "import", "Replaces the registry by that of a JSON file", ImportRegistry);
+    for (CLI::App* const command : {to, from}) {
+      command->add_option("file", options.file, "The JSON file")->required();
     }
   }
 
@@ -146,9 +155,7 @@ class CommandLine {
         ->excludes(file);
     call->add_option("--cache-dir", options.cacheDir, "Directory of the volume cache [DB.cache]");
     call->add_option("--state-dir", options.stateDir, "Directory of the tasks' states [DB.tasks]");
-    call->add_option("--max-age", options.maxAge, "Seconds until the cache file is stale")
-        ->capture_default_str()
-        ->check(CLI::Range(0L, std::numeric_limits<long>::max()));
+    AddMaxAge(call);
   }
 
   CLI::App app{"A registry of replication nodes and of this machine's volumes", "drctl"};

@@ -29,12 +29,14 @@ std::vector<std::string> Cells(const SqliteValueList& row, const std::vector<Col
 
 void PrintTable(const std::vector<std::vector<std::string>>& lines,
                 const std::vector<Column>& columns) {
+  std::vector<size_t> widths(columns.size());
+  for (const auto& line : lines) {
+    for (size_t i = 0; i < widths.size(); ++i) widths[i] = std::max(widths[i], line[i].size());
+  }
   for (const auto& line : lines) {
     std::string text;
-    for (size_t i = 0; i < columns.size(); ++i) {
-      size_t width = 0;
-      for (const auto& other : lines) width = std::max(width, other[i].size());
-      const std::string padding(width - line[i].size(), ' ');
+    for (size_t i = 0; i < widths.size(); ++i) {
+      const std::string padding(widths[i] - line[i].size(), ' ');
       if (i > 0) text += "  ";
       text += columns[i].isNumber ? padding + line[i] : line[i] + padding;
     }

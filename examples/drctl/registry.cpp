@@ -60,16 +60,11 @@ bool Registry::Fail(int code, const std::string& message) {
   return false;
 }
 
-// BEGIN IMMEDIATE takes the write lock at once, so that what the steps read stays true. A failed
-// transaction keeps the error of the step that failed.
+// BEGIN IMMEDIATE takes the write lock at once, so that what the steps read stays true. Closing
+// rolls back and keeps the error of the step that failed; the next statement opens the file again.
 bool Registry::InTransaction(const std::function<bool()>& steps) {
-  if (!Exec(std::string("BEGIN IMMEDIATE"))) return false;
-  if (steps() && Exec(std::string("COMMIT"))) return true;
-  const int code = errCode;
-  const Json::Value message = errMsg;
-  Exec(std::string("ROLLBACK"));
-  errCode = code;
-  errMsg = message;
+  if (Exec("BEGIN IMMEDIATE") && steps() && Exec("COMMIT")) return true;
+  Close();
   return false;
 }
 
@@ -87,9 +82,11 @@ bool Registry::AddNode(const SqliteValueList& node) {
   return false;
 }
 
-bool Registry::RequireNode(const std::string& name) {
+// A missing file has no nodes, and stays missing.
+bool Registry::ChangeNode(const std::string& name, const std::function<bool()>& change) {
   SqliteValueList node;
-  return GetNode(name, node);
+  if (!IsExisted()) return GetNode(name, node);
+  return InTransaction([&] { return GetNode(name, node) && change(); });
 }
 
 bool Registry::SetNode(const std::string& name, const SqliteValueList& changes) {
@@ -99,15 +96,12 @@ bool Registry::SetNode(const std::string& name, const SqliteValueList& changes) 
   command.SetTable(kNodes);
   command.SetFieldValues(changes);
   command.SetCondition(SqliteEqual("name", name));
-  if (!IsExisted()) return Fail(ERR::ERR_NODE_NOT_EXIST, "there is no node of that name");
-  return InTransaction([&] { return RequireNode(name) && UpdateRecord(command); });
+  return ChangeNode(name, [&] { return UpdateRecord(command); });
 }
 
 bool Registry::RemoveNode(const std::string& name) {
-  if (!IsExisted()) return Fail(ERR::ERR_NODE_NOT_EXIST, "there is no node of that name");
-  return InTransaction([&] {
-    return RequireNode(name) && DeleteRecord(SqliteEqual("name", name).GetText(), kNodes);
-  });
+  return ChangeNode(name,
+                    [&] { return DeleteRecord(SqliteEqual("name", name).GetText(), kNodes); });
 }
 
 bool Registry::GetNode(const std::string& name, SqliteValueList& node) {

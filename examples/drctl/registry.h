@@ -53,7 +53,7 @@ class Registry : public KeloDRCore::SqliteDB {
 
  private:
   bool InTransaction(const std::function<bool()>& steps);
-  bool RequireNode(const std::string& name);
+  bool ChangeNode(const std::string& name, const std::function<bool()>& change);
   bool InsertAll(const KeloDRCore::SqliteTableHandler& table, const Rows& rows);
   bool List(const KeloDRCore::SqliteTableHandler& table, const std::vector<Column>& columns,
             const Query& query, Rows& rows);

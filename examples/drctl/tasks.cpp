@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <kelodrcore/file.h>
 #include <kelodrcore/file_lock.h>
+#include <kelodrcore/json_value.h>
 #include <kelodrcore/utils.h>
 #include <sys/file.h>
 #include <sys/wait.h>
@@ -10,8 +11,9 @@
 
 #include <cerrno>
 #include <chrono>
-#include <cstdio>
 #include <filesystem>
+
+#include "paths.h"
 
 namespace drctl {
 
@@ -28,6 +30,10 @@ bool IsUuid(const std::string& text) {
 void LeaveStreams() {
   const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
   for (int fd = STDIN_FILENO; fd <= STDERR_FILENO; ++fd) dup2(null, fd);
+}
+
+void RemoveLock(const std::string& stateFile) {
+  unlink(FileLock::getLockFilePath(stateFile).c_str());
 }
 
 // Runs `body` in a process without a parent to wait for it; false when that could not be started.
@@ -51,17 +57,16 @@ bool RunDetached(const std::function<void()>& body) {
 
 }  // namespace
 
-Tasks::Tasks(const std::string& stateDir) : dir(stateDir) {}
+Tasks::Tasks(const std::string& stateDir) : dir(AbsolutePath(stateDir)) {}
 
 std::string Tasks::StateFile(const std::string& id) const { return dir + "/" + id + ".json"; }
 
-// The state appears in one step, so that a poll never reads half of it.
+// In one step, so that a poll never reads half of it.
 bool Tasks::WriteState(const std::string& id, TaskState state) const {
   Json::Value document;
   document["finish"] = state != TaskState::kRunning;
   document["success"] = state == TaskState::kSucceeded;
-  const std::string fresh = StateFile(id) + ".new";
-  return File::Write(fresh, document) && rename(fresh.c_str(), StateFile(id).c_str()) == 0;
+  return JsonValue::toFile(document, StateFile(id));
 }
 
 TaskState Tasks::ReadState(const std::string& id) const {
@@ -79,6 +84,7 @@ void Tasks::ForgetOld() const {
   for (const auto& entry : std::filesystem::directory_iterator(dir, ignored)) {
     if (entry.last_write_time(ignored) >= yesterday || ignored) continue;
     std::filesystem::remove(entry.path(), ignored);
+    RemoveLock(entry.path());  // it is there still where the task's process was killed
   }
 }
 
@@ -92,7 +98,7 @@ std::string Tasks::Start(const std::function<bool()>& work) {
   if (!life.lock(LOCK_EX | LOCK_NB, 5) || !WriteState(id, TaskState::kRunning)) return "";
   const bool isStarted = RunDetached([&] {
     WriteState(id, work() ? TaskState::kSucceeded : TaskState::kFailed);
-    unlink(FileLock::getLockFilePath(StateFile(id)).c_str());
+    RemoveLock(StateFile(id));
   });
   if (isStarted) return id;
   unlink(StateFile(id).c_str());

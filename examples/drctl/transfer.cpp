@@ -2,7 +2,10 @@
 
 #include <kelodrcore/err.h>
 #include <kelodrcore/file.h>
+#include <kelodrcore/json_value.h>
 
+#include <cerrno>
+#include <cstring>
 #include <iostream>
 #include <set>
 
@@ -86,8 +89,8 @@ int Export(Registry& registry, const std::string& file) {
   document["version"] = kVersion;
   document[kNodeSection.member] = ToJson(nodes, NodeColumns());
   document[kVolumeSection.member] = ToJson(volumes, VolumeColumns());
-  if (!File::Write(file, document)) {
-    std::cerr << "drctl: cannot write '" << file << "'\n";
+  if (!JsonValue::toFile(document, file)) {
+    std::cerr << "drctl: cannot write '" << file << "': " << std::strerror(errno) << '\n';
     return 1;
   }
   std::cout << nodes.size() << " nodes and " << volumes.size() << " volumes exported\n";

@@ -11,7 +11,7 @@ namespace drctl {
 
 // Both return the program's exit status, having said on standard error what went wrong.
 
-// Writes all nodes and volumes to `file`.
+// Writes all nodes and volumes to `file`, which is the old one or the new one at any moment.
 int Export(Registry& registry, const std::string& file);
 
 // Replaces all nodes and volumes by those of `file`. Says of every entry that is not good why it is

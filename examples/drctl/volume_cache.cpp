@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 
 #include "mounts.h"
+#include "paths.h"
 
 namespace drctl {
 namespace {
@@ -24,7 +25,8 @@ const char* ToText(Source source) {
 }
 
 VolumeCache::VolumeCache(const std::string& dir, long maxAge)
-    : Cache(dir, kName, maxAge, true, kRetries), file(dir + "/" + kName + ".cached") {}
+    : Cache(AbsolutePath(dir), kName, maxAge, true, kRetries),
+      file(dir + "/" + kName + ".cached") {}
 
 Json::Value VolumeCache::GetInfo() const { return kName; }
 
