@@ -321,13 +321,6 @@ TEST_F(JsonValueTest, RefusesMoreThanAThousandLevels) {
   EXPECT_TRUE(Parsed(std::string(998, '[') + "{\"a\":1}" + std::string(998, ']')).isArray());
 }
 
-TEST_F(JsonValueTest, ATextMayBePartOfTheValueThatItReplaces) {
-  Json::Value value;
-  value["text"] = "{\"a\":[1,2]}";
-  ASSERT_TRUE(fromString(value, value["text"].asString()));
-  EXPECT_EQ(toString(value), "{\"a\":[1,2]}");
-}
-
 class CommaPoint : public std::numpunct<char> {
   char do_decimal_point() const override { return ','; }
   char do_thousands_sep() const override { return '.'; }

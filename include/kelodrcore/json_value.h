@@ -12,7 +12,6 @@
 
 /// The text and file forms of a `Json::Value`. No function of this namespace logs, keeps state or
 /// lets out an exception other than `std::bad_alloc`; none depends on the locale of the process.
-/// Arguments may alias: a text or path may be part of the value that is replaced.
 namespace KeloDRCore::JsonValue {
 
 /// The document as compact JSON: one line, members in the order of their names, no comments, no
