@@ -3,6 +3,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <functional>
 #include <string>
 #include <utility>
 #include <vector>
@@ -17,6 +18,25 @@ namespace File = KeloDRCore::File;
 constexpr uid_t kOther = 65534;
 
 using FileDirTest = CleanTest;
+
+// Without root the bracket logs at every directory made, and each test would be about that.
+class FileDirRootTest : public CleanTest {
+ protected:
+  void SetUp() override {
+    CleanTest::SetUp();
+    if (geteuid() != 0) GTEST_SKIP() << "needs root: directories are made as root";
+  }
+
+  // `body` calls `program` exactly so: its name and arguments, each in brackets, a call a line.
+  void ExpectCalls(const std::string& program, const std::function<void()>& body,
+                   const std::string& expected) const {
+    const std::string script = R"((printf '[%s]' "$0" "$@"; echo) >> ')" + Path("calls") + "'";
+    if (!RunWithScript(program, script, body)) {
+      GTEST_SKIP() << "needs the right to put another program in place";
+    }
+    EXPECT_EQ(ReadText(Path("calls")), expected);
+  }
+};
 
 unsigned int ModeOf(const std::string& path) {
   struct stat status = {};
@@ -34,7 +54,7 @@ TEST_F(FileDirTest, CreateDirOfADirectoryDoesNothingWhateverTheMode) {
   EXPECT_EQ(ModeOf(dir), 0700U);
 }
 
-TEST_F(FileDirTest, CreateDirGivesTheModeWhateverTheUmaskAndItsParentsTheUmasks) {
+TEST_F(FileDirRootTest, CreateDirGivesTheModeWhateverTheUmaskAndItsParentsTheUmasks) {
   const mode_t before = umask(027);
   EXPECT_TRUE(File::CreateDir(Path("p/q/a"), 0777));
   EXPECT_TRUE(File::CreateDir(Path("b"), 0));
@@ -60,7 +80,7 @@ TEST_F(FileDirTest, CreateDirRefusesANegativeMode) {
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
 }
 
-TEST_F(FileDirTest, CreateDirNamesPathAndModeWhenMkdirFails) {
+TEST_F(FileDirRootTest, CreateDirNamesPathAndModeWhenMkdirFails) {
   WriteText(Path("file"), "x");
   for (const std::string& path : {Path("file"), Path("file/sub")}) {
     EXPECT_FALSE(File::CreateDir(path, 0750));
@@ -69,14 +89,35 @@ TEST_F(FileDirTest, CreateDirNamesPathAndModeWhenMkdirFails) {
   }
 }
 
-TEST_F(FileDirTest, CreateDirHidesNothingFromAShell) {
+TEST_F(FileDirRootTest, CreateDirRunsMkdirWithThePathBeforeTheMode) {
+  ExpectCalls(
+      "/bin/mkdir",
+      [this] {
+        EXPECT_TRUE(File::CreateDir(Path("a b"), 0750));
+        EXPECT_TRUE(File::CreateDir("-x", 07));
+      },
+      "[/bin/mkdir][-p][" + Path("a b") + "][-m][750]\n[/bin/mkdir][-p][-x][-m][7]\n");
+}
+
+TEST_F(FileDirRootTest, CreateDirRunsNothingWhenThereIsNothingToMake) {
+  ExpectCalls(
+      "/bin/mkdir",
+      [this] {
+        EXPECT_TRUE(File::CreateDir(dir, 0755));
+        EXPECT_FALSE(File::CreateDir("", 0755));
+        EXPECT_FALSE(File::CreateDir(Path("a"), 01000));
+        LogCapture::Clear();
+      },
+      "");
+}
+
+TEST_F(FileDirRootTest, CreateDirHidesNothingFromAShell) {
   const std::string path = Path("a; touch b $(touch c)");
   EXPECT_TRUE(File::CreateDir(path, 0755));
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{"a; touch b $(touch c)"});
 }
 
-TEST_F(FileDirTest, CreateDirWorksAsRootUnderOtherEffectiveIdsAndRestoresThem) {
-  if (geteuid() != 0) GTEST_SKIP() << "needs root";
+TEST_F(FileDirRootTest, CreateDirWorksAsRootUnderOtherEffectiveIdsAndRestoresThem) {
   EXPECT_EQ(RunInChild([this] {
               ASSERT_EQ(setresgid(gid_t(-1), kOther, gid_t(-1)), 0);
               ASSERT_EQ(setresuid(uid_t(-1), kOther, uid_t(-1)), 0);
@@ -97,8 +138,23 @@ TEST_F(FileDirTest, CreateDirWorksAsRootUnderOtherEffectiveIdsAndRestoresThem) {
   EXPECT_EQ(ModeOf(Path("p/a")), 0755U);
 }
 
-TEST_F(FileDirTest, CreateDirRunsMkdirEvenWhenRaisingFails) {
-  if (geteuid() != 0) GTEST_SKIP() << "needs root";
+TEST_F(FileDirRootTest, CreateDirNamesAFailureBeforeItRestoresTheIds) {
+  WriteText(Path("file"), "x");
+  EXPECT_EQ(RunInChild([this] {
+              ASSERT_EQ(setresuid(uid_t(-1), kOther, uid_t(-1)), 0);
+              EXPECT_FALSE(File::CreateDir(Path("file/a"), 0755));
+              const LogLine raised =
+                  Auth(LOG_AUTH | LOG_DEBUG, "file.cpp WARNING: setresuid(-1, 0, -1)");
+              ExpectLog({raised,
+                         Err("file.cpp", "CreateDir",
+                             "Failed to create dir [" + Path("file/a") + "] with mode [755]"),
+                         raised});
+              EXPECT_EQ(geteuid(), kOther);
+            }),
+            0);
+}
+
+TEST_F(FileDirRootTest, CreateDirRunsMkdirEvenWhenRaisingFails) {
   ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
   ASSERT_TRUE(File::CreateDir(Path("open"), 0777));
   const std::vector<LogLine> refused = {
@@ -129,7 +185,7 @@ TEST_F(FileDirTest, RemoveDirLeavesWhatIsNotADirectory) {
   EXPECT_EQ(ReadText(Path("file")), "x");
 }
 
-TEST_F(FileDirTest, RemoveDirRemovesTheWholeTree) {
+TEST_F(FileDirRootTest, RemoveDirRemovesTheWholeTree) {
   ASSERT_TRUE(File::CreateDir(Path("a/b/c"), 0755));
   WriteText(Path("a/b/file"), "x");
   WriteText(Path("kept"), "x");
@@ -137,8 +193,23 @@ TEST_F(FileDirTest, RemoveDirRemovesTheWholeTree) {
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{"kept"});
 }
 
-TEST_F(FileDirTest, RemoveDirFailsSilentlyAndRaisesNoPrivileges) {
-  if (geteuid() != 0) GTEST_SKIP() << "needs root";
+TEST_F(FileDirRootTest, RemoveDirRunsRmWithThePath) {
+  ExpectCalls(
+      "/bin/rm", [this] { EXPECT_TRUE(File::RemoveDir(dir)); }, "[/bin/rm][-rf][" + dir + "]\n");
+}
+
+TEST_F(FileDirRootTest, RemoveDirRunsNothingForWhatIsNoDirectory) {
+  WriteText(Path("file"), "x");
+  ExpectCalls(
+      "/bin/rm",
+      [this] {
+        EXPECT_TRUE(File::RemoveDir(Path("file")));
+        EXPECT_TRUE(File::RemoveDir(Path("none")));
+      },
+      "");
+}
+
+TEST_F(FileDirRootTest, RemoveDirFailsSilentlyAndRaisesNoPrivileges) {
   ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
   ASSERT_TRUE(File::CreateDir(Path("a"), 0755));
   EXPECT_EQ(RunInChild([this] {

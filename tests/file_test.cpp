@@ -2,21 +2,19 @@
 
 #include <fcntl.h>
 #include <sys/mman.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
 #include <csignal>
-#include <cstring>
 #include <string>
-#include <thread>
 
 #include "kelodrcore/json_value.h"
 #include "support/clean_test.h"
+#include "support/json_text.h"
+#include "support/special_files.h"
 
 namespace {
 
@@ -45,25 +43,7 @@ class FileTest : public CleanTest {
     syncsWithoutCloseOnExec = 0;
   }
 
-  static Json::Value Parse(const std::string& text) {
-    Json::Value value;
-    EXPECT_TRUE(JsonValue::fromString(value, text)) << text;
-    return value;
-  }
-
   static bool IsOpen(int fd) { return fcntl(fd, F_GETFD) != -1; }
-
-  // A path that exists but that nobody can open, root included.
-  std::string Unopenable() const {
-    std::string path = Path("socket");
-    sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-    const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    EXPECT_EQ(bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0);
-    close(fd);
-    return path;
-  }
 
   int OpenText(const std::string& text) const {
     WriteText(Path("text"), text);
@@ -92,7 +72,8 @@ TEST_F(FileTest, ReadOfAMissingFileSucceedsAndLeavesTheValue) {
 }
 
 TEST_F(FileTest, ReadOfAFileThatCannotBeOpenedFails) {
-  const std::string path = Unopenable();
+  const std::string path = Path("socket");
+  MakeSocket(path);
   Json::Value value("kept");
   EXPECT_FALSE(File::Read(path, value));
   EXPECT_EQ(value, Json::Value("kept"));
@@ -135,10 +116,11 @@ TEST_F(FileTest, ReadOfTextThatDoesNotParseFailsSilently) {
   }
 }
 
-TEST_F(FileTest, ReadRefusesANulByteInAPath) {
+TEST_F(FileTest, ReadRefusesANulByteBehindTheDocument) {
   WriteText(Path("a"), std::string("{}\0", 3));
-  Json::Value value;
+  Json::Value value("kept");
   EXPECT_FALSE(File::Read(Path("a"), value));
+  EXPECT_EQ(value, Json::Value("kept"));
 }
 
 TEST_F(FileTest, ReadOfADirectoryFailsSilently) {
@@ -164,21 +146,10 @@ TEST_F(FileTest, ReadOfALargeDocumentIsWhole) {
 }
 
 TEST_F(FileTest, ReadOpensItsFileCloseOnExec) {
-  ASSERT_EQ(mkfifo(Path("fifo").c_str(), 0600), 0);
   Json::Value value;
-  const std::set<int> before = OpenDescriptors();
-  std::thread reader([&] { EXPECT_TRUE(File::Read(Path("fifo"), value)); });
-  // Opens once the reader has opened its end, which then waits for the text.
-  const int writer = open(Path("fifo").c_str(), O_WRONLY | O_CLOEXEC);
-  // The two ends let go of each other before either has its descriptor.
-  while (OpenDescriptors().size() < before.size() + 2) std::this_thread::yield();
-  for (const int fd : OpenDescriptors()) {
-    if (before.count(fd) != 0) continue;
-    EXPECT_NE(fcntl(fd, F_GETFD) & FD_CLOEXEC, 0) << fd;
-  }
-  EXPECT_EQ(write(writer, "7", 1), 1);
-  close(writer);
-  reader.join();
+  ExpectOpenedCloseOnExec(Path("fifo"), "7", [&value](const std::string& path) {
+    EXPECT_TRUE(File::Read(path, value));
+  });
   EXPECT_EQ(value, Json::Value(7));
 }
 

@@ -1,9 +1,3 @@
-#include <fcntl.h>
-#include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/un.h>
-#include <unistd.h>
-
 #include <cmath>
 #include <cstring>
 #include <limits>
@@ -12,11 +6,11 @@
 #include <random>
 #include <sstream>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "kelodrcore/file.h"
 #include "support/clean_test.h"
+#include "support/special_files.h"
 
 namespace {
 
@@ -86,15 +80,8 @@ TYPED_TEST(EveryInstanceTest, AMissingFileIsSilentlyZeroAndLeavesTheMap) {
 }
 
 TYPED_TEST(EveryInstanceTest, AFileThatCannotBeOpenedIsAnErrorThatLeavesTheMap) {
-  // Root opens everything but a socket.
   const std::string path = this->Path("socket");
-  sockaddr_un address = {};
-  address.sun_family = AF_UNIX;
-  strncpy(address.sun_path, path.c_str(), sizeof(address.sun_path) - 1);
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  ASSERT_EQ(bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0);
-  close(fd);
-
+  MakeSocket(path);
   typename TestFixture::Map map{{"old", {}}};
   EXPECT_EQ(File::Read(path, map), -1);
   EXPECT_EQ(map.count("old"), 1U);
@@ -131,18 +118,10 @@ TYPED_TEST(EveryInstanceTest, ThePathMayBeAKeyOfTheMap) {
 }
 
 TEST_F(KeyValueTest, TheFileIsOpenedCloseOnExec) {
-  ASSERT_EQ(mkfifo(Path("fifo").c_str(), 0600), 0);
   Strings map;
-  const std::set<int> before = OpenDescriptors();
-  std::thread reader([&] { EXPECT_EQ(File::Read(Path("fifo"), map), 1); });
-  const int writer = open(Path("fifo").c_str(), O_WRONLY | O_CLOEXEC);
-  for (const int fd : OpenDescriptors()) {
-    if (before.count(fd) != 0 || fcntl(fd, F_GETFD) == -1) continue;
-    EXPECT_NE(fcntl(fd, F_GETFD) & FD_CLOEXEC, 0) << fd;
-  }
-  EXPECT_EQ(write(writer, "a=1", 3), 3);
-  close(writer);
-  reader.join();
+  ExpectOpenedCloseOnExec(Path("fifo"), "a=1",
+                          [&map](const std::string& path) { EXPECT_EQ(File::Read(path, map), 1); });
+  EXPECT_EQ(map, (Strings{{"a", "1"}}));
 }
 
 // --- the lines -----------------------------------------------------------------------------------

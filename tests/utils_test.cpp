@@ -1,8 +1,6 @@
 #include "kelodrcore/utils.h"
 
 #include <signal.h>
-#include <sys/mount.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -111,6 +109,8 @@ TEST_F(RandomSleepTest, AnInterruptedSleepIsASleep) {
   EXPECT_EQ(sleeps.size(), 1U);
 }
 
+constexpr char kTool[] = "/usr/bin/uuidgen";
+
 class GenerateUUIDTest : public CleanTest {
  protected:
   static bool IsUUID(const std::string& text) {
@@ -118,26 +118,9 @@ class GenerateUUIDTest : public CleanTest {
     return std::regex_match(text, form);
   }
 
-  // Runs `body` in a child that sees `file` under the name of the tool; false when this process may
-  // not do that.
-  static bool RunWithTool(const std::string& file, const std::function<void()>& body) {
-    return RunWithOwnMounts([&] {
-      ASSERT_EQ(mount(file.c_str(), "/usr/bin/uuidgen", nullptr, MS_BIND, nullptr), 0);
-      body();
-    });
-  }
-
-  // The same with a shell script as the tool.
-  bool RunWithScript(const std::string& script, const std::function<void()>& body) const {
-    const std::string path = Path("tool");
-    WriteText(path, "#!/bin/sh\n" + script + "\n");
-    EXPECT_EQ(chmod(path.c_str(), 0755), 0);
-    return RunWithTool(path, body);
-  }
-
-  // One call with that script as the tool, which must not log.
+  // One call with this script as the tool, which must not log.
   void ExpectOutput(const std::string& script, const std::string& expected) const {
-    if (!RunWithScript(script, [&] {
+    if (!RunWithScript(kTool, script, [&] {
           EXPECT_EQ(GenerateUUID(), expected);
           ExpectLog({});
         })) {
@@ -147,7 +130,7 @@ class GenerateUUIDTest : public CleanTest {
 };
 
 TEST_F(GenerateUUIDTest, GivesAnotherUUIDEachTime) {
-  if (access("/usr/bin/uuidgen", X_OK) != 0) GTEST_SKIP() << "needs /usr/bin/uuidgen";
+  if (access(kTool, X_OK) != 0) GTEST_SKIP() << "needs /usr/bin/uuidgen";
   std::set<std::string> seen;
   for (int i = 0; i < 20; ++i) {
     const std::string uuid = GenerateUUID();
@@ -157,7 +140,7 @@ TEST_F(GenerateUUIDTest, GivesAnotherUUIDEachTime) {
 }
 
 TEST_F(GenerateUUIDTest, CanBeCalledFromSeveralThreads) {
-  if (access("/usr/bin/uuidgen", X_OK) != 0) GTEST_SKIP() << "needs /usr/bin/uuidgen";
+  if (access(kTool, X_OK) != 0) GTEST_SKIP() << "needs /usr/bin/uuidgen";
   std::vector<std::vector<std::string>> uuids(4);
   std::vector<std::thread> threads;
   for (std::vector<std::string>& own : uuids) {
@@ -174,7 +157,7 @@ TEST_F(GenerateUUIDTest, CanBeCalledFromSeveralThreads) {
 }
 
 TEST_F(GenerateUUIDTest, WorksWhereChildrenAreIgnored) {
-  if (access("/usr/bin/uuidgen", X_OK) != 0) GTEST_SKIP() << "needs /usr/bin/uuidgen";
+  if (access(kTool, X_OK) != 0) GTEST_SKIP() << "needs /usr/bin/uuidgen";
   EXPECT_EQ(RunInChild([] {
               signal(SIGCHLD, SIG_IGN);
               EXPECT_TRUE(IsUUID(GenerateUUID()));
@@ -183,7 +166,7 @@ TEST_F(GenerateUUIDTest, WorksWhereChildrenAreIgnored) {
 }
 
 TEST_F(GenerateUUIDTest, AToolThatCannotBeStartedIsLogged) {
-  if (!RunWithTool("/dev/null", [] {
+  if (!RunWithProgram(kTool, "/dev/null", [] {
         EXPECT_EQ(GenerateUUID(), "");
         ExpectLog(
             {Err("utils.cpp", "GenerateUUID", "Failed to exec the command [/usr/bin/uuidgen].")});
@@ -193,7 +176,7 @@ TEST_F(GenerateUUIDTest, AToolThatCannotBeStartedIsLogged) {
 }
 
 TEST_F(GenerateUUIDTest, AFailedStartLeavesNothingBehind) {
-  if (!RunWithTool("/dev/null", [] {
+  if (!RunWithProgram(kTool, "/dev/null", [] {
         const std::set<int> before = OpenDescriptors();
         for (int i = 0; i < 3; ++i) EXPECT_EQ(GenerateUUID(), "");
         EXPECT_EQ(OpenDescriptors(), before);
@@ -232,9 +215,9 @@ TEST_F(GenerateUUIDTest, ALongLineIsReadWhole) {
 }
 
 TEST_F(GenerateUUIDTest, TheToolIsWaitedFor) {
-  if (!RunWithScript("echo abc; exec >&-; : > '" + Path("done") + "'", [this] {
+  if (!RunWithScript(kTool, "echo abc; exec >&-; : > '" + Path("done") + "'", [this] {
         EXPECT_EQ(GenerateUUID(), "abc");
-        EXPECT_EQ(NamesIn(dir), (std::vector<std::string>{"done", "tool"}));
+        EXPECT_EQ(NamesIn(dir), (std::vector<std::string>{"done", "program"}));
         EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1);
       })) {
     GTEST_SKIP() << "needs root, to put another tool in place";

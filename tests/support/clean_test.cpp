@@ -3,6 +3,7 @@
 #include <dirent.h>
 #include <sched.h>
 #include <sys/mount.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -77,6 +78,14 @@ bool RunWithOwnMounts(const std::function<void()>& body) {
   return true;
 }
 
+bool RunWithProgram(const std::string& path, const std::string& file,
+                    const std::function<void()>& body) {
+  return RunWithOwnMounts([&] {
+    ASSERT_EQ(mount(file.c_str(), path.c_str(), nullptr, MS_BIND, nullptr), 0);
+    body();
+  });
+}
+
 void CleanTest::SetUp() {
   std::string pattern =
       (std::filesystem::temp_directory_path() / "kelodrcore-test-XXXXXX").string();
@@ -96,6 +105,14 @@ void CleanTest::TearDown() {
   LogCapture::MirrorTo("");
   std::error_code error;
   std::filesystem::remove_all(dir, error);
+}
+
+bool CleanTest::RunWithScript(const std::string& program, const std::string& script,
+                              const std::function<void()>& body) const {
+  const std::string path = Path("program");
+  WriteText(path, "#!/bin/sh\n" + script + "\n");
+  EXPECT_EQ(chmod(path.c_str(), 0755), 0);
+  return RunWithProgram(program, path, body);
 }
 
 void CleanTest::ExpectLog(const std::vector<LogLine>& expected) {

@@ -30,6 +30,10 @@ int RunInChild(const std::function<void()>& body);
 // may not do that. What `body` mounts is seen by nobody else and gone with the child.
 bool RunWithOwnMounts(const std::function<void()>& body);
 
+// The same with `file` in the place of the program at `path`.
+bool RunWithProgram(const std::string& path, const std::string& file,
+                    const std::function<void()>& body);
+
 // Each test has an empty directory and an empty log record. Teardown fails when the test left a
 // descriptor open, a child (running or zombie) behind, other effective ids, or a log line that it
 // did not Take().
@@ -40,6 +44,10 @@ class CleanTest : public testing::Test {
 
   // The path of `name` in the test's own directory, which is removed at the end.
   std::string Path(const std::string& name) const { return dir + "/" + name; }
+
+  // RunWithProgram() with a shell script, which is written to Path("program"), as the program.
+  bool RunWithScript(const std::string& program, const std::string& script,
+                     const std::function<void()>& body) const;
 
   // Expects exactly these lines since the last look at the log.
   static void ExpectLog(const std::vector<LogLine>& expected);
