@@ -177,6 +177,42 @@ TEST_F(CacheProcessTest, APidFileThatCannotBeRemovedIsReported) {
   ExpectLog({Starts(), CannotUnlink("No such file or directory"), Finishes()});
 }
 
+// --- Who fetches
+
+// A cache whose subclass itself says whether its readers wait.
+class DecidingCache : public TestCache {
+ public:
+  DecidingCache(const TestCache& cache, bool required) : TestCache(cache), isRequired(required) {}
+  bool IsUpdatedDataRequired() const override { return isRequired; }
+
+ private:
+  bool isRequired;
+};
+
+TEST_F(CacheProcessTest, ASubclassThatRequiresFreshDataFetchesItself) {
+  WriteCacheFile("\"old\"", kStale);
+  DecidingCache cache(MakeCache(false), true);
+  cache.FetchGives("new");
+  EXPECT_EQ(cache.Read(), "new");
+  EXPECT_EQ(JoinAll(), 0);
+  ExpectLog({Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, ASubclassThatRequiresNoFreshDataLetsARefresherFetch) {
+  WriteCacheFile("null", kStale);
+  const Event finish;
+  DecidingCache cache(MakeCache(true), false);
+  cache.fetch = [&](Json::Value& out) {
+    out = "new";
+    return finish.Wait();
+  };
+  EXPECT_EQ(cache.Read(), Json::Value());
+  finish.Cause();
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(cache.Read(), "new");
+  ExpectLog({});
+}
+
 // --- Who counts as an updater
 
 TEST_F(CacheProcessTest, APidFileOfADeadOrReusedPidOrOfNobodyStopsNoUpdate) {

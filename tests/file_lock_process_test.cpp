@@ -13,7 +13,6 @@
 
 #include "kelodrcore/file_lock.h"
 #include "support/lock_test.h"
-#include "support/process.h"
 
 namespace {
 
@@ -265,7 +264,6 @@ void DropEffectiveIds() {
 }
 
 TEST_F(FileLockProcessTest, LockAndUnlockWorkAsRootUnderOtherEffectiveIdsAndRestoreThem) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root";
   EXPECT_EQ(
       RunInChild([this] {
         DropEffectiveIds();
@@ -294,7 +292,6 @@ TEST_F(FileLockProcessTest, LockAndUnlockWorkAsRootUnderOtherEffectiveIdsAndRest
 }
 
 TEST_F(FileLockProcessTest, TheIdsAreRestoredWhenTheLockIsBusyAndWhenItCannotBeOpened) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root";
   const Holder holder([this] { return Hold(LOCK_EX | LOCK_NB); });
   EXPECT_EQ(RunInChild([this] {
               DropEffectiveIds();
@@ -315,7 +312,6 @@ TEST_F(FileLockProcessTest, TheIdsAreRestoredWhenTheLockIsBusyAndWhenItCannotBeO
 }
 
 TEST_F(FileLockProcessTest, ALockThatOthersMayReadWorksWithoutAnyPrivileges) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root";
   {
     const mode_t before = umask(0);
     FileLock lock(name);

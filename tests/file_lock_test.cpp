@@ -23,17 +23,18 @@ static_assert(!std::is_polymorphic_v<FileLock>);
 static_assert(!std::is_convertible_v<std::string, FileLock>);
 
 using FileLockTest = LockTest;
+using FileLockNameTest = CleanTest;
 
 // --- names and paths -----------------------------------------------------------------------------
 
-TEST_F(FileLockTest, ThePathIsTheNameBelowTheLockDirectory) {
+TEST_F(FileLockNameTest, ThePathIsTheNameBelowTheLockDirectory) {
   EXPECT_EQ(FileLock::getLockFilePath("a"), "/tmp/.kelodr_lock/a");
   EXPECT_EQ(FileLock::getLockFilePath("/a/b"), "/tmp/.kelodr_lock//a/b");
   EXPECT_EQ(FileLock::getLockFilePath("../a"), "/tmp/.kelodr_lock/../a");
   EXPECT_EQ(FileLock::getLockFilePath(" "), "/tmp/.kelodr_lock/ ");
 }
 
-TEST_F(FileLockTest, AnEmptyNameHasNoPath) {
+TEST_F(FileLockNameTest, AnEmptyNameHasNoPath) {
   EXPECT_EQ(FileLock::getLockFilePath(""), "");
   ExpectLog({Err("file_lock.cpp", "getLockFilePath", "Bad lock file[]")});
 }

@@ -28,7 +28,7 @@ void Forget();
 
 }  // namespace LockCalls
 
-// Each test has a lock name of its own.
+// Each test has a lock name of its own. Skipped without root.
 class LockTest : public CleanTest {
  protected:
   void SetUp() override;
