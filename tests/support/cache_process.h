@@ -110,10 +110,10 @@ class CacheProcessTest : public CacheFixture {
                   "Failed to unlink [" + pidFile + "] with ret[-1](" + reason + ")");
   }
 
-  // A child that claims the update; its fetch causes `fetching`, then waits for `finish`, then
-  // gives "new".
-  pid_t StartUpdater(const Event& fetching, const Event& finish) const {
-    return Start([&] {
+  // A child that has claimed the update and is fetching; it waits for `finish`, then gives "new".
+  pid_t StartUpdater(const Event& finish) const {
+    const Event fetching;
+    const pid_t updater = Start([&] {
       TestCache cache = MakeCache();
       cache.fetch = [&](Json::Value& out) {
         fetching.Cause();
@@ -123,6 +123,8 @@ class CacheProcessTest : public CacheFixture {
       EXPECT_TRUE(cache.Update());
       return 0;
     });
+    EXPECT_TRUE(fetching.Wait());
+    return updater;
   }
 
   // A child that updates with required data, fetches nothing and ends with this data in memory.
