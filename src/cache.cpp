@@ -69,8 +69,9 @@ bool IsClaimed(const std::string& pidFile) {
 // True also when the lock cannot be had: somebody is claiming the update or releasing it. The lock
 // is closed on return, so that no forked child inherits it.
 bool IsBusy(const std::string& path) {
+  const std::string pidFile = PidFile(path);
   FileLock lock(LockName(path));
-  return !lock.lock(LOCK_SH | LOCK_NB, kLockTimeout) || IsClaimed(PidFile(path));
+  return !lock.lock(LOCK_SH | LOCK_NB, kLockTimeout) || IsClaimed(pidFile);
 }
 
 bool LockToRelease(FileLock& lock) {

@@ -170,7 +170,8 @@ bool Locate(std::string path, Place& place) {
   int base = AT_FDCWD;
   for (int link = 0; link <= kMaxLinks; ++link) {
     const size_t slash = path.rfind('/');
-    const std::string parent = slash == std::string::npos ? "." : path.substr(0, slash + 1);
+    std::string parent = path.substr(0, slash + 1);  // nothing where there is no slash
+    if (parent.empty()) parent = ".";
     Descriptor directory = OpenAt(base, parent, O_RDONLY | O_DIRECTORY);
     if (!directory.IsOpen()) return false;
     place.directory = std::move(directory);

@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <new>
 
 namespace KeloDRCore {
 namespace {
@@ -98,10 +99,16 @@ bool DecodeString(const char* start, const char* end, Json::Value& value) {
   return true;
 }
 
+locale_t ClassicLocale() {
+  const locale_t classic = newlocale(LC_ALL_MASK, "C", nullptr);
+  if (classic == nullptr) throw std::bad_alloc();
+  return classic;
+}
+
 // A number with a fraction, an exponent or too many digits. An overflow is an error, an underflow
 // is not.
 bool DecodeDouble(const char* start, const char* end, Json::Value& value) {
-  static const locale_t classic = newlocale(LC_ALL_MASK, "C", nullptr);
+  static const locale_t classic = ClassicLocale();
   char* stop = nullptr;
   const double number = strtod_l(start, &stop, classic);
   if (stop != end || std::isinf(number)) return false;
@@ -184,7 +191,7 @@ bool JsonReader::SkipComment() {
 
 // What stands behind the first digit or the sign; whether it is a number is seen when it is
 // decoded.
-bool JsonReader::SkipNumber() {
+void JsonReader::SkipNumber() {
   SkipDigits();
   if (current != end && *current == '.') {
     ++current;
@@ -195,7 +202,6 @@ bool JsonReader::SkipNumber() {
     if (current != end && (*current == '+' || *current == '-')) ++current;
     SkipDigits();
   }
-  return true;
 }
 
 JsonReader::Kind JsonReader::Scan() {
@@ -226,7 +232,9 @@ JsonReader::Kind JsonReader::Scan() {
     case 'n':
       return checked(SkipWord("ull"), Kind::kNull);
     default:
-      return checked((IsDigit(c) || c == '-' || c == '+') && SkipNumber(), Kind::kNumber);
+      if (!IsDigit(c) && c != '-' && c != '+') return Kind::kError;
+      SkipNumber();
+      return Kind::kNumber;
   }
 }
 

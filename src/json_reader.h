@@ -54,7 +54,7 @@ class JsonReader {
   bool SkipWord(const char* word);
   bool SkipString();
   bool SkipComment();
-  bool SkipNumber();
+  void SkipNumber();
   void SkipByteOrderMark() { SkipWord("\xEF\xBB\xBF"); }
 
   bool ReadValue(Json::Value& value, int depth);

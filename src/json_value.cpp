@@ -112,7 +112,7 @@ void Append(std::string& text, const Json::Value& value) {
     case Json::arrayValue:
       AppendArray(text, value);
       break;
-    case Json::objectValue:
+    default:  // an object
       AppendObject(text, value);
       break;
   }

@@ -56,7 +56,8 @@ Response::~Response() = default;
 bool Response::setResp(const std::string& text) { return JsonValue::fromString(resp, text); }
 
 bool Response::setResp(const char* text) {
-  return text != nullptr && JsonValue::fromString(resp, text);
+  if (text == nullptr) return false;
+  return JsonValue::fromString(resp, text);
 }
 
 void Response::setResp(const Json::Value& document) { resp = document; }

@@ -240,8 +240,9 @@ std::string SelectCommand::GetCommand() const {
 }
 
 void SelectCommand::DumpParam(std::stringstream& stream) const {
-  stream << "condition:[" << condition << "]/fields:["
-         << (selectAll ? "all" : Container::ToString(fields, ", ")) << "]";
+  std::string names = "all";
+  if (!selectAll) names = Container::ToString(fields, ", ");
+  stream << "condition:[" << condition << "]/fields:[" << names << "]";
 }
 
 bool SelectCommand::AddField(const std::string& field) {
@@ -311,7 +312,9 @@ std::string DeleteCommand::GetCommand() const {
 }
 
 void DeleteCommand::DumpParam(std::stringstream& stream) const {
-  stream << "condition:[" << (condition.empty() && deleteAll ? "all" : condition) << "]";
+  std::string rows = condition;
+  if (rows.empty() && deleteAll) rows = "all";
+  stream << "condition:[" << rows << "]";
 }
 
 void DeleteCommand::DeleteAll() { deleteAll = true; }

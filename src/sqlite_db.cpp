@@ -45,15 +45,11 @@ auto ThrowOnlyBadAlloc(const Action& action) {
   }
 }
 
-const char* OrEmpty(const char* text) { return text != nullptr ? text : ""; }
-
-// SQLite answers null too when it has no memory for a text; that must not turn into an empty one.
-const char* ColumnText(sqlite3_stmt* stmt, int column) {
-  const auto* const text = reinterpret_cast<const char*>(sqlite3_column_text(stmt, column));
-  if (text == nullptr && sqlite3_errcode(sqlite3_db_handle(stmt)) == SQLITE_NOMEM) {
-    throw std::bad_alloc();
-  }
-  return OrEmpty(text);
+// SQLite answers null for a name, or a text that is there, only when it has no memory for it. That
+// must not turn into an empty one.
+const char* TextOf(const void* text) {
+  if (text == nullptr) throw std::bad_alloc();
+  return static_cast<const char*>(text);
 }
 
 // Turns the rows of one statement into records. Made at a row: before the first one the statement
@@ -64,7 +60,7 @@ class RowReader {
     const int columns = sqlite3_column_count(stmt);
     names.reserve(static_cast<size_t>(columns));
     for (int column = 0; column < columns; ++column) {
-      names.emplace_back(OrEmpty(sqlite3_column_name(stmt, column)));
+      names.emplace_back(TextOf(sqlite3_column_name(stmt, column)));
     }
   }
 
@@ -84,7 +80,7 @@ class RowReader {
         Add(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
         break;
       case SQLITE_TEXT:
-        Add(record, name, ColumnText(stmt, column));
+        Add(record, name, TextOf(sqlite3_column_text(stmt, column)));
         break;
       case SQLITE_NULL:
         KELODR_LOG(WARN, function, "field [%s] has null value", name.c_str());
