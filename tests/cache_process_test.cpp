@@ -5,7 +5,6 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/file.h>
-#include <sys/resource.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -18,6 +17,7 @@
 #include <stdexcept>
 
 #include "kelodrcore/file_lock.h"
+#include "support/process.h"
 #include "support/test_clock.h"
 
 namespace {
@@ -78,6 +78,15 @@ TEST_F(CacheProcessTest, AnExceptionReleasesTheClaimAndReachesTheCaller) {
   EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{});
   EXPECT_TRUE(FileLock(lockName).tryLock(LOCK_EX | LOCK_NB));
   ExpectLog({Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, AnExceptionOfTheTestOfTheDataReachesTheCaller) {
+  WriteCacheFile("1");
+  TestCache cache = MakeCache(false);
+  cache.isValid = [](const Json::Value&) -> bool { throw std::runtime_error("test"); };
+  EXPECT_THROW(cache.Update(), std::runtime_error);
+  EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{"c.cached"});
+  ExpectLog({});
 }
 
 TEST_F(CacheProcessTest, NoClaimWhileAnotherReaderKeepsTheLock) {
@@ -413,13 +422,12 @@ TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {
   const pid_t child = Start([&] {
     const TestCache cache = MakeCache(false);
     const std::set<int> open = OpenDescriptors();
-    rlimit limit{0, 0};
+    rlim_t limit = 0;
     // Two free descriptors: enough for the lock and the pid file, too few to fork with.
-    for (int free = 0; free < 2; ++limit.rlim_cur) {
-      if (open.count(static_cast<int>(limit.rlim_cur)) == 0) ++free;
+    for (int free = 0; free < 2; ++limit) {
+      if (open.count(static_cast<int>(limit)) == 0) ++free;
     }
-    limit.rlim_max = limit.rlim_cur;
-    EXPECT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+    LowerLimit(RLIMIT_NOFILE, limit);
     const LogLine failed =
         Warn("cache.cpp", "Update", "Failed to fork(). errno=[24/Too many open files]");
     EXPECT_FALSE(cache.Update());

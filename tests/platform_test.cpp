@@ -2,8 +2,8 @@
 // are in platform_program_test.cpp, forks in platform_fork_test.cpp.
 
 #include <fcntl.h>
+#include <sys/mount.h>
 #include <sys/prctl.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -15,6 +15,7 @@
 #include <climits>
 #include <csignal>
 #include <cstdlib>
+#include <functional>
 #include <string>
 #include <thread>
 
@@ -263,8 +264,7 @@ TEST_F(PidFileTest, FailsWithErrnoOverADirectory) {
 TEST_F(PidFileTest, LeavesNothingBehindWhenItCannotBeWritten) {
   EXPECT_EQ(RunInChild([&] {
               signal(SIGXFSZ, SIG_IGN);
-              const rlimit none{0, 0};
-              ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &none), 0);
+              LowerLimit(RLIMIT_FSIZE, 0);
               EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
               EXPECT_EQ(errno, EFBIG);
             }),
@@ -276,8 +276,7 @@ TEST_F(PidFileTest, LeavesNothingBehindWhenItCannotBeWritten) {
 TEST_F(PidFileTest, LeavesNothingBehindWhenItIsCutShort) {
   EXPECT_EQ(RunInChild([&] {
               signal(SIGXFSZ, SIG_IGN);
-              const rlimit two{2, 2};
-              ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &two), 0);
+              LowerLimit(RLIMIT_FSIZE, 2);
               EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
               EXPECT_EQ(errno, ENOSPC);
             }),
@@ -364,6 +363,43 @@ TEST_F(ProcAliveTest, IsOneWhereTheProcessCannotBeLookedAt) {
               EXPECT_NE(KLIBCProcPidFileCreate("/mine"), 0);
             }),
             0);
+}
+
+// What another kernel, or another file system at /proc, would tell of this process.
+class ProcStatTest : public CleanTest {
+ protected:
+  void RunWithStat(const std::string& text, const std::function<void()>& body) {
+    if (!RunWithOwnMounts([&] {
+          const std::string own = "/proc/" + std::to_string(getpid());
+          ASSERT_EQ(mount("tmpfs", "/proc", "tmpfs", 0, "size=64k"), 0);
+          ASSERT_EQ(mkdir(own.c_str(), 0755), 0);
+          WriteText(own + "/stat", text);
+          body();
+        })) {
+      GTEST_SKIP() << "needs the right to mount a file system";
+    }
+  }
+};
+
+TEST_F(ProcStatTest, AnotherFormTellsNothing) {
+  for (const char* const text : {"", "1234", "1234 (x", "1234 (x) S", "1234 (x) S 1 2 3"}) {
+    RunWithStat(text, [this] {
+      EXPECT_EQ(KLIBCProcAlive(getpid()), 1);
+      WriteText(Path("pid"), std::to_string(getpid()) + "\n1\n");
+      EXPECT_EQ(KLIBCReadPidFile(Path("pid").c_str()), getpid());
+      errno = 0;
+      EXPECT_NE(KLIBCProcPidFileCreate(Path("mine").c_str()), 0);
+      EXPECT_EQ(errno, ENOENT);
+    });
+    EXPECT_EQ(NamesIn(dir), std::vector<std::string>{"pid"}) << text;
+  }
+}
+
+// Kernels have shown it for a moment between a process's end and its removal.
+TEST_F(ProcStatTest, ADeadProcessIsNotAlive) {
+  const std::string rest = " 1 1 1 0 -1 4194304 1 0 0 0 0 0 0 0 20 0 1 0 77 0 0";
+  RunWithStat("1 (x) X" + rest, [] { EXPECT_EQ(KLIBCProcAlive(getpid()), 0); });
+  RunWithStat("1 (x) S" + rest, [] { EXPECT_EQ(KLIBCProcAlive(getpid()), 1); });
 }
 
 // /proc calls a process a zombie as soon as its first thread ends.

@@ -6,6 +6,8 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <initializer_list>
+
 namespace {
 
 constexpr int kMaxDumps = 8;
@@ -14,10 +16,12 @@ int count = 0;
 
 // The limits of a test are not meant for the counts.
 void LiftLimits() {
-  const rlimit files{64, 64};
-  const rlimit size{RLIM_INFINITY, RLIM_INFINITY};
-  setrlimit(RLIMIT_NOFILE, &files);
-  setrlimit(RLIMIT_FSIZE, &size);
+  for (const auto resource : {RLIMIT_NOFILE, RLIMIT_FSIZE}) {
+    rlimit limit{};
+    getrlimit(resource, &limit);
+    limit.rlim_cur = limit.rlim_max;
+    setrlimit(resource, &limit);
+  }
 }
 
 }  // namespace

@@ -36,10 +36,15 @@ inline void ReapEverything(int /*signalNumber*/) {
   errno = savedErrno;
 }
 
-// Takes every descriptor number but those of the standard streams.
-inline void LeaveNoDescriptors() {
-  const rlimit limit{3, 3};
-  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+// Lowers what is allowed, not what could be allowed again.
+inline void LowerLimit(decltype(RLIMIT_NOFILE) resource, rlim_t value) {
+  rlimit limit{};
+  ASSERT_EQ(getrlimit(resource, &limit), 0);
+  limit.rlim_cur = value;
+  ASSERT_EQ(setrlimit(resource, &limit), 0);
 }
+
+// Takes every descriptor number but those of the standard streams.
+inline void LeaveNoDescriptors() { LowerLimit(RLIMIT_NOFILE, 3); }
 
 #endif  // KELODRCORE_TESTS_SUPPORT_PROCESS_H_
