@@ -1,6 +1,7 @@
 #include "kelodrcore/file_lock.h"
 
 #include <fcntl.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -182,6 +183,29 @@ TEST_F(FileLockTest, ARemovedFileIsMadeAnewWhenItIsOpenedAgain) {
   ASSERT_EQ(unlink(path.c_str()), 0);
   EXPECT_TRUE(lock.openLockedFile());
   EXPECT_GE(DescriptorOf(path), 0);
+}
+
+// One inode number can stand for two files, each on a file system of its own.
+TEST_F(FileLockTest, AFileOnAnotherFileSystemIsAnotherFile) {
+  const auto mountTmp = [] { EXPECT_EQ(mount("tmpfs", "/tmp", "tmpfs", 0, "size=64k"), 0); };
+  const auto inode = [this] {
+    struct stat status = {};
+    EXPECT_EQ(stat(path.c_str(), &status), 0);
+    return status.st_ino;
+  };
+  if (!RunWithOwnMounts([&] {
+        mountTmp();
+        FileLock lock(name);
+        ASSERT_TRUE(lock.openLockedFile());
+        const ino_t first = inode();
+        mountTmp();
+        { ASSERT_TRUE(FileLock(name).openLockedFile()); }
+        ASSERT_EQ(inode(), first);
+        EXPECT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 0));
+        EXPECT_FALSE(IsFree());
+      })) {
+    GTEST_SKIP() << "needs the right to mount a file system";
+  }
 }
 
 TEST_F(FileLockTest, ARemovedFileIsClosedWhateverItsDescriptor) {

@@ -113,6 +113,18 @@ TEST_F(JsonValueFileTest, WhatCannotBeReadLeavesTheValue) {
   EXPECT_EQ(value, Json::Value("untouched"));
 }
 
+// A file of zeros that take no room, on a file system that has no limit of its own.
+TEST_F(JsonValueFileTest, AFileLongerThanATextCanBeIsNotRead) {
+  if (!RunWithOwnMounts([this] {
+        ASSERT_EQ(mount("tmpfs", dir.c_str(), "tmpfs", 0, "size=64k"), 0);
+        WriteText(Path("a"), "");
+        ASSERT_EQ(truncate(Path("a").c_str(), static_cast<off_t>(std::string().max_size())), 0);
+        ExpectNotRead(Path("a"), EFBIG);
+      })) {
+    GTEST_SKIP() << "needs the right to mount a file system";
+  }
+}
+
 TEST_F(JsonValueFileTest, APathWithANulByteNamesNoFile) {
   WriteText(Path("a"), "1");
   const std::string path = Path("a") + std::string("\0b", 2);
@@ -170,13 +182,17 @@ TEST_F(JsonValueFileTest, AFileKeepsItsMode) {
 TEST_F(JsonValueFileTest, AFileKeepsItsOwnerAndTheSetIdBits) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to give files away";
   WriteText(Path("a"), "1");
-  ASSERT_EQ(chown(Path("a").c_str(), 1234, 5678), 0);
-  ASSERT_EQ(chmod(Path("a").c_str(), 06755), 0);
-  ASSERT_TRUE(toFile(Document("x"), Path("a")));
-  EXPECT_EQ(StatOf(Path("a")).st_uid, 1234U);
-  EXPECT_EQ(StatOf(Path("a")).st_gid, 5678U);
-  EXPECT_EQ(ModeOf(Path("a")), 06755U);
-  ExpectDocument(Path("a"), Document("x"));
+  for (const uid_t uid : {0U, 1234U}) {
+    for (const gid_t gid : {0U, 5678U}) {
+      ASSERT_EQ(chown(Path("a").c_str(), uid, gid), 0);
+      ASSERT_EQ(chmod(Path("a").c_str(), 06755), 0);
+      ASSERT_TRUE(toFile(Document("x"), Path("a")));
+      EXPECT_EQ(StatOf(Path("a")).st_uid, uid);
+      EXPECT_EQ(StatOf(Path("a")).st_gid, gid);
+      EXPECT_EQ(ModeOf(Path("a")), 06755U);
+      ExpectDocument(Path("a"), Document("x"));
+    }
+  }
 }
 
 TEST_F(JsonValueFileTest, AnOwnerThatCannotBeKeptIsAFailure) {

@@ -277,6 +277,10 @@ TEST_F(JsonValueTest, AcceptsAndDropsComments) {
   EXPECT_EQ(value.getComment(Json::commentBefore), "");
 }
 
+TEST_F(JsonValueTest, ACommentEndsAtACarriageReturnAsWell) {
+  EXPECT_EQ(toString(Parsed("[1, // one\r2, // two\r\n3]")), "[1,2,3]");
+}
+
 TEST_F(JsonValueTest, SkipsAByteOrderMark) { EXPECT_EQ(Parsed("\xEF\xBB\xBF[1]").size(), 1U); }
 
 TEST_F(JsonValueTest, IsAsLenientAsJsonCppInsideTheDocument) {
@@ -311,6 +315,7 @@ TEST_F(JsonValueTest, RefusesSyntaxErrors) {
         "}",     ":",        "[}",        "{]"}) {
     ExpectRefused(text);
   }
+  ExpectRefused(std::string("\"\\\0\"", 4));
 }
 
 TEST_F(JsonValueTest, RefusesMoreThanAThousandLevels) {

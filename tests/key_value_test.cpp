@@ -88,6 +88,14 @@ TYPED_TEST(EveryInstanceTest, AFileThatCannotBeOpenedIsAnErrorThatLeavesTheMap) 
   this->ExpectLog({Warn("file.cpp", "Read", "File[" + path + "] is not opened.")});
 }
 
+// The memory of a process has a file, and nothing is mapped at its start.
+TYPED_TEST(EveryInstanceTest, AFileThatCannotBeReadIsAnErrorThatLeavesTheMap) {
+  typename TestFixture::Map map{{"old", {}}};
+  EXPECT_EQ(File::Read("/proc/self/mem", map), -1);
+  EXPECT_EQ(map.count("old"), 1U);
+  this->ExpectLog({Warn("file.cpp", "Read", "File[/proc/self/mem] is not opened.")});
+}
+
 TYPED_TEST(EveryInstanceTest, AnEmptyFileClearsTheMap) {
   typename TestFixture::Map map{{"old", {}}};
   EXPECT_EQ(this->Read("", map), 0);

@@ -116,13 +116,15 @@ TEST_F(SqliteDBRowTest, TheAliasNamesTheField) {
 
 TEST_F(SqliteDBRowTest, TheLastOfTwoColumnsOfOneNameCounts) {
   EXPECT_EQ(First(*db, "SELECT 1 AS n, 'x' AS n").ToStr(), "n:'x'");
+  EXPECT_EQ(First(*db, "SELECT 'x' AS n, 1 AS n").ToStr(), "n:1");
   EXPECT_EQ(First(*db, "SELECT 1 AS n, NULL AS n").ToStr(), "n:1");
   ExpectLog({Warn(kFile, "SelectByCommand", "field [n] has null value")});
 }
 
 TEST_F(SqliteDBRowTest, AColumnWithoutANameIsRefusedByTheRecord) {
-  EXPECT_EQ(First(*db, "SELECT 1 AS \"\", 2 AS n").ToStr(), "n:2");
-  ExpectLog({Err("sqlite_value.cpp", "AddValue", "Bad Field[] or value [1]")});
+  EXPECT_EQ(First(*db, "SELECT 1 AS \"\", 2 AS n, 'x' AS ''").ToStr(), "n:2");
+  ExpectLog({Err("sqlite_value.cpp", "AddValue", "Bad Field[] or value [1]"),
+             Err("sqlite_value.cpp", "AddValue", "Bad Field[] or value ['x']")});
 }
 
 TEST_F(SqliteDBRowTest, OneRecordIsReplacedNotMerged) {

@@ -166,24 +166,44 @@ TEST_F(SqliteValueListTest, AMissingFieldGivesAnInvalidValueThatLivesWithTheList
   LogCapture::Clear();
 }
 
+// Holds for a `T` of any value that it is not read from the field.
+template <typename T>
+void ExpectNotRead(const SqliteValueList& list, const std::string& field, const T& value) {
+  T out = value;
+  EXPECT_FALSE(list.GetValue(field, out)) << field;
+  EXPECT_EQ(out, value) << field;
+}
+
+// For each type that can be read.
+void ExpectNotRead(const SqliteValueList& list, const std::string& field) {
+  ExpectNotRead<bool>(list, field, true);
+  ExpectNotRead<int>(list, field, 7);
+  ExpectNotRead<unsigned int>(list, field, 7);
+  ExpectNotRead<long>(list, field, 7);
+  ExpectNotRead<unsigned long>(list, field, 7);
+  ExpectNotRead<long long>(list, field, 7);
+  ExpectNotRead<unsigned long long>(list, field, 7);
+  ExpectNotRead<std::string>(list, field, "seven");
+}
+
+constexpr size_t kReadableTypes = 8;
+
 TEST_F(SqliteValueListTest, AnEmptyNameIsNoField) {
   const SqliteValueList list = ListOf({{"a", 1}});
   EXPECT_FALSE(list.GetValue("").IsValid());
   ExpectInvalidField("GetValue");
   EXPECT_FALSE(list.HasField(""));
   ExpectInvalidField("HasField");
-  int out = 7;
-  EXPECT_FALSE(list.GetValue("", out));
-  ExpectInvalidField("GetValue");
-  EXPECT_EQ(out, 7);
+  ExpectNotRead(list, "");
+  ExpectLog(std::vector<LogLine>(kReadableTypes,
+                                 Err("sqlite_value.cpp", "GetValue", "Invalid field []")));
 }
 
 TEST_F(SqliteValueListTest, AMissingFieldLeavesOutAlone) {
   const SqliteValueList list = ListOf({{"a", 1}});
-  int out = 7;
-  EXPECT_FALSE(list.GetValue("b", out));
-  EXPECT_EQ(out, 7);
-  ExpectLog({Debug("sqlite_value.cpp", "GetValue", "field [b] is not existed")});
+  ExpectNotRead(list, "b");
+  ExpectLog(std::vector<LogLine>(
+      kReadableTypes, Debug("sqlite_value.cpp", "GetValue", "field [b] is not existed")));
 }
 
 TEST_F(SqliteValueListTest, AFieldOfAnotherTypeLeavesOutAlone) {
