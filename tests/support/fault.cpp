@@ -14,6 +14,8 @@
 #include <iostream>
 #include <new>
 
+#include "support/interception.h"
+
 namespace {
 
 // Shared with forked children, so that their calls are part of one count.
@@ -85,9 +87,12 @@ bool Outcome::Failed(const std::string& call) const {
 }
 
 bool Hits(const char* call, std::initializer_list<int> errors) {
-  if (state == nullptr || !state->armed || suspensions > 0 || LogCapture::IsRecording()) {
-    return false;
+  if (suspensions > 0 || LogCapture::IsRecording()) return false;
+  if (const int error = Intercept(call); error != kGoOn) {
+    errno = error;
+    return true;
   }
+  if (state == nullptr || !state->armed) return false;
   const Plan& plan = state->plan;
   if (std::find(errors.begin(), errors.end(), plan.error) == errors.end()) return false;
   const int number = ++state->calls;

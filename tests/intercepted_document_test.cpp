@@ -1,0 +1,152 @@
+// Another process that comes between two calls of a document's reader or writer.
+
+#include <fcntl.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+
+#include "kelodrcore/json_value.h"
+#include "support/clean_test.h"
+#include "support/interception.h"
+
+namespace {
+
+using Fault::Interception;
+using Fault::kGoOn;
+using KeloDRCore::JsonValue::fromFile;
+using KeloDRCore::JsonValue::toFile;
+using KeloDRCore::JsonValue::toString;
+
+class InterceptedDocumentTest : public CleanTest {
+ protected:
+  using Names = std::vector<std::string>;
+
+  void SetUp() override {
+    CleanTest::SetUp();
+    path = Path("document");
+    temporary = Path(".document.kelodr-" + std::to_string(geteuid()));
+    umask(022);
+  }
+
+  void ExpectWritten() {
+    EXPECT_TRUE(toFile("new", path));
+    EXPECT_EQ(ReadText(path), "\"new\"");
+    EXPECT_EQ(NamesIn(dir), Names{"document"});
+  }
+
+  void ExpectNotWritten(int error) {
+    errno = 0;
+    EXPECT_FALSE(toFile("new", path));
+    EXPECT_EQ(errno, error);
+  }
+
+  std::string path;
+  std::string temporary;
+};
+
+TEST_F(InterceptedDocumentTest, AFileThatGrowsWhileItIsReadIsReadToItsEnd) {
+  const std::string more(10000, ' ');
+  WriteText(path, "[1,");
+  const Interception writer("read", 1, [&] {
+    WriteText(path, "[1," + more + "2,");
+    return kGoOn;
+  });
+  const Interception later("read", 3, [&] {
+    WriteText(path, "[1," + more + "2," + more + "3]");
+    return kGoOn;
+  });
+  Json::Value value;
+  EXPECT_TRUE(fromFile(value, path));
+  EXPECT_EQ(toString(value), "[1,2,3]");
+  EXPECT_TRUE(writer.HasRun());
+  EXPECT_TRUE(later.HasRun());
+}
+
+TEST_F(InterceptedDocumentTest, LinksThatBecomeALoopAreRefused) {
+  WriteText(Path("file"), "\"old\"");
+  ASSERT_EQ(symlink("file", path.c_str()), 0);
+  const Interception other("openat", 1, [&] {
+    EXPECT_EQ(unlink(path.c_str()), 0);
+    EXPECT_EQ(symlink("document", path.c_str()), 0);
+    return kGoOn;
+  });
+  ExpectNotWritten(ELOOP);
+  EXPECT_TRUE(other.HasRun());
+  EXPECT_EQ(NamesIn(dir), (Names{"document", "file"}));
+  EXPECT_EQ(ReadText(Path("file")), "\"old\"");
+}
+
+TEST_F(InterceptedDocumentTest, ADirectoryThatComesIntoBeingIsNotReplaced) {
+  const std::string made = path;
+  path += "/";
+  const Interception other("openat", 1, [&] {
+    EXPECT_EQ(mkdir(made.c_str(), 0755), 0);
+    return kGoOn;
+  });
+  ExpectNotWritten(EISDIR);
+  EXPECT_TRUE(other.HasRun());
+  EXPECT_EQ(NamesIn(made), Names{});
+}
+
+// Between a look at it and the next call to it.
+TEST_F(InterceptedDocumentTest, ALeftTemporaryMayBeRemovedBySomebodyElse) {
+  for (const char* const call : {"openat", "unlinkat"}) {
+    WriteText(temporary, "half");
+    // The directory is opened first, then the temporary is to be made, then opened.
+    const Interception other(call, std::string(call) == "openat" ? 3 : 1, [&] {
+      EXPECT_EQ(unlink(temporary.c_str()), 0);
+      return kGoOn;
+    });
+    ExpectWritten();
+    EXPECT_TRUE(other.HasRun()) << call;
+  }
+}
+
+TEST_F(InterceptedDocumentTest, APlantedLinkMayBeRemovedBySomebodyElse) {
+  ASSERT_EQ(symlink("nowhere", temporary.c_str()), 0);
+  const Interception other("flock", 1, [&] {
+    EXPECT_EQ(unlink(temporary.c_str()), 0);
+    return kGoOn;
+  });
+  ExpectWritten();
+  EXPECT_TRUE(other.HasRun());
+}
+
+// That other writer is dead when its temporary is found.
+TEST_F(InterceptedDocumentTest, APlantedLinkMayHaveBecomeTheTemporaryOfAnotherWriter) {
+  ASSERT_EQ(symlink("nowhere", temporary.c_str()), 0);
+  const Interception other("flock", 1, [&] {
+    EXPECT_EQ(unlink(temporary.c_str()), 0);
+    WriteText(temporary, "half");
+    return kGoOn;
+  });
+  // Only a leftover is opened for reading alone, and closed again.
+  ExpectWritten();
+  EXPECT_TRUE(other.HasRun());
+}
+
+// What is mounted over the temporary may have its inode number.
+TEST_F(InterceptedDocumentTest, AFileOfAnotherFileSystemIsNotTheTemporary) {
+  WriteText(path, "\"old\"");
+  ASSERT_EQ(mkdir(Path("other").c_str(), 0755), 0);
+  if (!RunWithOwnMounts([this] {
+        ASSERT_EQ(mount("tmpfs", Path("other").c_str(), "tmpfs", 0, "size=64k"), 0);
+        WriteText(Path("other/file"), "mine");
+        const Interception other("flock", 1, [this] {
+          EXPECT_EQ(mount(Path("other/file").c_str(), temporary.c_str(), nullptr, MS_BIND, nullptr),
+                    0);
+          return kGoOn;
+        });
+        ExpectNotWritten(EBUSY);
+        EXPECT_TRUE(other.HasRun());
+        EXPECT_EQ(ReadText(path), "\"old\"");
+        EXPECT_EQ(ReadText(temporary), "mine");
+      })) {
+    GTEST_SKIP() << "needs the right to mount a file system";
+  }
+}
+
+}  // namespace
