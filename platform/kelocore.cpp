@@ -20,46 +20,21 @@
 #include <utility>
 #include <vector>
 
+#include "descriptor.h"
+#include "retry.h"
+
 namespace {
+
+using KeloDRCore::Descriptor;
+using KeloDRCore::Retry;
 
 constexpr char kWhiteSpace[] = " \t\n\r\v\f";
 constexpr int kFirstFreeDescriptor = STDERR_FILENO + 1;
 
-// Repeats a system call that a signal interrupted.
-template <typename Call>
-auto Retry(Call call) {
-  auto result = call();
-  while (result < 0 && errno == EINTR) result = call();
-  return result;
-}
-
-// Owns a descriptor; closing it leaves errno alone, so that failure paths need not save it.
-class Descriptor {
- public:
-  explicit Descriptor(int owned = -1) : fd(owned) {}
-  Descriptor(Descriptor&& other) noexcept : fd(other.Release()) {}
-  Descriptor& operator=(Descriptor&& other) noexcept {
-    std::swap(fd, other.fd);
-    return *this;
-  }
-  ~Descriptor() { Close(); }
-
-  int Get() const { return fd; }
-  int Release() { return std::exchange(fd, -1); }
-  void Close() {
-    const int savedErrno = errno;
-    if (fd >= 0) close(Release());
-    errno = savedErrno;
-  }
-
- private:
-  int fd;
-};
-
 // The same file above the standard streams, which a caller may have closed: what is put on one of
 // their numbers later must not hit it.
 Descriptor AboveStandardStreams(Descriptor descriptor) {
-  if (descriptor.Get() < 0 || descriptor.Get() >= kFirstFreeDescriptor) return descriptor;
+  if (!descriptor.IsOpen() || descriptor.Get() >= kFirstFreeDescriptor) return descriptor;
   return Descriptor(fcntl(descriptor.Get(), F_DUPFD_CLOEXEC, kFirstFreeDescriptor));
 }
 
@@ -74,7 +49,7 @@ struct Pipe {
     Descriptor second(ends[1]);
     readEnd = AboveStandardStreams(std::move(first));
     writeEnd = AboveStandardStreams(std::move(second));
-    return readEnd.Get() >= 0 && writeEnd.Get() >= 0;
+    return readEnd.IsOpen() && writeEnd.IsOpen();
   }
 };
 
@@ -260,7 +235,7 @@ FILE* OpenStream(const char* program, const char* mode, char* const argv[]) {
 ssize_t ReadStart(const char* path, char* buffer, size_t size) {
   const Descriptor file(
       Retry([&] { return open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY); }));
-  if (file.Get() < 0) return -1;
+  if (!file.IsOpen()) return -1;
   size_t length = 0;
   while (length < size) {
     const ssize_t count = Retry([&] { return read(file.Get(), buffer + length, size - length); });
@@ -449,7 +424,7 @@ int KLIBCProcPidFileCreate(const char* path) {
   if (unlink(path) != 0 && errno != ENOENT) return -1;
   const Descriptor file(Retry(
       [&] { return open(path, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644); }));
-  if (file.Get() < 0) return -1;
+  if (!file.IsOpen()) return -1;
   if (WritePidFile(file.Get(), text)) return 0;
   const int savedErrno = errno;
   unlink(path);
@@ -463,7 +438,7 @@ int KLIBCProcForkEx(int flags) {
   if ((flags & kForkSession) != 0) {
     null = AboveStandardStreams(
         Descriptor(Retry([] { return open("/dev/null", O_RDWR | O_CLOEXEC); })));
-    if (null.Get() < 0) return -1;
+    if (!null.IsOpen()) return -1;
   }
   const pid_t pid = (flags & kForkDetached) != 0 ? ForkDetached() : fork();
   if (pid != 0 || (flags & kForkSession) == 0) return pid;

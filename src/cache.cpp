@@ -104,7 +104,7 @@ bool WriteFile(const Json::Value& document, const std::string& path) {
 // Runs `step` until it succeeds, at most `limit` + 2 times (but once at least), with a sleep of
 // `minSleep` to `maxSleep` milliseconds in between; false when it never did.
 template <typename Step>
-bool Retry(int limit, unsigned int minSleep, unsigned int maxSleep, const Step& step) {
+bool TryRepeatedly(int limit, unsigned int minSleep, unsigned int maxSleep, const Step& step) {
   for (long long attempt = 0; !step(); ++attempt) {
     if (limit < attempt) return false;
     RandomSleepInMSec(minSleep, maxSleep);
@@ -279,7 +279,7 @@ bool Cache::DoUpdate() const {
     data = Json::Value();
     return GetUpdatedData(data);
   };
-  if (!Retry(retryLimit, 500, 1000, fetch)) {
+  if (!TryRepeatedly(retryLimit, 500, 1000, fetch)) {
     KELODR_LOG(DEBUG, __func__, "Failed to get updated cache [%s] and reach the retry limit[%d]",
                JsonValue::toString(GetInfo()).c_str(), retryLimit);
     return false;
@@ -297,7 +297,7 @@ bool Cache::UpdateWithData(const Json::Value& data, long long begin, long long f
   }
   Json::Value document = MakeDocument(data, begin, finish);
   const auto write = [this, &document] { return WriteFile(document, path); };
-  if (!Retry(retryLimit, 300, 1000, write)) {
+  if (!TryRepeatedly(retryLimit, 300, 1000, write)) {
     KELODR_LOG(DEBUG, __func__, "Failed to write cache to file [%s] and reach retry limit[%d]",
                path.c_str(), retryLimit);
     return false;

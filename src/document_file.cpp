@@ -28,6 +28,7 @@
 #include <optional>
 #include <utility>
 
+#include "descriptor.h"
 #include "retry.h"
 
 namespace KeloDRCore {
@@ -44,27 +45,6 @@ bool Fail(int error) {
   errno = error;
   return false;
 }
-
-class Descriptor {
- public:
-  Descriptor() = default;
-  explicit Descriptor(int number) : fd(number) {}
-  Descriptor(Descriptor&& other) noexcept : fd(std::exchange(other.fd, -1)) {}
-  Descriptor& operator=(Descriptor&& other) noexcept {
-    std::swap(fd, other.fd);
-    return *this;
-  }
-  ~Descriptor() {
-    const int saved = errno;
-    if (fd >= 0) close(fd);  // not made again: Linux frees the number even when interrupted
-    errno = saved;
-  }
-  bool IsOpen() const { return fd >= 0; }
-  int Get() const { return fd; }
-
- private:
-  int fd = -1;
-};
 
 Descriptor OpenAt(int directory, const std::string& name, int flags, mode_t mode = 0) {
   return Descriptor(
