@@ -78,6 +78,14 @@ class AnyCommandTest : public SqliteCommandTest {
     if (std::is_same_v<Command, UpdateCommand>) return "Bad update command";
     return std::is_same_v<Command, SelectCommand> ? "Bad select command" : "Bad delete command";
   }
+
+  // The statement of a command that holds nothing but its table.
+  static std::string BareStatement(const std::string& table) {
+    if (std::is_same_v<Command, InsertCommand>) return "INSERT INTO " + table + " () VALUES ();";
+    if (std::is_same_v<Command, UpdateCommand>) return "UPDATE " + table + " SET ";
+    return std::is_same_v<Command, SelectCommand> ? "SELECT FROM " + table
+                                                  : "DELETE FROM " + table + ";";
+  }
 };
 using AllCommands = testing::Types<InsertCommand, UpdateCommand, SelectCommand, DeleteCommand>;
 TYPED_TEST_SUITE(AnyCommandTest, AllCommands, ClassName);
@@ -157,7 +165,8 @@ TYPED_TEST(AnyCommandTest, GetCommandAsksTheVirtualValidity) {
    public:
     bool IsValid() const override { return true; }
   };
-  EXPECT_NE(OnTable<Accepting>().GetCommand(), "");
+  const std::string odd = "a, \"it's\"; -- \n";  // a name is written as given
+  EXPECT_EQ(OnTable<Accepting>(odd).GetCommand(), this->BareStatement(odd));
 }
 
 // What insert and update share.

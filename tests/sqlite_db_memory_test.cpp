@@ -11,12 +11,6 @@
 
 namespace {
 
-using KeloDRCore::InsertCommand;
-using KeloDRCore::SelectCommand;
-using KeloDRCore::SqliteDB;
-using KeloDRCore::SqliteTableHandler;
-using KeloDRCore::SqliteValueList;
-
 // Allocations until one fails; below 0 none does.
 int allocationsLeft = -1;
 
@@ -73,30 +67,25 @@ TEST_F(SqliteDBMemoryTest, ExecFailsCleanly) {
 
 TEST_F(SqliteDBMemoryTest, QueriesFailCleanly) {
   FailEachAllocation([](SqliteDB& scarce) {
-    SqliteValueList record;
-    scarce.SelectByCommand("SELECT n, s, NULL AS empty FROM t", record);
+    SqliteValueList row;
+    scarce.SelectByCommand("SELECT n, s, NULL AS empty FROM t", row);
   });
   FailEachAllocation([](SqliteDB& scarce) {
-    std::vector<SqliteValueList> records;
-    scarce.SelectByCommand("SELECT n, s, abs(-9223372036854775808) FROM t", records);
+    Records rows;
+    scarce.SelectByCommand("SELECT n, s, abs(-9223372036854775808) FROM t", rows);
   });
 }
 
 TEST_F(SqliteDBMemoryTest, CommandsFailCleanly) {
   const SqliteTableHandler table("t", "n, s");
   FailEachAllocation([&](SqliteDB& scarce) {
-    InsertCommand insert;
-    insert.SetTable(table);
-    insert.AddFieldValue("n", 2);
+    InsertCommand insert = InsertOf(table, "n", 2);
     insert.AddFieldValue("s", "it's a text");
     scarce.InsertRecord(insert);
   });
   FailEachAllocation([&](SqliteDB& scarce) {
-    SelectCommand select;
-    select.SetTable(table);
-    select.SelectAll();
-    std::vector<SqliteValueList> records;
-    scarce.SelectRecords(select, records);
+    Records rows;
+    scarce.SelectRecords(SelectAll(table), rows);
   });
 }
 

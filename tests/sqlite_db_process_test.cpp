@@ -15,22 +15,9 @@
 
 namespace {
 
-using KeloDRCore::InsertCommand;
-using KeloDRCore::SelectCommand;
-using KeloDRCore::SqliteDB;
-using KeloDRCore::SqliteTableHandler;
-using KeloDRCore::SqliteValueList;
-using testing::AllOf;
-using testing::Each;
 using testing::ElementsAre;
-using testing::Ge;
 using testing::IsEmpty;
-using testing::Le;
-using testing::SizeIs;
 
-using Records = std::vector<SqliteValueList>;
-
-const std::string kFile = "sqlite_db.cpp";
 const Json::Value kBusy = Error(405, 5, "database is locked");
 
 // A child process that holds an exclusive lock on a database from construction until Release().
@@ -97,7 +84,7 @@ TEST_F(SqliteDBProcessTest, EachAttemptReallyWaitsOneSecond) {
   EXPECT_FALSE(db->Exec("INSERT INTO t VALUES (2)"));
   EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::seconds(1));
   EXPECT_EQ(Pauses::SqliteWait(), 1000U);
-  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  Pauses::ExpectCount(0);
   EXPECT_EQ(db->GetErr(), kBusy);
   ExpectLog({ExecFailed("Exec", 1, "INSERT INTO t VALUES (2)", kBusy)});
 }
@@ -106,10 +93,8 @@ TEST_F(SqliteDBProcessTest, ALockForGoodEndsOnePastTheLimit) {
   const LockHolder holder(path);
   for (const unsigned int limit : {0U, 1U, 3U}) {
     SqliteDB patient(path, limit, "");
-    SqliteValueList record;
-    Records records;
     const auto expectWaits = [&] {
-      EXPECT_THAT(Pauses::Lengths(), AllOf(SizeIs(limit), Each(AllOf(Ge(1000U), Le(2000U)))));
+      Pauses::ExpectCount(limit);
       EXPECT_EQ(Pauses::SqliteWait(), 1000 * (limit + 1)) << "not one wait an attempt";
       EXPECT_EQ(patient.GetErr(), kBusy);
     };
@@ -143,13 +128,12 @@ TEST_F(SqliteDBProcessTest, ALockReleasedInTheFirstPauseIsSurvived) {
 TEST_F(SqliteDBProcessTest, ALockReleasedInTheLastPauseIsSurvived) {
   SqliteDB patient(path, 3, "");
   LockHolder holder(path);
-  Records records;
   const auto releaseInThird = [&] {
     if (Pauses::Lengths().size() == 3) holder.Release();
   };
   Pauses::Start(releaseInThird, SkipSleep);
   EXPECT_TRUE(patient.SelectByCommand("SELECT n FROM t", records));
-  EXPECT_THAT(records, SizeIs(1));
+  EXPECT_THAT(Texts(records), ElementsAre("n:1"));
   ExpectLog({Info(kFile, "SelectByCommand", "After retry [3] times, success to select command")});
 }
 
@@ -158,7 +142,7 @@ TEST_F(SqliteDBProcessTest, ALockReleasedWithinTheBusyTimeoutIsNoRetry) {
   Pauses::Start(nullptr, [&] { holder.Release(); });
   EXPECT_TRUE(db->Exec("INSERT INTO t VALUES (2)"));
   EXPECT_GT(Pauses::SqliteWait(), 0U);
-  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  Pauses::ExpectCount(0);
 }
 
 TEST_F(SqliteDBProcessTest, ALockedTableOfASharedCacheIsRetriedAsLocked) {
@@ -170,7 +154,6 @@ TEST_F(SqliteDBProcessTest, ALockedTableOfASharedCacheIsRetriedAsLocked) {
   ASSERT_TRUE(writer.Exec("BEGIN; INSERT INTO t VALUES (2)"));
   const std::string sql = "SELECT n FROM t";
   const Json::Value locked = Error(405, 6, "database table is locked: t");
-  SqliteValueList record;
   EXPECT_FALSE(patient.SelectByCommand(sql, record));
   EXPECT_EQ(patient.GetErr(), locked);
   ExpectLog({SelectFailed(2, sql, locked)});
@@ -182,11 +165,8 @@ TEST_F(SqliteDBProcessTest, ALockedTableOfASharedCacheIsRetriedAsLocked) {
 
 TEST_F(SqliteDBProcessTest, AnInsertOnALockedFileFailsAtTheTable) {
   const LockHolder holder(path);
-  InsertCommand insert;
-  insert.SetTable(SqliteTableHandler("t", "n"));
-  insert.AddFieldValue("n", 2);
   Pauses::Start(nullptr, SkipSleep);
-  EXPECT_FALSE(db->InsertRecord(insert));
+  EXPECT_FALSE(db->InsertRecord(InsertOf(SqliteTableHandler("t", "n"), "n", 2)));
   EXPECT_EQ(db->GetErr(), kBusy);
   ExpectLog({Info(kFile, "Exec", "label Exec cmd: INSERT INTO t (n) VALUES (2);"),
              ExecFailed("SelectByCommand", 1,
@@ -206,9 +186,8 @@ pid_t StartWriter(const std::string& path, int number, const int (&gate)[2]) {
   {
     SqliteDB db(path, 1000, "writer");
     isGood = db.Exec("PRAGMA synchronous=OFF") && isGood;  // the disk's speed is not in question
-    InsertCommand insert;
-    insert.SetTable(SqliteTableHandler("shared", "writer INTEGER, n INTEGER, UNIQUE (writer, n)"));
-    insert.AddFieldValue("writer", number);
+    const SqliteTableHandler table("shared", "writer INTEGER, n INTEGER, UNIQUE (writer, n)");
+    InsertCommand insert = InsertOf(table, "writer", number);
     for (int n = 0; n < 200; ++n) {
       insert.AddFieldValue("n", n);
       isGood = db.InsertRecord(insert) && isGood;
@@ -258,8 +237,6 @@ TEST_F(SqliteDBFileTest, PathsThatCannotBeOpenedFailInEveryOperation) {
   ASSERT_EQ(symlink("loop", Path("loop").c_str()), 0);
   for (const std::string& bad : {dir, Path("no/such/dir"), Path("loop"), Path("loop/below")}) {
     SqliteDB nowhere(bad, 3, "");
-    SqliteValueList record;
-    Records records;
     const LogLine warning = Warn(kFile, "Open", "Failed to open db[" + bad + "]");
     const std::string message = "Failed to open db [" + bad + "]";
     nowhere.SetDBErr(7, "before");
@@ -278,9 +255,11 @@ TEST_F(SqliteDBFileTest, PathsThatCannotBeOpenedFailInEveryOperation) {
 }
 
 TEST_F(SqliteDBFileTest, AFailedOpenIsTriedAgainByTheNextOperation) {
-  SqliteDB late(Path("dir/file"), 0, "");
+  const std::string file = Path("dir/file");
+  SqliteDB late(file, 0, "");
   EXPECT_FALSE(late.Exec("SELECT 1"));
-  EXPECT_EQ(LogCapture::Take().size(), 2U);
+  ExpectLog({Warn(kFile, "Open", "Failed to open db[" + file + "]"),
+             Err(kFile, "Exec", "Failed to open db [" + file + "]")});
   ASSERT_EQ(mkdir(Path("dir").c_str(), 0700), 0);
   EXPECT_TRUE(late.Exec("SELECT 1"));
 }
@@ -315,11 +294,7 @@ TEST_F(SqliteDBFileTest, AFileRemovedUnderTheHandleIsReadAndNotWritten) {
   ExpectLog({ExecFailed("Exec", 0, "INSERT INTO t VALUES (2)", failure)});
   // To the operations that look for the file first there is none.
   EXPECT_TRUE(db->DeleteAllRecords(table));
-  SelectCommand select;
-  select.SetTable(table);
-  select.SelectAll();
-  Records records;
-  EXPECT_FALSE(db->SelectRecords(select, records));
+  EXPECT_FALSE(db->SelectRecords(SelectAll(table), records));
   EXPECT_FALSE(HasFile());
 }
 
@@ -331,8 +306,6 @@ TEST_F(SqliteDBFileTest, ThousandsOfOperationsLeaveNothingBehind) {
   for (int round = 0; round < 500; ++round) {
     SqliteDB passing(path, 0, "");
     SqliteDB nowhere(dir, 0, "");
-    SqliteValueList record;
-    Records records;
     EXPECT_TRUE(passing.Exec("SELECT 1"));
     EXPECT_FALSE(passing.Exec("nonsense"));
     EXPECT_TRUE(passing.SelectByCommand("SELECT 1 AS n UNION SELECT 2", record));

@@ -10,19 +10,7 @@
 namespace {
 
 using KeloDRCore::SqliteCommand;
-using KeloDRCore::SqliteDB;
-using KeloDRCore::SqliteValueList;
-using testing::AllOf;
-using testing::Each;
 using testing::ElementsAre;
-using testing::Ge;
-using testing::IsEmpty;
-using testing::Le;
-using testing::SizeIs;
-
-using Records = std::vector<SqliteValueList>;
-
-const std::string kFile = "sqlite_db.cpp";
 
 class SqliteDBRetryTest : public DatabaseTest {
  protected:
@@ -53,7 +41,7 @@ TEST_F(SqliteDBRetryTest, ExecSucceedsAfterOnePause) {
     Pauses::Start([&] { EXPECT_EQ(db->GetErr(), Error(405, lock.code, lock.message)); });
     EXPECT_TRUE(db->Exec(sql));
     EXPECT_EQ(db->GetErr(), Error(0));
-    EXPECT_THAT(Pauses::Lengths(), SizeIs(1));
+    Pauses::ExpectCount(1);
     ExpectLog(
         {Info(kFile, "Exec", "After retry [1] times, success to exec command [" + sql + "]")});
   }
@@ -70,11 +58,11 @@ TEST_F(SqliteDBRetryTest, ExecGivesUpOnePastTheLimit) {
       Pauses::Start();
       EXPECT_FALSE(patient.Exec(sql));
       EXPECT_EQ(patient.GetErr(), failure);
-      EXPECT_THAT(Pauses::Lengths(), AllOf(SizeIs(limit), Each(AllOf(Ge(1000U), Le(2000U)))));
+      Pauses::ExpectCount(limit);
       ExpectLog({ExecFailed("Exec", limit + 1, sql, failure)});
       // All failures are used up, so that there were limit + 1 attempts.
       EXPECT_TRUE(patient.Exec(sql));
-      EXPECT_THAT(Pauses::Lengths(), SizeIs(limit));
+      Pauses::ExpectCount(limit);
     }
   }
 }
@@ -83,7 +71,7 @@ TEST_F(SqliteDBRetryTest, ExecSucceedsOnTheLastAttempt) {
   Start(3);
   FailNextCalls(3);
   EXPECT_TRUE(db->Exec("SELECT fail(5)"));
-  EXPECT_THAT(Pauses::Lengths(), SizeIs(3));
+  Pauses::ExpectCount(3);
   ExpectLog(
       {Info(kFile, "Exec", "After retry [3] times, success to exec command [SELECT fail(5)]")});
 }
@@ -92,8 +80,6 @@ TEST_F(SqliteDBRetryTest, TheTwoQueriesCrossTheirWordings) {
   Start(2);
   const std::string sql = "SELECT fail(6) AS n";
   const Json::Value failure = Error(405, 6, "database table is locked");
-  SqliteValueList record;
-  Records records;
   FailNextCalls(2);
   EXPECT_TRUE(db->SelectByCommand(sql, record));
   EXPECT_EQ(db->GetErr(), Error(0));
@@ -106,7 +92,7 @@ TEST_F(SqliteDBRetryTest, TheTwoQueriesCrossTheirWordings) {
   FailNextCalls(3);
   EXPECT_FALSE(db->SelectByCommand(sql, records));
   EXPECT_EQ(db->GetErr(), failure);
-  EXPECT_THAT(Pauses::Lengths(), SizeIs(8));
+  Pauses::ExpectCount(8);
   ExpectLog({Info(kFile, "SelectByCommand",
                   "After retry [2] times, success to exec command [" + sql + "]"),
              Info(kFile, "SelectByCommand", "After retry [2] times, success to select command"),
@@ -117,13 +103,11 @@ TEST_F(SqliteDBRetryTest, QueriesWithLimitZeroMakeOneAttempt) {
   Start(0);
   const std::string sql = "SELECT fail(5) AS n";
   const Json::Value failure = Error(405, 5, "database is locked");
-  SqliteValueList record;
-  Records records;
   FailNextCalls(1);
   EXPECT_FALSE(db->SelectByCommand(sql, record));
   FailNextCalls(1);
   EXPECT_FALSE(db->SelectByCommand(sql, records));
-  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  Pauses::ExpectCount(0);
   ExpectLog({SelectFailed(1, sql, failure), ExecFailed("SelectByCommand", 1, sql, failure)});
 }
 
@@ -132,17 +116,20 @@ TEST_F(SqliteDBRetryTest, EveryOtherFailureEndsAtOnce) {
   for (const int code :
        {1, 2, 3, 4, 8, 9, 10, 11, 12, 13, 14, 15, 16, 18, 19, 20, 22, 23, 24, 25, 26}) {
     const std::string sql = "SELECT fail(" + std::to_string(code) + ")";
+    const Json::Value failure = Error(404, code, sqlite3_errstr(code));
     FailNextCalls(1);
     EXPECT_FALSE(db->Exec(sql));
-    EXPECT_EQ(db->GetErr(), Error(404, code, sqlite3_errstr(code)));
-    ExpectLog({ExecFailed("Exec", 0, sql, Error(404, code, sqlite3_errstr(code)))});
-    SqliteValueList record;
+    EXPECT_EQ(db->GetErr(), failure);
     FailNextCalls(1);
     EXPECT_FALSE(db->SelectByCommand(sql, record));
-    EXPECT_EQ(db->GetErr(), Error(404, code, sqlite3_errstr(code)));
-    LogCapture::Clear();
+    EXPECT_EQ(db->GetErr(), failure);
+    FailNextCalls(1);
+    EXPECT_FALSE(db->SelectByCommand(sql, records));
+    EXPECT_EQ(db->GetErr(), failure);
+    ExpectLog({ExecFailed("Exec", 0, sql, failure), SelectFailed(0, sql, failure),
+               ExecFailed("SelectByCommand", 0, sql, failure)});
   }
-  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  Pauses::ExpectCount(0);
 }
 
 TEST_F(SqliteDBRetryTest, AnotherFailureAfterRetriesShowsThePausesMade) {
@@ -158,26 +145,21 @@ TEST_F(SqliteDBRetryTest, AnotherFailureAfterRetriesShowsThePausesMade) {
   });
   EXPECT_FALSE(db->Exec(sql));
   EXPECT_EQ(db->GetErr(), failure);
-  EXPECT_THAT(Pauses::Lengths(), SizeIs(2));
+  Pauses::ExpectCount(2);
   ExpectLog({ExecFailed("Exec", 2, sql, failure)});
 }
 
 TEST_F(SqliteDBRetryTest, RowsOfAFailedAttemptStayWhenItIsTriedAgain) {
   Start(1);
-  Records records;
   FailNextCalls(1);
   EXPECT_TRUE(
       db->SelectByCommand("SELECT n FROM t UNION ALL SELECT fail(5) UNION ALL SELECT 9", records));
-  std::vector<std::string> rows;
-  for (const SqliteValueList& record : records) rows.push_back(record.ToStr());
-  EXPECT_THAT(rows, ElementsAre("n:1", "n:2", "n:1", "n:2", "n:5", "n:9"));
+  EXPECT_THAT(Texts(records), ElementsAre("n:1", "n:2", "n:1", "n:2", "n:5", "n:9"));
   ExpectLog({Info(kFile, "SelectByCommand", "After retry [1] times, success to select command")});
 }
 
 TEST_F(SqliteDBRetryTest, SingleAttemptsNeverRetry) {
   Start(3);
-  SqliteValueList record;
-  Records records;
   FailNextCalls(3);
   EXPECT_FALSE(db->DoExecSqliteCommand("SELECT fail(5)"));
   EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT fail(5)", record));
@@ -185,7 +167,7 @@ TEST_F(SqliteDBRetryTest, SingleAttemptsNeverRetry) {
   Json::Value raw = Error(5);
   raw["err_msg"] = "database is locked";
   EXPECT_EQ(db->GetErr(), raw);
-  EXPECT_THAT(Pauses::Lengths(), IsEmpty());
+  Pauses::ExpectCount(0);
 }
 
 TEST_F(SqliteDBRetryTest, TheConnectionIsKeptBetweenAttempts) {
@@ -200,8 +182,6 @@ TEST_F(SqliteDBRetryTest, TheConnectionIsKeptBetweenAttempts) {
 
 TEST_F(SqliteDBRetryTest, TheErrorIsUnknownWhileExecRunsAndAFailureWhileAQueryDoes) {
   Start(0);
-  SqliteValueList record;
-  Records records;
   Json::Value during;
   FailNextCalls(0, [&] { during = db->GetErr(); });
   EXPECT_TRUE(db->Exec("SELECT fail(1)"));

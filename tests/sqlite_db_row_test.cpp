@@ -11,19 +11,18 @@
 
 namespace {
 
-using KeloDRCore::InsertCommand;
-using KeloDRCore::SelectCommand;
-using KeloDRCore::SqliteDB;
-using KeloDRCore::SqliteTableHandler;
-using KeloDRCore::SqliteValueList;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-using Records = std::vector<SqliteValueList>;
-
-const std::string kFile = "sqlite_db.cpp";
-
-using SqliteDBRowTest = DatabaseTest;
+class SqliteDBRowTest : public DatabaseTest {
+ protected:
+  // The first row of a query, which must succeed, left in `record`.
+  const SqliteValueList& First(const std::string& sql) {
+    record = SqliteValueList();
+    EXPECT_TRUE(db->SelectByCommand(sql, record)) << db->GetErr();
+    return record;
+  }
+};
 
 template <typename T>
 T Field(const SqliteValueList& record, const std::string& name) {
@@ -32,15 +31,9 @@ T Field(const SqliteValueList& record, const std::string& name) {
   return value;
 }
 
-SqliteValueList First(SqliteDB& db, const std::string& sql) {
-  SqliteValueList record;
-  EXPECT_TRUE(db.SelectByCommand(sql, record)) << db.GetErr();
-  return record;
-}
-
 TEST_F(SqliteDBRowTest, KeepsIntegersAndTextsAndLeavesOutTheRest) {
   const std::string sql = "SELECT 1 AS i, 'x' AS t, NULL AS n, 1.5 AS r, x'00ff' AS b";
-  EXPECT_EQ(First(*db, sql).ToStr(), "i:1, t:'x'");
+  EXPECT_EQ(First(sql).ToStr(), "i:1, t:'x'");
   EXPECT_EQ(db->GetErr(), Error(0));
   ExpectLog({Warn(kFile, "SelectByCommand", "field [n] has null value"),
              Warn(kFile, "SelectByCommand", "Not supported type [2] with field [r]"),
@@ -50,8 +43,6 @@ TEST_F(SqliteDBRowTest, KeepsIntegersAndTextsAndLeavesOutTheRest) {
 TEST_F(SqliteDBRowTest, LinesNameTheOperationThatTheCallerCalled) {
   ASSERT_TRUE(db->Open());
   const std::string sql = "SELECT NULL AS n, 2.5 AS r";
-  SqliteValueList record;
-  Records records;
   const auto lines = [](const std::string& function) {
     return std::vector<LogLine>{Warn(kFile, function, "field [n] has null value"),
                                 Warn(kFile, function, "Not supported type [2] with field [r]")};
@@ -68,7 +59,8 @@ TEST_F(SqliteDBRowTest, LinesNameTheOperationThatTheCallerCalled) {
 
 TEST_F(SqliteDBRowTest, ARowWithoutAUsableColumnIsAnEmptyRecord) {
   EXPECT_THAT(Rows(*db, "SELECT NULL AS n UNION ALL SELECT NULL"), ElementsAre("", ""));
-  EXPECT_EQ(LogCapture::Take().size(), 2U);
+  const LogLine line = Warn(kFile, "SelectByCommand", "field [n] has null value");
+  ExpectLog({line, line});
 }
 
 TEST_F(SqliteDBRowTest, ReadsIntegersOf64Bits) {
@@ -76,59 +68,55 @@ TEST_F(SqliteDBRowTest, ReadsIntegersOf64Bits) {
        {std::int64_t{0}, std::int64_t{-1}, std::int64_t{2147483647}, std::int64_t{2147483648},
         std::int64_t{-2147483649}, std::int64_t{4294967296},
         std::numeric_limits<std::int64_t>::max(), std::numeric_limits<std::int64_t>::min() + 1}) {
-    const SqliteValueList record = First(*db, "SELECT " + std::to_string(number) + " AS n");
+    First("SELECT " + std::to_string(number) + " AS n");
     EXPECT_EQ(Field<long long>(record, "n"), number);
   }
 }
 
 TEST_F(SqliteDBRowTest, ReadsTextsAsTheyAre) {
   for (const std::string text : {"", " ", "it''s", "line\nline", "\xc3\xa4\xff", "123", "%s%n"}) {
-    const SqliteValueList record = First(*db, "SELECT '" + text + "' AS t");
+    First("SELECT '" + text + "' AS t");
     EXPECT_EQ(Field<std::string>(record, "t"), text == "it''s" ? "it's" : text);
   }
 }
 
 TEST_F(SqliteDBRowTest, AnEmptyTextIsAFieldAndANullIsNone) {
-  const SqliteValueList record = First(*db, "SELECT '' AS empty, NULL AS missing");
+  First("SELECT '' AS empty, NULL AS missing");
   EXPECT_TRUE(record.HasField("empty"));
   EXPECT_FALSE(record.HasField("missing"));
-  LogCapture::Clear();
+  ExpectLog({Warn(kFile, "SelectByCommand", "field [missing] has null value")});
 }
 
 TEST_F(SqliteDBRowTest, ATextEndsAtItsFirstNul) {
-  const SqliteValueList record = First(*db, "SELECT CAST(x'610062' AS TEXT) AS t");
+  First("SELECT CAST(x'610062' AS TEXT) AS t");
   EXPECT_EQ(Field<std::string>(record, "t"), "a");
 }
 
 TEST_F(SqliteDBRowTest, ReadsATextOfSeveralMiB) {
   const std::string text(5 << 20, '\'');
-  InsertCommand insert;
-  insert.SetTable(SqliteTableHandler("t", "v TEXT"));
-  insert.AddFieldValue("v", text);
-  EXPECT_TRUE(db->InsertRecord(insert));
+  EXPECT_TRUE(db->InsertRecord(InsertOf(SqliteTableHandler("t", "v TEXT"), "v", text)));
   LogCapture::Clear();
-  EXPECT_EQ(Field<std::string>(First(*db, "SELECT v FROM t"), "v"), text);
+  EXPECT_EQ(Field<std::string>(First("SELECT v FROM t"), "v"), text);
 }
 
 TEST_F(SqliteDBRowTest, TheAliasNamesTheField) {
-  EXPECT_EQ(First(*db, "SELECT 1 AS \"a b\", 2 AS 'it''s', 3").ToStr(), "3:3, a b:1, it's:2");
+  EXPECT_EQ(First("SELECT 1 AS \"a b\", 2 AS 'it''s', 3").ToStr(), "3:3, a b:1, it's:2");
 }
 
 TEST_F(SqliteDBRowTest, TheLastOfTwoColumnsOfOneNameCounts) {
-  EXPECT_EQ(First(*db, "SELECT 1 AS n, 'x' AS n").ToStr(), "n:'x'");
-  EXPECT_EQ(First(*db, "SELECT 'x' AS n, 1 AS n").ToStr(), "n:1");
-  EXPECT_EQ(First(*db, "SELECT 1 AS n, NULL AS n").ToStr(), "n:1");
+  EXPECT_EQ(First("SELECT 1 AS n, 'x' AS n").ToStr(), "n:'x'");
+  EXPECT_EQ(First("SELECT 'x' AS n, 1 AS n").ToStr(), "n:1");
+  EXPECT_EQ(First("SELECT 1 AS n, NULL AS n").ToStr(), "n:1");
   ExpectLog({Warn(kFile, "SelectByCommand", "field [n] has null value")});
 }
 
 TEST_F(SqliteDBRowTest, AColumnWithoutANameIsRefusedByTheRecord) {
-  EXPECT_EQ(First(*db, "SELECT 1 AS \"\", 2 AS n, 'x' AS ''").ToStr(), "n:2");
+  EXPECT_EQ(First("SELECT 1 AS \"\", 2 AS n, 'x' AS ''").ToStr(), "n:2");
   ExpectLog({Err("sqlite_value.cpp", "AddValue", "Bad Field[] or value [1]"),
              Err("sqlite_value.cpp", "AddValue", "Bad Field[] or value ['x']")});
 }
 
 TEST_F(SqliteDBRowTest, OneRecordIsReplacedNotMerged) {
-  SqliteValueList record;
   record.AddValue("old", 1);
   EXPECT_TRUE(db->SelectByCommand("SELECT 2 AS n UNION SELECT 3 ORDER BY n DESC", record));
   EXPECT_EQ(record.ToStr(), "n:3");
@@ -137,12 +125,11 @@ TEST_F(SqliteDBRowTest, OneRecordIsReplacedNotMerged) {
 TEST_F(SqliteDBRowTest, OneRecordReadsOnlyTheFirstRow) {
   // The second row would fail.
   const std::string sql = "SELECT abs(column1) AS n FROM (VALUES (-4), (-9223372036854775808))";
-  EXPECT_EQ(First(*db, sql).ToStr(), "n:4");
+  EXPECT_EQ(First(sql).ToStr(), "n:4");
   EXPECT_EQ(db->GetErr(), Error(0));
 }
 
 TEST_F(SqliteDBRowTest, NoRowLeavesTheRecordAsItWas) {
-  SqliteValueList record;
   record.AddValue("old", 1);
   db->SetDBErr(7, "before");
   EXPECT_TRUE(db->SelectByCommand("SELECT 1 AS n WHERE 0", record));
@@ -151,7 +138,6 @@ TEST_F(SqliteDBRowTest, NoRowLeavesTheRecordAsItWas) {
 }
 
 TEST_F(SqliteDBRowTest, AFailureLeavesTheRecordAsItWas) {
-  SqliteValueList record;
   record.AddValue("old", 1);
   const std::string sql = "SELECT abs(-9223372036854775808) AS n";
   EXPECT_FALSE(db->SelectByCommand(sql, record));
@@ -161,26 +147,20 @@ TEST_F(SqliteDBRowTest, AFailureLeavesTheRecordAsItWas) {
 }
 
 TEST_F(SqliteDBRowTest, RowsAreAppendedInOrder) {
-  Records records(1);
-  records[0].AddValue("old", 1);
+  record.AddValue("old", 1);
+  records = {record};
   EXPECT_TRUE(db->SelectByCommand("SELECT 1 AS n WHERE 0", records));
-  EXPECT_EQ(records.size(), 1U);
+  EXPECT_THAT(Texts(records), ElementsAre("old:1"));
   EXPECT_TRUE(db->SelectByCommand("SELECT 3 AS n UNION ALL SELECT 2", records));
-  ASSERT_EQ(records.size(), 3U);
-  EXPECT_EQ(records[0].ToStr(), "old:1");
-  EXPECT_EQ(records[1].ToStr(), "n:3");
-  EXPECT_EQ(records[2].ToStr(), "n:2");
+  EXPECT_THAT(Texts(records), ElementsAre("old:1", "n:3", "n:2"));
 }
 
 TEST_F(SqliteDBRowTest, RowsReadBeforeAFailureStay) {
   const std::string sql =
       "SELECT abs(column1) AS n FROM (VALUES (-4), (5), (-9223372036854775808))";
   const Json::Value failure = Error(404, 1, "integer overflow");
-  Records records;
   EXPECT_FALSE(db->SelectByCommand(sql, records));
-  ASSERT_EQ(records.size(), 2U);
-  EXPECT_EQ(records[0].ToStr(), "n:4");
-  EXPECT_EQ(records[1].ToStr(), "n:5");
+  EXPECT_THAT(Texts(records), ElementsAre("n:4", "n:5"));
   EXPECT_EQ(db->GetErr(), failure);
   ExpectLog({ExecFailed("SelectByCommand", 0, sql, failure)});
 }
@@ -227,17 +207,11 @@ TEST_F(SqliteDBRowTest, RandomRecordsSurviveInsertAndSelect) {
     ASSERT_TRUE(db->InsertRecord(insert)) << written.ToStr();
   }
   ASSERT_TRUE(db->Exec("COMMIT"));
-  SelectCommand select;
-  select.SetTable(table);
-  select.SelectAll();
+  SelectCommand select = SelectAll(table);
   select.AddOrderField("id");
   select.SetOrderByASC();
-  Records records;
   ASSERT_TRUE(db->SelectRecords(select, records));
-  ASSERT_EQ(records.size(), expected.size());
-  for (size_t id = 0; id < expected.size(); ++id) {
-    EXPECT_EQ(records[id].ToStr(), expected[id].ToStr());
-  }
+  EXPECT_EQ(Texts(records), Texts(expected));
   LogCapture::Clear();
 }
 
@@ -248,9 +222,12 @@ TEST_F(SqliteDBRowTest, AnIntegerOutside32BitsIsRefusedAsAStatement) {
   values.AddValue("n", 4294967296LL);
   insert.SetFieldValues(values);
   EXPECT_FALSE(db->InsertRecord(insert));
-  EXPECT_EQ(db->GetErr(), Error(404, 1, "near \")\": syntax error"));
+  const Json::Value failure = Error(404, 1, "near \")\": syntax error");
+  EXPECT_EQ(db->GetErr(), failure);
   EXPECT_THAT(Rows(*db, "SELECT * FROM t"), IsEmpty());
-  EXPECT_EQ(LogCapture::Take().size(), 3U);
+  const std::string sql = "INSERT INTO t (n) VALUES ();";
+  ExpectLog({Info(kFile, "Exec", "label Exec cmd: " + sql), ExecFailed("Exec", 0, sql, failure),
+             Err(kFile, "Exec", "Failed to exec [" + sql + "] in db[" + path + "]")});
 }
 
 }  // namespace

@@ -15,14 +15,8 @@
 namespace {
 
 using KeloDRCore::ErrRecorder;
-using KeloDRCore::SqliteDB;
-using KeloDRCore::SqliteValueList;
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-using Records = std::vector<SqliteValueList>;
-
-const std::string kFile = "sqlite_db.cpp";
 
 // What the tests force the engine to answer.
 bool opensWithoutHandle = false;
@@ -188,10 +182,8 @@ TEST_F(SqliteDBTest, ExecReportsAnOpenThatGaveNoHandle) {
 TEST_F(SqliteDBTest, SelectByCommandDoesNotCheckForAMissingHandle) {
   const Json::Value misuse = Error(404, 21, "out of memory");
   opensWithoutHandle = true;
-  SqliteValueList record;
   EXPECT_FALSE(db->SelectByCommand("SELECT 1", record));
   EXPECT_EQ(db->GetErr(), misuse);
-  Records records;
   EXPECT_FALSE(db->SelectByCommand("SELECT 1", records));
   EXPECT_EQ(db->GetErr(), misuse);
   opensWithoutHandle = false;
@@ -225,7 +217,6 @@ TEST_F(SqliteDBTest, DestructionThroughTheHandleClosesTheConnection) {
 TEST_F(SqliteDBTest, StaysOpenAcrossOperationsAndFailures) {
   ASSERT_TRUE(db->Exec("CREATE TEMP TABLE mine (n); INSERT INTO mine VALUES (1)"));
   EXPECT_FALSE(db->Exec("no statement"));
-  SqliteValueList record;
   EXPECT_FALSE(db->SelectByCommand("no statement", record));
   LogCapture::Clear();
   EXPECT_THAT(Rows(*db, "SELECT n FROM mine"), ElementsAre("n:1"));
@@ -233,8 +224,6 @@ TEST_F(SqliteDBTest, StaysOpenAcrossOperationsAndFailures) {
 
 TEST_F(SqliteDBTest, SingleAttemptsFailOnAClosedHandle) {
   const OpenRecorder raw(21, "out of memory");
-  SqliteValueList record;
-  Records records;
   EXPECT_FALSE(db->DoExecSqliteCommand("CREATE TABLE t (n)"));
   EXPECT_EQ(db->GetErr(), raw.GetErr());
   EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT 1 AS n", record));
@@ -260,8 +249,6 @@ TEST_F(SqliteDBTest, SingleExecRecordsTheRawFailureAndNoSuccess) {
 TEST_F(SqliteDBTest, SingleSelectsRecordTheRawFailureAndClearItOnSuccess) {
   ASSERT_TRUE(db->Open());
   const Json::Value failure = OpenRecorder(1, "no such table: missing").GetErr();
-  SqliteValueList record;
-  Records records;
   EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT * FROM missing", record));
   EXPECT_EQ(db->GetErr(), failure);
   EXPECT_TRUE(db->DoSelectSqliteRecord("SELECT 1 AS n", record));
@@ -276,8 +263,6 @@ TEST_F(SqliteDBTest, SingleSelectsRecordTheRawFailureAndClearItOnSuccess) {
 TEST_F(SqliteDBTest, SingleSelectsFailOnATextWithoutAStatement) {
   ASSERT_TRUE(db->Open());
   const Json::Value misuse = OpenRecorder(21, "not an error").GetErr();
-  SqliteValueList record;
-  Records records;
   for (const char* const blank : {"", " \n", "-- nothing", "/* nothing */", ";"}) {
     EXPECT_FALSE(db->DoSelectSqliteRecord(blank, record));
     EXPECT_EQ(db->GetErr(), misuse);
@@ -367,8 +352,6 @@ TEST_F(SqliteDBTest, ExecClearsTheErrorBeforeIt) {
 TEST_F(SqliteDBTest, EmptyStatementsFailWithoutOpening) {
   EXPECT_FALSE(db->Exec(""));
   EXPECT_EQ(db->GetErr(), Error(401));
-  SqliteValueList record;
-  Records records;
   db->SetDBErr(7, "before");
   EXPECT_FALSE(db->SelectByCommand("", record));
   EXPECT_EQ(db->GetErr(), Error(401));
@@ -385,8 +368,6 @@ TEST_F(SqliteDBTest, SyntaxErrorsAreNotRetried) {
   const Json::Value failure = Error(404, 1, "near \"nonsense\": syntax error");
   Pauses::Start();
   SqliteDB patient(path, 5, "");
-  SqliteValueList record;
-  Records records;
   EXPECT_FALSE(patient.Exec("nonsense"));
   EXPECT_EQ(patient.GetErr(), failure);
   EXPECT_FALSE(patient.SelectByCommand("nonsense", record));
@@ -403,7 +384,6 @@ TEST_F(SqliteDBTest, BlankStatementsRunInExecAndFailInAQuery) {
   for (const char* const blank : {" ", "-- comment", "/* */;"}) {
     EXPECT_TRUE(db->Exec(blank));
     EXPECT_EQ(db->GetErr(), Error(0));
-    Records records;
     EXPECT_FALSE(db->SelectByCommand(blank, records));
     EXPECT_EQ(db->GetErr(), misuse);
     ExpectLog({ExecFailed("SelectByCommand", 0, blank, misuse)});
@@ -429,8 +409,6 @@ TEST_F(SqliteDBTest, ExecDiscardsRows) {
 }
 
 TEST_F(SqliteDBTest, QueryRunsAStatementWithoutRows) {
-  Records records;
-  SqliteValueList record;
   EXPECT_TRUE(db->SelectByCommand("CREATE TABLE t (n)", records));
   EXPECT_TRUE(db->SelectByCommand("INSERT INTO t VALUES (1)", record));
   EXPECT_THAT(records, IsEmpty());
@@ -445,9 +423,11 @@ TEST_F(SqliteDBTest, StatementEndsAtAnEmbeddedNul) {
 }
 
 TEST_F(SqliteDBTest, FailureNamesBytesThatAreNotUtf8) {
-  EXPECT_FALSE(db->Exec("DROP TABLE \"\xff\xfe'\x01\""));
-  EXPECT_EQ(db->GetErr(), Error(404, 1, "no such table: \xff\xfe'\x01"));
-  EXPECT_EQ(LogCapture::Take().size(), 1U);
+  const std::string sql = "DROP TABLE \"\xff\xfe'\x01\"";
+  const Json::Value failure = Error(404, 1, "no such table: \xff\xfe'\x01");
+  EXPECT_FALSE(db->Exec(sql));
+  EXPECT_EQ(db->GetErr(), failure);
+  ExpectLog({ExecFailed("Exec", 0, sql, failure)});
 }
 
 }  // namespace

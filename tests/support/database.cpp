@@ -1,14 +1,11 @@
 #include "support/database.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 #include <sqlite3.h>
 #include <time.h>
 #include <unistd.h>
 
 #include "kelodrcore/json_value.h"
-
-using KeloDRCore::SqliteDB;
-using KeloDRCore::SqliteValueList;
 
 namespace {
 
@@ -88,12 +85,23 @@ Json::Value Error(int code, int sqliteCode, const std::string& sqliteMessage) {
   return error;
 }
 
+SelectCommand SelectAll(const SqliteTableHandler& table) {
+  SelectCommand command;
+  EXPECT_TRUE(command.SetTable(table));
+  command.SelectAll();
+  return command;
+}
+
+std::vector<std::string> Texts(const Records& records) {
+  std::vector<std::string> texts;
+  for (const SqliteValueList& record : records) texts.push_back(record.ToStr());
+  return texts;
+}
+
 std::vector<std::string> Rows(SqliteDB& db, const std::string& sql) {
-  std::vector<SqliteValueList> records;
+  Records records;
   EXPECT_TRUE(db.SelectByCommand(sql, records)) << db.GetErr();
-  std::vector<std::string> rows;
-  for (const SqliteValueList& record : records) rows.push_back(record.ToStr());
-  return rows;
+  return Texts(records);
 }
 
 LogLine ExecFailed(const std::string& function, unsigned int retries, const std::string& sql,
@@ -116,6 +124,14 @@ void Start(const std::function<void()>& onPause, const std::function<void()>& on
 }
 
 std::vector<unsigned int> Lengths() { return pauseLengths; }
+
+void ExpectCount(size_t count) {
+  using testing::AllOf;
+  using testing::Ge;
+  using testing::Le;
+  EXPECT_THAT(pauseLengths,
+              AllOf(testing::SizeIs(count), testing::Each(AllOf(Ge(1000U), Le(2000U)))));
+}
 
 unsigned int SqliteWait() { return sqliteSleeps / 1000; }
 

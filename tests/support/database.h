@@ -13,7 +13,17 @@
 #include "kelodrcore/sqlite_db.h"
 #include "support/clean_test.h"
 
-// A handle on a file of its own, not there yet, without retries.
+using KeloDRCore::DeleteCommand;
+using KeloDRCore::InsertCommand;
+using KeloDRCore::SelectCommand;
+using KeloDRCore::SqliteDB;
+using KeloDRCore::SqliteTableHandler;
+using KeloDRCore::SqliteValueList;
+using KeloDRCore::UpdateCommand;
+
+using Records = std::vector<SqliteValueList>;
+
+// A handle on a file of its own, not there yet, without retries, and what it selects into.
 class DatabaseTest : public CleanTest {
  protected:
   void SetUp() override;
@@ -21,16 +31,32 @@ class DatabaseTest : public CleanTest {
 
   bool HasFile() const;
 
+  // The handle's own file in its log lines.
+  static constexpr const char* kFile = "sqlite_db.cpp";
+
   std::string path;
-  std::unique_ptr<KeloDRCore::SqliteDB> db;
+  std::unique_ptr<SqliteDB> db;
+  SqliteValueList record;
+  Records records;
 };
+
+// An insert of one field; the select of all columns.
+template <typename T>
+InsertCommand InsertOf(const SqliteTableHandler& table, const std::string& field, const T& value) {
+  InsertCommand command;
+  EXPECT_TRUE(command.SetTable(table));
+  EXPECT_TRUE(command.AddFieldValue(field, value));
+  return command;
+}
+SelectCommand SelectAll(const SqliteTableHandler& table);
 
 // The error documents: a bare code, and a code with SQLite's own code and message.
 Json::Value Error(int code);
 Json::Value Error(int code, int sqliteCode, const std::string& sqliteMessage);
 
-// The selected records as text, "name:literal, ..." each; failed expectations when the query fails.
-std::vector<std::string> Rows(KeloDRCore::SqliteDB& db, const std::string& sql);
+// Records as text, "name:literal, ..." each, and those of a query, which must succeed.
+std::vector<std::string> Texts(const Records& records);
+std::vector<std::string> Rows(SqliteDB& db, const std::string& sql);
 
 // The line of a statement that failed for good: Exec's wording, which the query for many records
 // shares, and the wording of the query for one.
@@ -49,6 +75,9 @@ void Start(const std::function<void()>& onPause = nullptr,
 
 // The lengths of the library's pauses in milliseconds.
 std::vector<unsigned int> Lengths();
+
+// Expects that many pauses since Start, each of 1 to 2 s.
+void ExpectCount(size_t count);
 
 // What SQLite asked to sleep in total, in milliseconds.
 unsigned int SqliteWait();
