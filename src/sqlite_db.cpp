@@ -45,11 +45,19 @@ auto ThrowOnlyBadAlloc(const Action& action) {
   }
 }
 
-// SQLite answers null for a name, or a text that is there, only when it has no memory for it. That
-// must not turn into an empty one.
-const char* TextOf(const void* text) {
-  if (text == nullptr) throw std::bad_alloc();
-  return static_cast<const char*>(text);
+// SQLite answers null for a name only when it has no memory for it.
+const char* ColumnName(sqlite3_stmt* stmt, int column) {
+  const char* const name = sqlite3_column_name(stmt, column);
+  if (name == nullptr) throw std::bad_alloc();
+  return name;
+}
+
+// A null text is an empty one, but for the one that SQLite has no memory for.
+const char* ColumnText(sqlite3_stmt* stmt, int column) {
+  const auto* const text = reinterpret_cast<const char*>(sqlite3_column_text(stmt, column));
+  if (text != nullptr) return text;
+  if (sqlite3_errcode(sqlite3_db_handle(stmt)) == SQLITE_NOMEM) throw std::bad_alloc();
+  return "";
 }
 
 // Turns the rows of one statement into records. Made at a row: before the first one the statement
@@ -60,7 +68,7 @@ class RowReader {
     const int columns = sqlite3_column_count(stmt);
     names.reserve(static_cast<size_t>(columns));
     for (int column = 0; column < columns; ++column) {
-      names.emplace_back(TextOf(sqlite3_column_name(stmt, column)));
+      names.emplace_back(ColumnName(stmt, column));
     }
   }
 
@@ -80,7 +88,7 @@ class RowReader {
         Add(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
         break;
       case SQLITE_TEXT:
-        Add(record, name, TextOf(sqlite3_column_text(stmt, column)));
+        Add(record, name, ColumnText(stmt, column));
         break;
       case SQLITE_NULL:
         KELODR_LOG(WARN, function, "field [%s] has null value", name.c_str());

@@ -21,6 +21,7 @@ using testing::IsEmpty;
 // What the tests force the engine to answer.
 bool opensWithoutHandle = false;
 bool refusesBusyTimeout = false;
+bool givesNoText = false;
 
 template <typename Function>
 Function Next(const char* name, Function /*type*/) {
@@ -42,6 +43,11 @@ extern "C" int sqlite3_busy_timeout(sqlite3* db, int milliseconds) {
   if (refusesBusyTimeout) return SQLITE_MISUSE;
   if (db == nullptr) return SQLITE_OK;
   return Next("sqlite3_busy_timeout", &sqlite3_busy_timeout)(db, milliseconds);
+}
+
+extern "C" const unsigned char* sqlite3_column_text(sqlite3_stmt* stmt, int column) {
+  if (givesNoText) return nullptr;
+  return Next("sqlite3_column_text", &sqlite3_column_text)(stmt, column);
 }
 
 namespace {
@@ -414,6 +420,13 @@ TEST_F(SqliteDBTest, QueryRunsAStatementWithoutRows) {
   EXPECT_THAT(records, IsEmpty());
   EXPECT_EQ(record.ToStr(), "");
   EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1"));
+}
+
+TEST_F(SqliteDBTest, ANullTextIsAnEmptyOne) {
+  givesNoText = true;
+  const std::vector<std::string> rows = Rows(*db, "SELECT 'x' AS t, 1 AS n");
+  givesNoText = false;
+  EXPECT_THAT(rows, ElementsAre("n:1, t:''"));
 }
 
 TEST_F(SqliteDBTest, StatementEndsAtAnEmbeddedNul) {
