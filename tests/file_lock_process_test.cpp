@@ -138,9 +138,7 @@ TEST_F(FileLockProcessTest, ALockFileThatCannotBeOpenedAnewFailsAtOnce) {
   };
   FileLock lock(name);
   EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 5));
-  ExpectLog({Err("file_lock.cpp", "openLockedFile",
-                 "Failed to open lock file[" + path + "], errno=Is a directory"),
-             Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + path + "]")});
+  ExpectLog(CannotOpen(path, "Is a directory"));
   EXPECT_EQ(flocks, 1);
   EXPECT_TRUE(sleeps.empty());
 }
@@ -318,30 +316,28 @@ TEST_F(FileLockProcessTest, ALockThatOthersMayReadWorksWithoutAnyPrivileges) {
     ASSERT_TRUE(lock.openLockedFile());
     umask(before);
   }
-  EXPECT_EQ(
-      RunInChild([this] {
-        ASSERT_EQ(setresgid(kUser, kUser, kUser), 0);
-        ASSERT_EQ(setresuid(kUser, kUser, kUser), 0);
-        const std::vector<LogLine> refused = {
-            Auth(LOG_AUTH | LOG_ERR,
-                 "file_lock.cpp ERROR: setresgid(-1, 0, -1) [Operation not permitted]"),
-            Auth(LOG_AUTH | LOG_ERR, "file_lock.cpp ERROR: ENTERCriticalSection")};
-        FileLock lock(name);
-        EXPECT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 0));
-        ExpectLog(refused);
-        EXPECT_FALSE(IsFree());
-        lock.unlock();
-        ExpectLog(refused);
-        FileLock missing(name + "-missing");
-        EXPECT_FALSE(missing.lock(LOCK_EX | LOCK_NB, 0));
-        std::vector<LogLine> lines = refused;
-        lines.push_back(
-            Err("file_lock.cpp", "openLockedFile",
-                "Failed to open lock file[" + path + "-missing], errno=Permission denied"));
-        lines.push_back(Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + path + "-missing]"));
-        ExpectLog(lines);
-      }),
-      0);
+  EXPECT_EQ(RunInChild([this] {
+              ASSERT_EQ(setresgid(kUser, kUser, kUser), 0);
+              ASSERT_EQ(setresuid(kUser, kUser, kUser), 0);
+              const std::vector<LogLine> refused = {
+                  Auth(LOG_AUTH | LOG_ERR,
+                       "file_lock.cpp ERROR: setresgid(-1, 0, -1) [Operation not permitted]"),
+                  Auth(LOG_AUTH | LOG_ERR, "file_lock.cpp ERROR: ENTERCriticalSection")};
+              FileLock lock(name);
+              EXPECT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 0));
+              ExpectLog(refused);
+              EXPECT_FALSE(IsFree());
+              lock.unlock();
+              ExpectLog(refused);
+              FileLock missing(name + "-missing");
+              EXPECT_FALSE(missing.lock(LOCK_EX | LOCK_NB, 0));
+              std::vector<LogLine> lines = refused;
+              for (const LogLine& line : CannotOpen(path + "-missing", "Permission denied")) {
+                lines.push_back(line);
+              }
+              ExpectLog(lines);
+            }),
+            0);
 }
 
 }  // namespace

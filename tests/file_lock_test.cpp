@@ -121,19 +121,15 @@ TEST_F(FileLockTest, AFileThatCannotBeOpenedIsNamedWithTheReason) {
   std::filesystem::create_directory(path);
   FileLock lock(name);
   EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 1));
-  ExpectLog({Err("file_lock.cpp", "openLockedFile",
-                 "Failed to open lock file[" + path + "], errno=Is a directory"),
-             Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + path + "]")});
+  ExpectLog(CannotOpen(path, "Is a directory"));
   EXPECT_EQ(flocks, 0);
 }
 
 TEST_F(FileLockTest, ASymbolicLinkIsRefused) {
   std::filesystem::create_symlink(Path("target"), path);
   FileLock lock(name);
-  EXPECT_FALSE(lock.openLockedFile());
-  ExpectLog(
-      {Err("file_lock.cpp", "openLockedFile",
-           "Failed to open lock file[" + path + "], errno=Too many levels of symbolic links")});
+  EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 0));
+  ExpectLog(CannotOpen(path, "Too many levels of symbolic links"));
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
 }
 

@@ -76,6 +76,20 @@ class JsonValueFileTest : public CleanTest {
     EXPECT_EQ(errno, error) << path;
   }
 
+  // Another user cannot write the file "a" in a directory of this mode, and nothing changes.
+  void ExpectNotWrittenByAnother(mode_t directoryMode, int error) {
+    if (geteuid() != 0) GTEST_SKIP() << "needs root to become another user";
+    WriteText(Path("a"), "1");
+    ASSERT_EQ(chmod(dir.c_str(), directoryMode), 0);
+    EXPECT_EQ(RunInChild([&] {
+                ASSERT_EQ(setresuid(kOther, kOther, kOther), 0);
+                ExpectNotWritten(Path("a"), error);
+              }),
+              0);
+    EXPECT_EQ(ReadText(Path("a")), "1");
+    EXPECT_EQ(NamesIn(dir), Names{"a"});
+  }
+
  private:
   mode_t umaskBefore = 0;
 };
@@ -196,28 +210,11 @@ TEST_F(JsonValueFileTest, AFileKeepsItsOwnerAndTheSetIdBits) {
 }
 
 TEST_F(JsonValueFileTest, AnOwnerThatCannotBeKeptIsAFailure) {
-  if (geteuid() != 0) GTEST_SKIP() << "needs root to become another user";
-  WriteText(Path("a"), "1");
-  ASSERT_EQ(chmod(dir.c_str(), 0777), 0);
-  EXPECT_EQ(RunInChild([this] {
-              ASSERT_EQ(setresuid(kOther, kOther, kOther), 0);
-              ExpectNotWritten(Path("a"), EPERM);
-            }),
-            0);
-  EXPECT_EQ(ReadText(Path("a")), "1");
-  EXPECT_EQ(NamesIn(dir), Names{"a"});
+  ExpectNotWrittenByAnother(0777, EPERM);
 }
 
 TEST_F(JsonValueFileTest, AnUnwritableDirectoryIsAFailure) {
-  if (geteuid() != 0) GTEST_SKIP() << "needs root to become another user";
-  WriteText(Path("a"), "1");
-  ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
-  EXPECT_EQ(RunInChild([this] {
-              ASSERT_EQ(setresuid(kOther, kOther, kOther), 0);
-              ExpectNotWritten(Path("a"), EACCES);
-            }),
-            0);
-  EXPECT_EQ(ReadText(Path("a")), "1");
+  ExpectNotWrittenByAnother(0755, EACCES);
 }
 
 TEST_F(JsonValueFileTest, TheFileBehindALinkIsReplacedAndTheLinkStays) {

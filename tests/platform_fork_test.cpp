@@ -68,6 +68,17 @@ class ForkTest : public CleanTest {
     CleanTest::TearDown();
   }
 
+  // Forks with `flags` and expects the pid of the child, as the child itself tells it.
+  void ExpectPidOfChild(int flags) const {
+    const pid_t pid = KLIBCProcForkEx(flags);
+    if (pid == 0) {
+      up.Send(getpid());
+      _exit(0);
+    }
+    EXPECT_GT(pid, 0);
+    EXPECT_EQ(up.Receive(), pid);
+  }
+
   Channel up;
 };
 
@@ -79,15 +90,7 @@ TEST_F(ForkTest, ForksPlainlyWithoutFlags) {
   EXPECT_EQ(WEXITSTATUS(status), 7);
 }
 
-TEST_F(ForkTest, GivesThePidOfTheDetachedChild) {
-  const pid_t pid = KLIBCProcForkEx(1);
-  if (pid == 0) {
-    up.Send(getpid());
-    _exit(0);
-  }
-  EXPECT_GT(pid, 0);
-  EXPECT_EQ(up.Receive(), pid);
-}
+TEST_F(ForkTest, GivesThePidOfTheDetachedChild) { ExpectPidOfChild(1); }
 
 TEST_F(ForkTest, LeavesTheDetachedChildToAnotherParentAtOnce) {
   Channel down;
@@ -108,13 +111,7 @@ TEST_F(ForkTest, LeavesTheDetachedChildToAnotherParentAtOnce) {
 TEST_F(ForkTest, DetachesWhereSigchldIsIgnored) {
   EXPECT_EQ(RunInChild([&] {
               Handle(SIGCHLD, SIG_IGN, 0);
-              const pid_t pid = KLIBCProcForkEx(65);
-              if (pid == 0) {
-                up.Send(getpid());
-                _exit(0);
-              }
-              EXPECT_GT(pid, 0);
-              EXPECT_EQ(up.Receive(), pid);
+              ExpectPidOfChild(65);
               EXPECT_EQ(Disposition(SIGCHLD).sa_handler, SIG_IGN);
             }),
             0);
@@ -123,12 +120,7 @@ TEST_F(ForkTest, DetachesWhereSigchldIsIgnored) {
 TEST_F(ForkTest, DetachesWhereAHandlerReapsEverything) {
   EXPECT_EQ(RunInChild([&] {
               Handle(SIGCHLD, ReapEverything, SA_RESTART);
-              const pid_t pid = KLIBCProcForkEx(1);
-              if (pid == 0) {
-                up.Send(getpid());
-                _exit(0);
-              }
-              EXPECT_EQ(up.Receive(), pid);
+              ExpectPidOfChild(1);
             }),
             0);
 }

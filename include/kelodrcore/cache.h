@@ -29,7 +29,8 @@ class FileLock;
 /// "max_updated_time" are read back; the file's age is that of its modification time, and a change
 /// of the file is noticed by that time too, in whole seconds, deliberately.
 ///
-/// Messages of the cache's course are logged at DEBUG. What the subclass throws reaches the caller,
+/// Messages of the cache's course are logged at DEBUG, and at NOTICE when the lock to release a
+/// claim cannot be had or the pid file not be removed. What the subclass throws reaches the caller,
 /// with the claim released; nothing else throws. An object is used by one thread at a time, its
 /// const operations too.
 class KELODR_EXPORT Cache {

@@ -11,7 +11,8 @@
 namespace KeloDRCore {
 
 /// Sleeps for a random number of milliseconds, drawn uniformly from the closed range [min, max].
-/// Blocks the calling thread; a signal may end the sleep early.
+/// Blocks the calling thread; a signal may end the sleep early. The period is kept to 32 bits of
+/// microseconds: one above 4,294,967 ms (71 minutes) begins again at 0.
 ///
 /// False, at once and with a line at ERR, unless 0 < min < max: equal bounds and a period that
 /// starts at 0 are refused on purpose.

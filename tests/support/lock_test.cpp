@@ -73,6 +73,12 @@ int LockTest::DescriptorOf(const std::string& file) {
   return -1;
 }
 
+std::vector<LogLine> LockTest::CannotOpen(const std::string& file, const std::string& reason) {
+  return {Err("file_lock.cpp", "openLockedFile",
+              "Failed to open lock file[" + file + "], errno=" + reason),
+          Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + file + "]")};
+}
+
 bool LockTest::Hold(int type) const {
   static KeloDRCore::FileLock lock;
   return lock.setLockFile(name) && lock.lock(type, 0);

@@ -40,6 +40,9 @@ class LockTest : public CleanTest {
   // The descriptor that this process has open on the file named `file`, or -1.
   static int DescriptorOf(const std::string& file);
 
+  // The lines of a lock() that cannot open the lock file at `file`.
+  static std::vector<LogLine> CannotOpen(const std::string& file, const std::string& reason);
+
   // For a Holder: takes a lock that ends with the process.
   bool Hold(int type) const;
 
