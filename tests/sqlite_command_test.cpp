@@ -6,32 +6,11 @@
 #include <type_traits>
 #include <utility>
 
-#include "support/clean_test.h"
+#include "support/command.h"
 
 namespace {
 
-using KeloDRCore::DeleteCommand;
-using KeloDRCore::InsertCommand;
-using KeloDRCore::SelectCommand;
 using KeloDRCore::SqliteCommand;
-using KeloDRCore::SqliteIn;
-using KeloDRCore::SqliteTableHandler;
-using KeloDRCore::SqliteValueList;
-using KeloDRCore::UpdateCommand;
-
-class SqliteCommandTest : public CleanTest {
- protected:
-  static void ExpectError(const std::string& function, const std::string& message) {
-    ExpectLog({Err("sqlite_command.cpp", function, message)});
-  }
-};
-
-template <typename Command>
-Command OnTable(const std::string& name = "job") {
-  Command command;
-  EXPECT_TRUE(command.SetTable(SqliteTableHandler(name, "")));
-  return command;
-}
 
 std::string Dump(const SqliteCommand& command) {
   std::stringstream stream;
@@ -58,16 +37,6 @@ TEST_F(SqliteCommandTest, ShapeOfTheClasses) {
   static_assert(std::is_base_of_v<SqliteCommand, DeleteCommand>);
 }
 
-// Puts the class into the names of the tests that run for several.
-struct ClassName {
-  template <typename Command>
-  static std::string GetName(int /*index*/) {
-    if (std::is_same_v<Command, InsertCommand>) return "Insert";
-    if (std::is_same_v<Command, UpdateCommand>) return "Update";
-    return std::is_same_v<Command, SelectCommand> ? "Select" : "Delete";
-  }
-};
-
 // What all commands share.
 
 template <typename Command>
@@ -88,7 +57,7 @@ class AnyCommandTest : public SqliteCommandTest {
   }
 };
 using AllCommands = testing::Types<InsertCommand, UpdateCommand, SelectCommand, DeleteCommand>;
-TYPED_TEST_SUITE(AnyCommandTest, AllCommands, ClassName);
+TYPED_TEST_SUITE(AnyCommandTest, AllCommands, CommandName);
 
 TYPED_TEST(AnyCommandTest, AFreshOneIsInvalidAndSaysSo) {
   const TypeParam command;
@@ -174,7 +143,7 @@ TYPED_TEST(AnyCommandTest, GetCommandAsksTheVirtualValidity) {
 template <typename Command>
 class FieldCommandTest : public SqliteCommandTest {};
 using FieldCommands = testing::Types<InsertCommand, UpdateCommand>;
-TYPED_TEST_SUITE(FieldCommandTest, FieldCommands, ClassName);
+TYPED_TEST_SUITE(FieldCommandTest, FieldCommands, CommandName);
 
 TYPED_TEST(FieldCommandTest, FieldsWithoutATableAreInvalid) {
   TypeParam command;

@@ -1,6 +1,4 @@
-#include <clocale>
 #include <limits>
-#include <locale>
 #include <map>
 #include <random>
 #include <sstream>
@@ -9,32 +7,20 @@
 #include <vector>
 
 #include "kelodrcore/sqlite_command.h"
-#include "support/clean_test.h"
+#include "support/command.h"
+#include "support/grouping_locale.h"
 
 namespace {
 
-using KeloDRCore::DeleteCommand;
-using KeloDRCore::InsertCommand;
-using KeloDRCore::SelectCommand;
 using KeloDRCore::SqliteCondition;
 using KeloDRCore::SqliteEqual;
-using KeloDRCore::SqliteIn;
 using KeloDRCore::SqliteNotIn;
-using KeloDRCore::SqliteTableHandler;
 using KeloDRCore::SqliteValue;
-using KeloDRCore::SqliteValueList;
-using KeloDRCore::UpdateCommand;
 
-class SelectCommandTest : public CleanTest {
- protected:
-  static void ExpectError(const std::string& function, const std::string& message) {
-    ExpectLog({Err("sqlite_command.cpp", function, message)});
-  }
-};
+using SelectCommandTest = SqliteCommandTest;
 
 SelectCommand SelectOf(const std::vector<std::string>& fields) {
-  SelectCommand command;
-  EXPECT_TRUE(command.SetTable(SqliteTableHandler("job", "")));
+  auto command = OnTable<SelectCommand>();
   for (const std::string& field : fields) EXPECT_TRUE(command.AddField(field));
   return command;
 }
@@ -150,8 +136,7 @@ TEST_F(SelectCommandTest, ThePiecesFollowTheirOrder) {
 }
 
 TEST_F(SelectCommandTest, NamesAndTextsAreWrittenAsGiven) {
-  SelectCommand command;
-  EXPECT_TRUE(command.SetTable(SqliteTableHandler("a, \"b c\"; --", "")));
+  auto command = OnTable<SelectCommand>("a, \"b c\"; --");
   EXPECT_TRUE(command.AddField("it's"));
   EXPECT_TRUE(command.AddOrderField("x y"));
   EXPECT_TRUE(command.SetCondition(" 'a'b' "));
@@ -190,19 +175,10 @@ TEST_F(SelectCommandTest, OnlyASelectLogsAValidConditionWithoutText) {
   ExpectLog({});
 }
 
-// Puts the class into the names of the tests that run for several.
-struct ClassName {
-  template <typename Command>
-  static std::string GetName(int /*index*/) {
-    if (std::is_same_v<Command, UpdateCommand>) return "Update";
-    return std::is_same_v<Command, SelectCommand> ? "Select" : "Delete";
-  }
-};
-
 // What update, select and delete share.
 
 template <typename Command>
-class ConditionCommandTest : public SelectCommandTest {
+class ConditionCommandTest : public SqliteCommandTest {
  protected:
   static std::string Where(const Command& command) {
     const std::string dump = command.ToStr();
@@ -211,7 +187,7 @@ class ConditionCommandTest : public SelectCommandTest {
   }
 };
 using ConditionCommands = testing::Types<UpdateCommand, SelectCommand, DeleteCommand>;
-TYPED_TEST_SUITE(ConditionCommandTest, ConditionCommands, ClassName);
+TYPED_TEST_SUITE(ConditionCommandTest, ConditionCommands, CommandName);
 
 TYPED_TEST(ConditionCommandTest, TakesATextOrAConditionsText) {
   TypeParam command;
@@ -261,12 +237,7 @@ TYPED_TEST(ConditionCommandTest, TheVirtualValidityIsAsked) {
 }
 
 TEST_F(SelectCommandTest, NumbersArePlainWhateverTheLocale) {
-  struct Grouping : std::numpunct<char> {
-    char do_thousands_sep() const override { return '.'; }
-    std::string do_grouping() const override { return "\3"; }
-  };
-  const std::locale before = std::locale::global(std::locale(std::locale::classic(), new Grouping));
-  setlocale(LC_ALL, "");
+  const GroupingLocale locale;
   auto command = SelectOf({"id"});
   EXPECT_TRUE(command.SetLimit(1234567, 7654321));
   EXPECT_TRUE(command.SetCondition(SqliteEqual("n", 1234567)));
@@ -274,8 +245,6 @@ TEST_F(SelectCommandTest, NumbersArePlainWhateverTheLocale) {
   UpdateCommand update;
   EXPECT_TRUE(update.AddFieldValue("n", 1234567));
   EXPECT_EQ(update.ToStr(), "]condition:[]/values:[n=1234567]");
-  std::locale::global(before);
-  setlocale(LC_ALL, "C");
 }
 
 // Builders as plain as can be, to hold the commands against.
@@ -339,15 +308,13 @@ class RandomCommandTest : public CleanTest {
     EXPECT_TRUE(command.SetCondition(reference.condition));
   }
 
-  const SqliteTableHandler table{"job", ""};
   std::mt19937 random{31};
 };
 
 TEST_F(RandomCommandTest, AnyInsertIsWhatThePlainBuilderBuilds) {
   for (int round = 0; round < 2000; ++round) {
     Reference reference;
-    InsertCommand command;
-    command.SetTable(table);
+    auto command = OnTable<InsertCommand>();
     command.SetFieldValues(Fields(reference));
     const bool isReplacing = random() % 2 == 0;
     command.SetReplacable(isReplacing);
@@ -361,8 +328,7 @@ TEST_F(RandomCommandTest, AnyInsertIsWhatThePlainBuilderBuilds) {
 TEST_F(RandomCommandTest, AnyUpdateIsWhatThePlainBuilderBuilds) {
   for (int round = 0; round < 2000; ++round) {
     Reference reference;
-    UpdateCommand command;
-    command.SetTable(table);
+    auto command = OnTable<UpdateCommand>();
     command.SetFieldValues(Fields(reference));
     MaybeCondition(command, reference);
     ASSERT_EQ(command.GetCommand(),
@@ -376,8 +342,7 @@ TEST_F(RandomCommandTest, AnySelectIsWhatThePlainBuilderBuilds) {
   for (int round = 0; round < 2000; ++round) {
     Reference reference;
     Reference order;
-    SelectCommand command;
-    command.SetTable(table);
+    auto command = OnTable<SelectCommand>();
     for (auto left = random() % 4; left > 0; --left) reference.fields.push_back(Name());
     for (auto left = random() % 4; left > 0; --left) order.fields.push_back(Name());
     const bool isAll = reference.fields.empty();

@@ -3,10 +3,8 @@
 #include <sqlite3.h>
 
 #include <algorithm>
-#include <clocale>
 #include <cstdint>
 #include <limits>
-#include <locale>
 #include <memory>
 #include <random>
 #include <regex>
@@ -16,6 +14,7 @@
 #include <vector>
 
 #include "support/clean_test.h"
+#include "support/grouping_locale.h"
 
 namespace {
 
@@ -314,17 +313,10 @@ TEST_F(SqliteValueTest, ValidityIsNotAskedWhenReading) {
 }
 
 TEST_F(SqliteValueTest, NumbersArePlainWhateverTheLocale) {
-  struct Grouping : std::numpunct<char> {
-    char do_thousands_sep() const override { return '.'; }
-    std::string do_grouping() const override { return "\3"; }
-  };
-  const std::locale before = std::locale::global(std::locale(std::locale::classic(), new Grouping));
-  setlocale(LC_ALL, "");
+  const GroupingLocale locale;
   EXPECT_EQ(SqliteValue(-1234567).ToFormatedValue(), "-1234567");
   EXPECT_EQ(SqliteValue(4294967295U).ToFormatedValue(), "4294967295");
   ExpectRefused<std::string>(1234567, "old", "[1234567] is not string");
-  std::locale::global(before);
-  setlocale(LC_ALL, "C");
 }
 
 // A random text of up to 200 bytes, `quotes` of 8 of them quotes, the others any byte but NUL or,
