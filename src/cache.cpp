@@ -1,6 +1,5 @@
 #include "kelodrcore/cache.h"
 
-#include <kelocore.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -13,6 +12,7 @@
 #include <new>
 #include <utility>
 
+#include "kelocore.h"
 #include "kelodrcore/file.h"
 #include "kelodrcore/file_lock.h"
 #include "kelodrcore/json_value.h"

@@ -5,7 +5,6 @@
 #include "kelodrcore/json_value.h"
 
 namespace KeloDRCore {
-
 namespace {
 
 // Null pointers on either side find nothing, so that look-ups chain. JsonCpp throws when asked for
