@@ -1,24 +1,18 @@
+// Text, files and pid files; programs and processes are in kelocore_process.cpp.
+
 #include "kelocore.h"
 
 #include <fcntl.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <charconv>
 #include <climits>
-#include <cstdarg>
 #include <cstdint>
-#include <cstdlib>
 #include <cstring>
-#include <memory>
-#include <mutex>
 #include <string_view>
-#include <utility>
-#include <vector>
 
 #include "descriptor.h"
 #include "retry.h"
@@ -29,207 +23,6 @@ using KeloDRCore::Descriptor;
 using KeloDRCore::Retry;
 
 constexpr char kWhiteSpace[] = " \t\n\r\v\f";
-constexpr int kFirstFreeDescriptor = STDERR_FILENO + 1;
-
-// The same file above the standard streams, which a caller may have closed: what is put on one of
-// their numbers later must not hit it.
-Descriptor AboveStandardStreams(Descriptor descriptor) {
-  if (!descriptor.IsOpen() || descriptor.Get() >= kFirstFreeDescriptor) return descriptor;
-  return Descriptor(fcntl(descriptor.Get(), F_DUPFD_CLOEXEC, kFirstFreeDescriptor));
-}
-
-struct Pipe {
-  Descriptor readEnd;
-  Descriptor writeEnd;
-
-  bool Open() {
-    int ends[2];
-    if (pipe2(ends, O_CLOEXEC) != 0) return false;
-    Descriptor first(ends[0]);
-    Descriptor second(ends[1]);
-    readEnd = AboveStandardStreams(std::move(first));
-    writeEnd = AboveStandardStreams(std::move(second));
-    return readEnd.IsOpen() && writeEnd.IsOpen();
-  }
-};
-
-// Blocks every signal while it lives, so that no handler of the caller runs in a helper process.
-class SignalBlock {
- public:
-  SignalBlock() {
-    sigset_t all;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);
-  }
-  ~SignalBlock() { pthread_sigmask(SIG_SETMASK, &before, nullptr); }
-  SignalBlock(const SignalBlock&) = delete;
-  SignalBlock& operator=(const SignalBlock&) = delete;
-
- private:
-  sigset_t before;
-};
-
-// A number that one process reports to another; far below PIPE_BUF, so it goes as a whole.
-bool Send(int fd, int number) {
-  return Retry([&] { return write(fd, &number, sizeof number); }) == sizeof number;
-}
-
-bool Receive(int fd, int* number) {
-  return Retry([&] { return read(fd, number, sizeof *number); }) == sizeof *number;
-}
-
-// Waits until the child is gone; who takes its status (this call, the kernel where SIGCHLD is
-// ignored, or a handler of the caller) does not matter.
-void Reap(pid_t child) {
-  const int savedErrno = errno;
-  Retry([&] { return waitpid(child, nullptr, 0); });
-  errno = savedErrno;
-}
-
-// A program runs under a supervisor, a fork of the caller that starts it, waits for it and reports
-// its wait status through a pipe. A direct child's status is lost where the caller ignores SIGCHLD
-// or its handler reaps whatever it finds, and changing the disposition meanwhile would leave the
-// caller's other children as zombies.
-struct Program {
-  pid_t supervisor = -1;
-  Descriptor report;
-};
-
-// Which standard stream of a program is one end of a pipe.
-struct Redirection {
-  int fd;
-  int target;
-};
-
-// Returns an errno, 0 for a running program. Ids stay as they are: a caller that is root only
-// effectively runs the program as such.
-int Spawn(const char* program, char* const argv[], pid_t* pid) {
-  sigset_t all;
-  sigset_t none;
-  sigfillset(&all);
-  sigemptyset(&none);
-  posix_spawnattr_t attributes;
-  int error = posix_spawnattr_init(&attributes);
-  if (error != 0) return error;
-  posix_spawnattr_setsigdefault(&attributes, &all);
-  posix_spawnattr_setsigmask(&attributes, &none);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
-  error = posix_spawn(pid, program, nullptr, &attributes, argv, environ);
-  posix_spawnattr_destroy(&attributes);
-  return error;
-}
-
-// Leaves the standard streams and, above them, only the report. After a failure nothing may be put
-// on the numbers meant: they are still files of the caller's.
-bool ArrangeDescriptors(const Redirection* redirection, int report) {
-  if (redirection != nullptr &&
-      Retry([&] { return dup2(redirection->fd, redirection->target); }) < 0) {
-    return false;
-  }
-  if (report != kFirstFreeDescriptor &&
-      Retry([&] { return dup3(report, kFirstFreeDescriptor, O_CLOEXEC); }) < 0) {
-    return false;
-  }
-  closefrom(kFirstFreeDescriptor + 1);
-  return true;
-}
-
-// The supervisor's whole life, with every signal blocked. It lets go of the standard streams once
-// the program has them: the end of the program's output must not wait for the supervisor's.
-[[noreturn]] void Supervise(const char* program, char* const argv[], const Redirection* redirection,
-                            int report) {
-  signal(SIGCHLD, SIG_DFL);
-  if (!ArrangeDescriptors(redirection, report)) {
-    Send(report, errno);
-    _exit(0);
-  }
-  pid_t pid = -1;
-  const int error = Spawn(program, argv, &pid);
-  Send(kFirstFreeDescriptor, error);
-  if (error != 0) _exit(0);
-  for (int fd = 0; fd < kFirstFreeDescriptor; ++fd) close(fd);
-  int status = -1;
-  Retry([&] { return waitpid(pid, &status, 0); });
-  Send(kFirstFreeDescriptor, status);
-  _exit(0);
-}
-
-// False with errno when the program cannot be started; nothing is left of it then.
-bool Start(const char* program, char* const argv[], const Redirection* redirection,
-           Program* started) {
-  Pipe report;
-  if (!report.Open()) return false;
-  {
-    const SignalBlock block;
-    started->supervisor = fork();
-    if (started->supervisor == 0) Supervise(program, argv, redirection, report.writeEnd.Get());
-  }
-  if (started->supervisor < 0) return false;
-  report.writeEnd.Close();
-  int error = ECHILD;  // the supervisor was killed
-  if (Receive(report.readEnd.Get(), &error) && error == 0) {
-    started->report = std::move(report.readEnd);
-    return true;
-  }
-  Reap(started->supervisor);
-  errno = error;
-  return false;
-}
-
-// The wait status, or -1 with errno when nobody can tell it any more.
-int Finish(const Program& program) {
-  int status = -1;
-  if (!Receive(program.report.Get(), &status)) errno = ECHILD;
-  Reap(program.supervisor);
-  return status;
-}
-
-// The open streams of KLIBCPopen.
-struct Running {
-  FILE* stream = nullptr;
-  Program program;
-  std::unique_ptr<Running> next;
-};
-
-std::mutex runningMutex;
-std::unique_ptr<Running>* const running = new std::unique_ptr<Running>;  // outlives every user
-
-void Remember(std::unique_ptr<Running> entry) {
-  const std::lock_guard<std::mutex> guard(runningMutex);
-  entry->next = std::move(*running);
-  *running = std::move(entry);
-}
-
-std::unique_ptr<Running> Forget(const FILE* stream) {
-  const std::lock_guard<std::mutex> guard(runningMutex);
-  std::unique_ptr<Running>* link = running;
-  while (*link && (*link)->stream != stream) link = &(*link)->next;
-  std::unique_ptr<Running> found = std::move(*link);
-  if (found) *link = std::move(found->next);
-  return found;
-}
-
-FILE* OpenStream(const char* program, const char* mode, char* const argv[]) {
-  const bool reading = strcmp(mode, "r") == 0;
-  auto entry = std::make_unique<Running>();
-  Pipe pipe;
-  if (!pipe.Open()) return nullptr;
-  Descriptor& own = reading ? pipe.readEnd : pipe.writeEnd;
-  const Descriptor& other = reading ? pipe.writeEnd : pipe.readEnd;
-  entry->stream = fdopen(own.Get(), mode);
-  if (entry->stream == nullptr) return nullptr;
-  own.Release();
-  const Redirection redirection{other.Get(), reading ? STDOUT_FILENO : STDIN_FILENO};
-  if (!Start(program, argv, &redirection, &entry->program)) {
-    const int savedErrno = errno;
-    fclose(entry->stream);
-    errno = savedErrno;
-    return nullptr;
-  }
-  FILE* const stream = entry->stream;
-  Remember(std::move(entry));
-  return stream;
-}
 
 // The first `size` bytes of a file. A FIFO planted under the name does not hold the reader up.
 ssize_t ReadStart(const char* path, char* buffer, size_t size) {
@@ -306,66 +99,9 @@ bool WritePidFile(int fd, const char* text) {
   return written == static_cast<ssize_t>(length);
 }
 
-// Forks twice, so that the child's parent is gone at once. The process in between reports the
-// child's pid, or the negative errno of the second fork.
-pid_t ForkDetached() {
-  Pipe report;
-  if (!report.Open()) return -1;
-  const SignalBlock block;
-  const pid_t between = fork();
-  if (between < 0) return -1;
-  if (between == 0) {
-    const pid_t child = fork();
-    if (child == 0) return 0;
-    Send(report.writeEnd.Get(), child > 0 ? child : -errno);
-    _exit(0);
-  }
-  report.writeEnd.Close();
-  int result = -ECHILD;
-  Receive(report.readEnd.Get(), &result);
-  Reap(between);
-  if (result > 0) return result;
-  errno = -result;
-  return -1;
-}
-
-constexpr int kForkDetached = 1;
-constexpr int kForkSession = 64;
-
 }  // namespace
 
 extern "C" {
-
-int KLIBCExec(const char* program, const char* a1, const char* a2, const char* a3, const char* a4) {
-  const char* argv[] = {program, a1, a2, a3, a4, nullptr};
-  Program started;
-  if (!Start(program, const_cast<char* const*>(argv), nullptr, &started)) return -1;
-  return Finish(started) == 0 ? 0 : -1;
-}
-
-FILE* KLIBCPopen(const char* program, const char* mode, ...) {
-  if (strcmp(mode, "r") != 0 && strcmp(mode, "w") != 0) {
-    errno = EINVAL;
-    return nullptr;
-  }
-  std::vector<const char*> argv{program};
-  va_list arguments;
-  va_start(arguments, mode);
-  // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): lost sight of by the loop
-  while (argv.back() != nullptr) argv.push_back(va_arg(arguments, const char*));
-  va_end(arguments);
-  return OpenStream(program, mode, const_cast<char* const*>(argv.data()));
-}
-
-int KLIBCPclose(FILE* stream) {
-  const std::unique_ptr<Running> entry = Forget(stream);
-  if (!entry) {
-    errno = EINVAL;
-    return -1;
-  }
-  fclose(stream);
-  return Finish(entry->program);
-}
 
 char* KLIBCStrTrim(char* text, const char* set, ...) {
   if (set == nullptr) set = kWhiteSpace;
@@ -430,23 +166,6 @@ int KLIBCProcPidFileCreate(const char* path) {
   unlink(path);
   errno = savedErrno;
   return -1;
-}
-
-// /dev/null is opened before the fork, while a failure can still be told.
-int KLIBCProcForkEx(int flags) {
-  Descriptor null;
-  if ((flags & kForkSession) != 0) {
-    null = AboveStandardStreams(
-        Descriptor(Retry([] { return open("/dev/null", O_RDWR | O_CLOEXEC); })));
-    if (!null.IsOpen()) return -1;
-  }
-  const pid_t pid = (flags & kForkDetached) != 0 ? ForkDetached() : fork();
-  if (pid != 0 || (flags & kForkSession) == 0) return pid;
-  setsid();
-  for (int fd = 0; fd < kFirstFreeDescriptor; ++fd) {
-    Retry([&] { return dup2(null.Get(), fd); });
-  }
-  return 0;
 }
 
 }  // extern "C"
