@@ -17,9 +17,7 @@ pattern=${1:-.}
 bench=build/bench/bench/kelodrcore_bench
 results=build/bench/results
 
-scripts/setup.sh build bench
-cmake --preset bench
-cmake --build --preset bench
+scripts/build.sh bench
 
 if [ "$mode" = once ]; then
   # Without the largest rows and values, which take minutes.

@@ -1,16 +1,14 @@
 #!/bin/bash
-# Compares the binary interface of a release build with that of the last release.
+# Compares the binary interface of what the packages hold with that of the last release.
 #
 # usage: scripts/check-abi.sh            reports every change; fails on an incompatible one
 #        scripts/check-abi.sh --update   makes this build the one to compare with
-#
-# Needs the release build of scripts/test-packages.sh.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 library=build/package/src/libkelodrcore.so.1
 baseline=abi/libkelodrcore1.abi.gz
 
-scripts/setup.sh packages
+scripts/build.sh package
 if [ "${1:-}" = --update ]; then
   abidw --headers-dir include --no-show-locs --no-corpus-path --drop-private-types "$library" |
     gzip --no-name --best >"$baseline"

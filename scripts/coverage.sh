@@ -9,10 +9,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 minimum=${1:-0}
 
-scripts/setup.sh build test examples coverage
-cmake --preset coverage
-cmake --build --preset coverage
-
+scripts/build.sh coverage
 find build/coverage -name '*.gcda' -delete
 # Children of other users write their counts into the same files.
 (umask 0 && find build/coverage/tests -type f -name '*_test' -exec {} --gtest_list_tests \;) >/dev/null

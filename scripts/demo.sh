@@ -3,9 +3,7 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-scripts/setup.sh build examples
-cmake --preset release
-cmake --build --preset release
+scripts/build.sh release
 
 drctl=build/release/examples/drctl/drctl
 scratch=$(mktemp -d)

@@ -10,10 +10,7 @@ inputs=${1:-100000}
 targets=("${@:2}")
 [ ${#targets[@]} -gt 0 ] || targets=(command key_value literal request response)
 
-scripts/setup.sh build fuzz
-cmake --preset fuzz
-cmake --build --preset fuzz
-
+scripts/build.sh fuzz
 for target in "${targets[@]}"; do
   echo "fuzz.sh: $target, $inputs inputs"
   mkdir -p "build/fuzz/corpus/$target" build/fuzz/found

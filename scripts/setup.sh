@@ -7,7 +7,7 @@
 #   test      what the tests link and run
 #   examples  what the example programs link
 #   format    the formatter
-#   packages  what cpack needs for Debian packages
+#   package   what makes and checks Debian packages
 #   scripts   the checker of shell scripts
 #   lint      the static checkers
 #   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
@@ -24,7 +24,7 @@ packages_of() {
     test) echo libgtest-dev libgmock-dev locales pkgconf valgrind lighttpd curl ;;
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
-    packages) echo abigail-tools dpkg-dev file ;;
+    package) echo abigail-tools dpkg-dev file ;;
     scripts) echo shellcheck ;;
     lint) echo clang clang-tidy ;;
     i386) echo g++-multilib googletest ;;

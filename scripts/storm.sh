@@ -7,10 +7,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 seed=${1:-1}
 
-scripts/setup.sh build test
-cmake --preset release -DKELODR_BUILD_TESTS=ON -B build/storm
-cmake --build build/storm --target storm
-
+scripts/build.sh storm
 # A kill loses nothing that was written, on a disk or not; in memory more happens in the time.
 if [[ -z ${TMPDIR:-} && -w /dev/shm ]]; then export TMPDIR=/dev/shm; fi
 storm() { nice build/storm/tests/storm "$@" "seed=$seed"; }

@@ -4,11 +4,9 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-scripts/setup.sh build examples packages
-cmake -S . -B build/package -G Ninja -DCMAKE_BUILD_TYPE=Release -DCMAKE_INSTALL_PREFIX=/usr \
-  -DCMAKE_CXX_FLAGS=-g -DKELODR_BUILD_EXAMPLES=ON
-cmake --build build/package
-(cd build/package && rm -f ./*.deb && cpack)
+scripts/build.sh package
+rm -f build/package/*.deb
+cpack --preset package
 
 root=$PWD/build/package/root
 rm -rf "$root"
@@ -39,5 +37,5 @@ cmake -S tests/package/consumer -B build/package/consumer -DCMAKE_PREFIX_PATH="$
 cmake --build build/package/consumer
 build/package/consumer/consumer
 echo "== drctl of the packages"
-LD_LIBRARY_PATH=$libdir "$root/usr/bin/drctl" --db "$(mktemp -d)/registry.db" node count
+LD_LIBRARY_PATH=$libdir "$root/usr/bin/drctl" --db build/package/registry.db node count
 echo "test-packages.sh: the packages work"

@@ -5,12 +5,9 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-scripts/setup.sh build test examples
-cmake --preset dev
-cmake --build --preset dev
+scripts/build.sh dev
 cmake --build --preset dev --target kelocore kelorandom
-cmake --preset system-platform
-cmake --build --preset system-platform
+scripts/build.sh system-platform
 
 export LD_LIBRARY_PATH=$PWD/build/system-platform/src
 ldd build/dev/tests/err_test | grep -q "$LD_LIBRARY_PATH/libkelodrcore"

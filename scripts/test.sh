@@ -6,10 +6,5 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 preset=${1:-dev}
 
-scripts/setup.sh build test examples
-case $preset in
-  i386*) scripts/setup-i386.sh ;;
-esac
-cmake --preset "$preset"
-cmake --build --preset "$preset"
+scripts/build.sh "$preset"
 ctest --preset "$preset" --parallel "$(nproc)"
