@@ -4,17 +4,15 @@
 
 #include <clocale>
 #include <cmath>
-#include <cstdint>
 #include <cstdlib>
-#include <cstring>
 #include <limits>
 #include <locale>
 #include <memory>
-#include <random>
 #include <string>
 #include <vector>
 
 #include "support/clean_test.h"
+#include "support/random_json.h"
 
 namespace {
 
@@ -56,68 +54,6 @@ std::string WrittenByJsonCpp(const Json::Value& value) {
   builder["emitUTF8"] = true;
   return Json::writeString(builder, value);
 }
-
-// Documents of every type, with texts and names of any bytes.
-class RandomDocuments {
- public:
-  explicit RandomDocuments(unsigned seed) : generator(seed) {}
-
-  Json::Value Next(int depth = 0) {
-    switch (Below(depth < 4 ? 8 : 6)) {
-      case 0:
-        return {};
-      case 1:
-        return Below(2) == 0;
-      case 2:
-        return static_cast<Json::Int64>(Bits());
-      case 3:
-        return static_cast<Json::UInt64>(Bits() | (uint64_t{1} << 63));
-      case 4:
-        return Double();
-      case 5:
-        return Text();
-      case 6:
-        return Array(depth);
-      default:
-        return Object(depth);
-    }
-  }
-
-  double Double() {
-    double number;
-    do {
-      const uint64_t bits = Bits();
-      static_assert(sizeof number == sizeof bits);
-      std::memcpy(&number, &bits, sizeof number);
-    } while (!std::isfinite(number));
-    return number;
-  }
-
-  std::string Text() {
-    std::string text;
-    for (unsigned length = Below(12); length > 0; --length) text += static_cast<char>(Below(256));
-    return text;
-  }
-
-  unsigned Below(unsigned limit) { return static_cast<unsigned>(generator() % limit); }
-
- private:
-  uint64_t Bits() { return generator(); }
-
-  Json::Value Array(int depth) {
-    Json::Value array(Json::arrayValue);
-    for (unsigned size = Below(5); size > 0; --size) array.append(Next(depth + 1));
-    return array;
-  }
-
-  Json::Value Object(int depth) {
-    Json::Value object(Json::objectValue);
-    for (unsigned size = Below(5); size > 0; --size) object[Text()] = Next(depth + 1);
-    return object;
-  }
-
-  std::mt19937_64 generator;
-};
 
 TEST_F(JsonValueTest, WritesOneCompactLineInTheOrderOfNames) {
   Json::Value value;
@@ -185,9 +121,9 @@ TEST_F(JsonValueTest, WritesNullForTheGapsOfAnArray) {
 }
 
 TEST_F(JsonValueTest, RandomDocumentsComeBackAndReadAsJsonCppWritesThem) {
-  RandomDocuments documents(1);
+  RandomJson random(1);
   for (int i = 0; i < 20000; ++i) {
-    const Json::Value value = documents.Next();
+    const Json::Value value = random.Value(4);
     const std::string text = toString(value);
     ASSERT_EQ(text, WrittenByJsonCpp(value));
     ASSERT_EQ(text.find('\n'), std::string::npos);
@@ -198,7 +134,7 @@ TEST_F(JsonValueTest, RandomDocumentsComeBackAndReadAsJsonCppWritesThem) {
 }
 
 // The document with bytes put in, taken out and replaced.
-std::string Mutated(std::string text, RandomDocuments& random) {
+std::string Mutated(std::string text, RandomJson& random) {
   static const char* const kPieces[] = {
       "{",    "}",           "[",       "]",        ",",
       ":",    "\"",          "\\",      "/**/",     "+",
@@ -218,10 +154,10 @@ std::string Mutated(std::string text, RandomDocuments& random) {
 
 // An unended comment that the text's last byte would end is the one thing that JsonCpp lets pass.
 TEST_F(JsonValueTest, RandomTextsReadAsJsonCppReadsThem) {
-  RandomDocuments random(2);
+  RandomJson random(2);
   int accepted = 0;
   for (int i = 0; i < 60000; ++i) {
-    const std::string text = Mutated(toString(random.Next(1)), random);
+    const std::string text = Mutated(toString(random.Value(3)), random);
     Json::Value value;
     Json::Value expected;
     const bool jsonCpp = ReadByJsonCpp(text, expected);
@@ -235,7 +171,7 @@ TEST_F(JsonValueTest, RandomTextsReadAsJsonCppReadsThem) {
 }
 
 TEST_F(JsonValueTest, RandomBytesNeverThrowAndChangeNothingOnFailure) {
-  RandomDocuments random(3);
+  RandomJson random(3);
   for (int i = 0; i < 20000; ++i) {
     Json::Value value("untouched");
     if (fromString(value, random.Text())) continue;

@@ -1,7 +1,6 @@
 #include <json/json.h>
 
 #include <cstdint>
-#include <random>
 #include <string>
 #include <vector>
 
@@ -9,6 +8,7 @@
 #include "request_samples.h"
 #include "support/clean_test.h"
 #include "support/json_text.h"
+#include "support/random_json.h"
 
 namespace {
 
@@ -173,65 +173,19 @@ TEST_F(RequestJsonTest, JsonFormIsACopy) {
   EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
 }
 
-// Random documents: every JSON type, nested, with bytes of all values in keys and texts.
-class Documents {
- public:
-  Json::Value Call() {
-    Json::Value call = Object(4);
-    call["api"] = Text();
-    call["method"] = Text();
-    call["version"] = static_cast<int>(random());
-    return call;
-  }
-
-  Json::Value Object(int depth) {
-    Json::Value object(Json::objectValue);
-    for (int left = Below(6); left > 0; --left) object[Text()] = Value(depth - 1);
-    return object;
-  }
-
- private:
-  int Below(int bound) { return static_cast<int>(random() % static_cast<unsigned>(bound)); }
-
-  std::string Text() {
-    std::string text;
-    for (int left = Below(5); left > 0; --left) text += static_cast<char>(Below(256));
-    return text;
-  }
-
-  Json::Value Array(int depth) {
-    Json::Value array(Json::arrayValue);
-    for (int left = Below(5); left > 0; --left) array.append(Value(depth - 1));
-    return array;
-  }
-
-  Json::Value Value(int depth) {
-    switch (Below(depth > 0 ? 7 : 5)) {
-      case 0:
-        return {};
-      case 1:
-        return static_cast<Json::Int64>(static_cast<std::uint64_t>(random()) << 20);
-      case 2:
-        return Below(2) == 0;
-      case 3:
-        return Below(1000) / 8.0;
-      case 4:
-        return Text();
-      case 5:
-        return Array(depth);
-      default:
-        return Object(depth);
-    }
-  }
-
-  std::mt19937 random{20260901};
-};
+Json::Value RandomCall(RandomJson& random) {
+  Json::Value call = random.Object(4);
+  call["api"] = random.Text();
+  call["method"] = random.Text();
+  call["version"] = static_cast<int>(random.Below(UINT32_MAX));
+  return call;
+}
 
 TEST_F(RequestJsonTest, JsonFormGivesBackAnyCallThatWasLoaded) {
-  Documents documents;
+  RandomJson random(20260901);
   Request request;
   for (int round = 0; round < 2000; ++round) {
-    const Json::Value call = documents.Call();
+    const Json::Value call = RandomCall(random);
     request.setRequest(call);
     ASSERT_EQ(request.toJson(), call);
     for (const char* key : kReserved) ASSERT_FALSE(request.getParams().isMember(key));
@@ -239,10 +193,10 @@ TEST_F(RequestJsonTest, JsonFormGivesBackAnyCallThatWasLoaded) {
 }
 
 TEST_F(RequestJsonTest, MergingEqualsAddingTheMembersOneByOne) {
-  Documents documents;
+  RandomJson random(20260901);
   for (int round = 0; round < 1000; ++round) {
-    const Json::Value before = documents.Object(3);
-    const Json::Value members = round % 2 == 0 ? documents.Object(3) : documents.Call();
+    const Json::Value before = random.Object(3);
+    const Json::Value members = round % 2 == 0 ? random.Object(3) : RandomCall(random);
     Request merged = WithParams(before);
     ASSERT_TRUE(merged.addParam(members));
     Request single = WithParams(before);
