@@ -35,6 +35,13 @@ bool AppendGroup(std::string& text, const std::string& left, const char* keyword
   return true;
 }
 
+// Asks the virtual operation: a subclass may know other keywords.
+bool HasKeyword(const SqliteInFamily& condition) {
+  if (condition.IsValid()) return true;
+  KELODR_LOG(ERR, "SetValue", "Bad keyword [%s]", condition.GetKeyword().c_str());
+  return false;
+}
+
 }  // namespace
 
 SqliteCondition::SqliteCondition() = default;
@@ -105,10 +112,7 @@ SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string
 bool SqliteInFamily::IsValid() const { return keyword == kIn || keyword == kNotIn; }
 
 bool SqliteInFamily::SetValue(const std::string& lvalue, const std::vector<SqliteValue>& values) {
-  if (!IsValid()) {
-    KELODR_LOG(ERR, __func__, "Bad keyword [%s]", keyword.c_str());
-    return false;
-  }
+  if (!HasKeyword(*this)) return false;
   if (lvalue.empty()) {
     KELODR_LOG(ERR, __func__, "Bad lvalue[%s]", lvalue.c_str());
     return false;
@@ -130,10 +134,7 @@ bool SqliteInFamily::SetValue(const std::string& lvalue, const std::vector<Sqlit
 }
 
 bool SqliteInFamily::SetValue(const std::string& lvalue, const std::string& value) {
-  if (!IsValid()) {
-    KELODR_LOG(ERR, __func__, "Bad keyword [%s]", keyword.c_str());
-    return false;
-  }
+  if (!HasKeyword(*this)) return false;
   if (lvalue.empty() || value.empty()) {
     KELODR_LOG(ERR, __func__, "Bad lvalue[%s] or value[%s]", lvalue.c_str(), value.c_str());
     return false;

@@ -153,6 +153,13 @@ bool SetField(std::map<std::string, SqliteValue>& values, const std::string& fie
   return true;
 }
 
+// Logs in the name of `function` when the text cannot name a field.
+bool IsName(const std::string& field, const char* function) {
+  if (!field.empty()) return true;
+  KELODR_LOG(ERR, function, "Invalid field [%s]", field.c_str());
+  return false;
+}
+
 }  // namespace
 
 SqliteValue::SqliteValue() : valid(false) {}
@@ -244,10 +251,7 @@ SqliteValueList& SqliteValueList::operator+=(const SqliteValueList& other) {
 }
 
 const SqliteValue& SqliteValueList::GetValue(const std::string& field) const {
-  if (field.empty()) {
-    KELODR_LOG(ERR, __func__, "Invalid field [%s]", field.c_str());
-    return nullValue;
-  }
+  if (!IsName(field, __func__)) return nullValue;
   const auto found = values.find(field);
   if (found == values.end()) {
     KELODR_LOG(WARN, __func__, "Failed to find field [%s]", field.c_str());
@@ -258,10 +262,7 @@ const SqliteValue& SqliteValueList::GetValue(const std::string& field) const {
 
 template <typename T>
 bool SqliteValueList::GetValue(const std::string& field, T& out) const {
-  if (field.empty()) {
-    KELODR_LOG(ERR, __func__, "Invalid field [%s]", field.c_str());
-    return false;
-  }
+  if (!IsName(field, __func__)) return false;
   const auto found = values.find(field);
   if (found == values.end()) {
     KELODR_LOG(DEBUG, __func__, "field [%s] is not existed", field.c_str());
@@ -271,10 +272,7 @@ bool SqliteValueList::GetValue(const std::string& field, T& out) const {
 }
 
 bool SqliteValueList::HasField(const std::string& field) const {
-  if (field.empty()) {
-    KELODR_LOG(ERR, __func__, "Invalid field [%s]", field.c_str());
-    return false;
-  }
+  if (!IsName(field, __func__)) return false;
   return values.count(field) != 0;
 }
 

@@ -48,9 +48,10 @@ class KELODR_EXPORT ErrRecorder {
 /// once.
 ///
 /// Failure is a false result, a line in the log, and the error in `GetErr()`: 401 for a bad
-/// argument, 404 for a failed operation and 405 for a database that stayed busy or locked, the last
-/// two with "sqlite_errcode" and "sqlite_errmsg" in "err_msg". Nothing is thrown but
-/// `std::bad_alloc`.
+/// argument, 403 when there is no connection although it was opened, 404 for a failed operation and
+/// 405 for a database that stayed busy or locked, the last two with "sqlite_errcode" and
+/// "sqlite_errmsg" in "err_msg" where SQLite refused. A statement, query or command that succeeds
+/// clears the error. Nothing is thrown but `std::bad_alloc`.
 ///
 /// One handle is used by one thread at a time; `const` operations write the error too.
 class KELODR_EXPORT SqliteDB : public ErrRecorder {
@@ -76,11 +77,12 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   [[nodiscard]] bool IsExisted() const;
 
   /// @name One attempt on the open connection.
-  /// No check of the statement, no retry. A failure is recorded raw: SQLite's own result code and
-  /// message.
+  /// No check of the statement, no retry, no line. A failure is recorded raw: SQLite's own result
+  /// code and message.
   /// @{
 
-  /// Runs the statements and discards their rows. Success leaves the recorded error as it was.
+  /// Runs the statements and discards their rows. Success leaves the recorded error as it was,
+  /// deliberately.
   bool DoExecSqliteCommand(const std::string& sql);
 
   /// Puts the first row into `record`, in place of what it held; with no row it succeeds and leaves
@@ -122,14 +124,17 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   bool IsTableExisted(const std::string& tableName);
 
   /// Counts the rows of a table. False, with `count` untouched and a line at ERR, when it cannot be
-  /// counted, for instance because it is missing. Creates nothing.
+  /// counted, for instance because it is missing. Creates no table. The name is not escaped.
   bool GetCount(const SqliteTableHandler& table, int& count);
 
-  /// Creates the table if it is missing. Without column definitions this is a successful no-op.
+  /// Creates the table if it is missing. Without column definitions this is a successful no-op,
+  /// deliberately. False with a line at ERR for an empty name, which leaves the recorded error as
+  /// it was, and for a refused statement.
   bool CreateTable(const SqliteTableHandler& table);
 
-  /// Creates the command's table if it is missing, then runs the command. Logs the statement, and
-  /// its success, at INFO. Fails with 401 for an invalid command.
+  /// Creates the command's table if it is missing, then runs the command and discards its rows.
+  /// Logs the statement, and its success, at INFO. Fails with 401 for an invalid command, whose
+  /// empty statement is logged too.
   bool Exec(const SqliteCommand& cmd);
 
   /// `Exec`: a missing file is created.
