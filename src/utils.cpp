@@ -34,7 +34,9 @@ std::string GenerateUUID() {
   size_t capacity = 0;
   const bool isRead = getline(&line, &capacity, output.get()) != -1;
   const std::unique_ptr<char, void (*)(void*)> owner(line, free);
-  return isRead ? KLIBCStrTrim(line, nullptr, nullptr) : "";
+  if (!isRead) return "";
+  KLIBCStrTrim(line, nullptr, nullptr);
+  return line;
 }
 
 }  // namespace KeloDRCore
