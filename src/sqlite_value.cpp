@@ -1,5 +1,7 @@
 #include "kelodrcore/sqlite_value.h"
 
+#include <endian.h>
+
 #include <algorithm>
 #include <charconv>
 #include <cstdint>
@@ -20,7 +22,7 @@ Json::Value ToJson(unsigned long long number) {
 }
 
 // Quotes are rare when there is less than one in so many bytes.
-constexpr size_t kRare = 16;
+constexpr size_t kRare = 64;
 
 // In blocks whose count fits a byte, so that the compiler can take many bytes at a time.
 size_t CountQuotes(const char* at, const char* end) {
@@ -34,28 +36,47 @@ size_t CountQuotes(const char* at, const char* end) {
   return count;
 }
 
-// `out` has room for the result and one byte more. Run by run where quotes are rare, else byte by
-// byte without a branch.
-char* CopyDoublingQuotes(const char* at, const char* end, bool areRare, char* out) {
-  while (areRare) {
-    const void* const found = std::memchr(at, '\'', static_cast<size_t>(end - at));
-    if (found == nullptr) return std::copy(at, end, out);
+// Run by run, for texts in which quotes are rare.
+char* CopyRuns(const char* at, const char* end, char* out) {
+  while (const void* const found = std::memchr(at, '\'', static_cast<size_t>(end - at))) {
     const char* const next = static_cast<const char*>(found) + 1;
     out = std::copy(at, next, out);
     *out++ = '\'';
     at = next;
   }
+  return std::copy(at, end, out);
+}
+
+// Eight bytes at a time: all eight are copied, and those from a quote on once more, a byte farther.
+// `out` has room for the result. What is written beyond that of one word is overwritten by the next
+// word's, so the last words go byte by byte.
+char* CopyWords(const char* at, const char* end, char* out) {
+  constexpr uint64_t kLowBits = 0x7F7F7F7F7F7F7F7F;
+  constexpr uint64_t kQuotes = 0x2727272727272727;
+  constexpr std::ptrdiff_t kWord = sizeof(uint64_t);
+  for (; end - at >= 2 * kWord; at += kWord, out += kWord) {
+    uint64_t word = 0;
+    std::memcpy(&word, at, kWord);
+    std::memcpy(out, &word, kWord);
+    word = le64toh(word);
+    const uint64_t other = word ^ kQuotes;
+    uint64_t quotes = ~(((other & kLowBits) + kLowBits) | other | kLowBits);  // their high bits
+    for (; quotes != 0; quotes &= quotes - 1) {
+      const int place = __builtin_ctzll(quotes) / 8;
+      const uint64_t rest = htole64(word >> (8 * place));
+      ++out;
+      std::memcpy(out + place, &rest, kWord);
+    }
+  }
   for (; at != end; ++at) {
-    const char byte = *at;
-    out[0] = byte;
-    out[1] = '\'';
-    out += byte == '\'' ? 2 : 1;
+    *out++ = *at;
+    if (*at == '\'') *out++ = '\'';
   }
   return out;
 }
 
 // Doubles each quote, byte for byte as a regular expression would; two passes over the bytes cost a
-// fiftieth of it.
+// small part of it.
 void AppendQuoted(std::string& text, const char* begin, const char* end) {
   const auto length = static_cast<size_t>(end - begin);
   const void* const first = std::memchr(begin, '\'', length);
@@ -71,14 +92,15 @@ void AppendQuoted(std::string& text, const char* begin, const char* end) {
   text.resize(start + length + quotes + 2);
   char* out = &text[start];
   *out++ = '\'';
-  out = CopyDoublingQuotes(begin, end, quotes * kRare < length, out);
+  out = quotes * kRare < length ? CopyRuns(begin, end, out) : CopyWords(begin, end, out);
   *out = '\'';
 }
 
 template <typename Integer>
 void AppendDecimal(std::string& text, Integer number) {
   char digits[24];
-  text.append(digits, std::to_chars(digits, digits + sizeof(digits), number).ptr);
+  const char* const end = std::to_chars(digits, digits + sizeof(digits), number).ptr;
+  text.append(digits, static_cast<size_t>(end - digits));
 }
 
 // Convert: true and `out` written when the payload can be read as that type.
@@ -201,16 +223,18 @@ std::string SqliteValue::ToFormatedValue() const {
 }
 
 void SqliteValue::AppendFormatedValue(std::string& text) const {
-  const char* begin = nullptr;
-  const char* end = nullptr;
-  if (value.getString(&begin, &end)) {
+  const Json::ValueType type = value.type();
+  if (type == Json::stringValue) {
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    value.getString(&begin, &end);
     AppendQuoted(text, begin, end);
-  } else if (value.isBool()) {
+  } else if (type == Json::booleanValue) {
     text += value.asBool() ? '1' : '0';
   } else if (value.isInt()) {
-    AppendDecimal(text, value.asInt64());
+    AppendDecimal(text, value.asLargestInt());
   } else if (value.isUInt()) {
-    AppendDecimal(text, value.asUInt64());
+    AppendDecimal(text, value.asLargestUInt());
   }
 }
 
