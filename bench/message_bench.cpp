@@ -1,5 +1,6 @@
 // Request and Response: building a call as text, reading a call, asking a reply; beside the same
-// with JsonCpp alone.
+// with JsonCpp alone, which never needs a second copy of the document. The library needs one where
+// the caller keeps the request, or the document that it is read from.
 
 #include "kelodrcore/json_value.h"
 #include "kelodrcore/request.h"
@@ -35,14 +36,22 @@ struct Call {
   std::string reply;
 };
 
-std::string BuildWithLibrary(const Call& call) {
+KeloDRCore::Request BuildRequest(const Call& call) {
   KeloDRCore::Request request;
   request.setAPI(kApi);
   request.setMethod("set");
   request.setVersion(1);
   request.addParam("id", 7);
   request.addParam("nodes", call.nodes);
-  return KeloDRCore::JsonValue::toString(request.toJson());
+  return request;
+}
+
+std::string BuildWithLibrary(const Call& call) {
+  return KeloDRCore::JsonValue::toString(BuildRequest(call).takeJson());
+}
+
+std::string BuildAndKeep(const Call& call) {
+  return KeloDRCore::JsonValue::toString(BuildRequest(call).toJson());
 }
 
 std::string BuildByHand(const Call& call) {
@@ -55,12 +64,21 @@ std::string BuildByHand(const Call& call) {
   return WriteWithJsonCpp(json);
 }
 
+size_t QueryRequest(const KeloDRCore::Request& request) {
+  Require(request.isValid() && request.getAPI() == kApi && request.getVersion() == 1, "request");
+  return request.getParams()["nodes"].size();
+}
+
 size_t ParseWithLibrary(const Call& call) {
   Json::Value json;
   Require(KeloDRCore::JsonValue::fromString(json, call.text), "fromString");
-  const KeloDRCore::Request request(json);
-  Require(request.isValid() && request.getAPI() == kApi && request.getVersion() == 1, "request");
-  return request.getParams()["nodes"].size();
+  return QueryRequest(std::move(json));
+}
+
+size_t ParseAndCopy(const Call& call) {
+  Json::Value json;
+  Require(KeloDRCore::JsonValue::fromString(json, call.text), "fromString");
+  return QueryRequest(json);
 }
 
 size_t ParseByHand(const Call& call) {
@@ -107,8 +125,12 @@ void RegisterMessages() {
   for (const size_t size : {size_t{1} << 10, size_t{1} << 20}) {
     Measure("Request", "build to text", size, kLibrary, BuildWithLibrary);
     Measure("Request", "build to text", size, kLimit, BuildByHand);
+    Measure("Request", "build to text and keep", size, kLibrary, BuildAndKeep);
+    Measure("Request", "build to text and keep", size, kLimit, BuildByHand);
     Measure("Request", "parse and query", size, kLibrary, ParseWithLibrary);
     Measure("Request", "parse and query", size, kLimit, ParseByHand);
+    Measure("Request", "parse, copy and query", size, kLibrary, ParseAndCopy);
+    Measure("Request", "parse, copy and query", size, kLimit, ParseByHand);
     Measure("Response", "parse and query", size, kLibrary, AskWithLibrary);
     Measure("Response", "parse and query", size, kLimit, AskByHand);
   }

@@ -39,6 +39,8 @@ Request::Request(const std::string& apiName, int apiVersion, const std::string& 
 
 Request::Request(const Json::Value& request) { setRequest(request); }
 
+Request::Request(Json::Value&& request) : params(std::move(request)) { TakeEnvelope(); }
+
 Request::~Request() = default;
 
 void Request::setAPI(const std::string& value) { api = value; }
@@ -61,10 +63,14 @@ bool Request::isValidKey(const std::string& key) {
 }
 
 bool Request::addParam(const std::string& key, const Json::Value& value) {
-  if (!isValidKey(key) || !CanHoldMembers(params)) return false;
   // Copied before the look-up adds the member: `value` may be params itself.
-  Json::Value copy(value);
-  params[key] = std::move(copy);
+  return addParam(key, Json::Value(value));
+}
+
+bool Request::addParam(const std::string& key, Json::Value&& value) {
+  if (!isValidKey(key) || !CanHoldMembers(params)) return false;
+  Json::Value& param = params[key];
+  param = Json::Value(std::move(value));  // a plain move assignment would swap
   return true;
 }
 
@@ -86,19 +92,27 @@ bool Request::addParam(const Json::Value& members) {
 
 void Request::setRequest(const Json::Value& request) {
   params = request;
+  TakeEnvelope();
+}
+
+void Request::TakeEnvelope() {
   if (!params.isObject()) return;
   MoveText(params, kApi, api);
   MoveText(params, kMethod, method);
   MoveInt(params, kVersion, version);
 }
 
-Json::Value Request::toJson() const {
-  Json::Value json = CanHoldMembers(params) ? params : Json::Value(Json::objectValue);
+Json::Value Request::MakeJson(Json::Value members) const {
+  Json::Value json = CanHoldMembers(members) ? std::move(members) : Json::Value(Json::objectValue);
   json[kApi] = api;
   json[kMethod] = method;
   json[kVersion] = version;
   return json;
 }
+
+Json::Value Request::toJson() const { return MakeJson(params); }
+
+Json::Value Request::takeJson() { return MakeJson(std::move(params)); }
 
 std::string Request::toStr() const { return api + "/" + method + "/" + std::to_string(version); }
 

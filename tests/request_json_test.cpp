@@ -173,6 +173,26 @@ TEST_F(RequestJsonTest, JsonFormIsACopy) {
   EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
 }
 
+TEST_F(RequestJsonTest, TakingTheJsonFormGivesTheParamsAway) {
+  Request request = Filled();
+  const Json::Value expected = request.toJson();
+  const Json::Value* const id = &request.getParams()["id"];
+  const Json::Value json = request.takeJson();
+  EXPECT_EQ(json, expected);
+  EXPECT_EQ(&json["id"], id) << "it was copied";
+  EXPECT_TRUE(request.getParams().isNull());
+  EXPECT_EQ(request.toStr(), "A/get/3");
+  ExpectClientSettings(request, 5, true, "/tmp/local", "remote");
+}
+
+TEST_F(RequestJsonTest, TakingTheJsonFormLeavesOutParamsThatCannotHoldMembers) {
+  for (const Json::Value& params : ValuesWithoutMembers()) {
+    Request request = WithParams(params);
+    EXPECT_EQ(request.takeJson(), Parse(R"({"api": "A", "method": "list", "version": 1})"));
+    EXPECT_TRUE(request.getParams().isNull());
+  }
+}
+
 Json::Value RandomCall(RandomJson& random) {
   Json::Value call = random.Object(4);
   call["api"] = random.Text();

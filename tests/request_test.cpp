@@ -62,6 +62,24 @@ TEST_F(RequestTest, ConstructorLoadsACall) {
   ExpectClientSettings(request, 120, false, "", "");
 }
 
+TEST_F(RequestTest, ConstructorTakesACallThatIsGivenAway) {
+  Json::Value call = Parse(R"({"api": "A", "method": "get", "version": 2, "list": [7]})");
+  const Json::Value* const list = &call["list"];
+  const Request request(std::move(call));
+  EXPECT_TRUE(call.isNull());  // NOLINT(bugprone-use-after-move): told in the header
+  EXPECT_EQ(request.toStr(), "A/get/2");
+  EXPECT_EQ(request.getParams(), Parse(R"({"list": [7]})"));
+  EXPECT_EQ(&request.getParams()["list"], list) << "it was copied";
+  ExpectClientSettings(request, 120, false, "", "");
+}
+
+TEST_F(RequestTest, ConstructorTakesParamsOfAnyTypeThatAreGivenAway) {
+  for (Json::Value params : ValuesWithoutMembers()) {
+    const Json::Value before = params;
+    EXPECT_EQ(Request(std::move(params)).getParams(), before);
+  }
+}
+
 TEST_F(RequestTest, ConstructorFromAnEmptyCallKeepsTheDefaults) {
   const Request request{Json::Value(Json::objectValue)};
   EXPECT_EQ(request.toStr(), "//-1");
@@ -208,6 +226,27 @@ TEST_F(RequestTest, AParamIsACopy) {
   request.addParam("list", value);
   value.append(2);
   EXPECT_EQ(request.getParams(), Parse(R"({"list": [1]})"));
+}
+
+TEST_F(RequestTest, AParamThatIsGivenAwayIsNotCopied) {
+  Json::Value value = Parse("[1]");
+  const Json::Value* const first = &value[0];
+  Request request = WithParams(Parse(R"({"list": 7})"));
+  EXPECT_TRUE(request.addParam("list", std::move(value)));
+  EXPECT_TRUE(value.isNull());  // NOLINT(bugprone-use-after-move): told in the header
+  EXPECT_EQ(request.getParams(), Parse(R"({"list": [1]})"));
+  EXPECT_EQ(&request.getParams()["list"][0], first) << "it was copied";
+}
+
+TEST_F(RequestTest, ARefusedParamStaysWithItsOwner) {
+  Json::Value value = Parse("[1]");
+  Request request = WithParams(Parse(R"({"id": 7})"));
+  EXPECT_FALSE(request.addParam("api", std::move(value)));
+  Request full = WithParams(7);
+  EXPECT_FALSE(full.addParam("list", std::move(value)));
+  EXPECT_EQ(value, Parse("[1]"));  // NOLINT(bugprone-use-after-move): told in the header
+  EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
+  EXPECT_EQ(full.getParams(), 7);
 }
 
 TEST_F(RequestTest, MergesTheMembersOfAnObject) {

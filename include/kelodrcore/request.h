@@ -39,7 +39,12 @@ class KELODR_EXPORT Request {
           const Json::Value& parameters);
 
   /// The defaults, then setRequest(`request`). Implicit: a JSON call goes wherever a Request does.
+  /// A document that is given away becomes the parameters without being copied, and is null
+  /// afterwards.
+  /// @{
   Request(const Json::Value& request);  // NOLINT(google-explicit-constructor)
+  Request(Json::Value&& request);       // NOLINT(google-explicit-constructor)
+  /// @}
 
   virtual ~Request();
 
@@ -71,9 +76,13 @@ class KELODR_EXPORT Request {
   /// False for exactly "api", "method" and "version" (case-sensitive); the empty key is valid.
   [[nodiscard]] static bool isValidKey(const std::string& key);
 
-  /// Sets the parameter `key` to a copy of `value`, replacing an earlier one. Changes nothing and
-  /// returns false for a reserved key, and when the parameters are neither null nor an object.
+  /// Sets the parameter `key` to `value`, replacing an earlier one. Changes nothing and returns
+  /// false for a reserved key, and when the parameters are neither null nor an object. A value that
+  /// is given away is not copied, and is null afterwards if the result is true.
+  /// @{
   bool addParam(const std::string& key, const Json::Value& value);
+  bool addParam(const std::string& key, Json::Value&& value);
+  /// @}
 
   /// Sets a parameter for every member of the object `members`, but for reserved keys, which are
   /// skipped silently. Anything but an object has no members: nothing changes and the result is
@@ -93,6 +102,10 @@ class KELODR_EXPORT Request {
   /// not part of it.
   [[nodiscard]] Json::Value toJson() const;
 
+  /// The same for a request that is done with: its parameters are not copied, and null afterwards.
+  /// Everything else stays.
+  [[nodiscard]] Json::Value takeJson();
+
   /// "API/METHOD/VERSION", the short name for log lines.
   [[nodiscard]] std::string toStr() const;
 
@@ -101,6 +114,10 @@ class KELODR_EXPORT Request {
   void clear();
 
  private:
+  // Moves the three reserved members out of the parameters.
+  KELODR_LOCAL void TakeEnvelope();
+  KELODR_LOCAL Json::Value MakeJson(Json::Value members) const;
+
   static constexpr int kNoVersion = -1;
   static constexpr int kDefaultTimeout = 120;
 
