@@ -1,5 +1,8 @@
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
+
+#include <functional>
 
 #include "kelodrcore/json_value.h"
 #include "support/fault.h"
@@ -23,11 +26,16 @@ class JsonFaultTest : public FaultTest {
   void SetUp() override {
     FaultTest::SetUp();
     path = Path("document");
+    temporary = Path(".document.kelodr-" + std::to_string(geteuid()));
   }
 
   Fault::Operation ToFile(const std::string& old);
+  // The same over an old file, with something else that is there when it begins.
+  Fault::Operation ToFileOver(const std::function<void()>& arrange);
 
   std::string path;
+  std::string temporary;
+  bool wasLeftReadable = false;
   const Json::Value newDocument = Document(kNew);
 };
 
@@ -50,6 +58,23 @@ Fault::Operation JsonFaultTest::ToFile(const std::string& old) {
     EXPECT_EQ(outcome.log, std::vector<LogLine>{});
   };
   return {prepare, run, check};
+}
+
+// What is under the name of the temporary stays while it cannot be removed, and is never written
+// to.
+Fault::Operation JsonFaultTest::ToFileOver(const std::function<void()>& arrange) {
+  const Fault::Operation toFile = ToFile(kOld);
+  const auto prepare = [prepareFile = toFile.prepare, arrange] {
+    prepareFile();
+    arrange();
+  };
+  const auto check = [this](const Outcome& outcome) {
+    const std::string text = ReadText(path);
+    EXPECT_TRUE(text == kNew || (!outcome.succeeded && text == kOld)) << text;
+    EXPECT_LE(NamesIn(dir).size(), outcome.succeeded ? 1U : 2U);
+    EXPECT_EQ(outcome.log, std::vector<LogLine>{});
+  };
+  return {prepare, toFile.run, check};
 }
 
 }  // namespace
@@ -77,4 +102,33 @@ TEST_F(JsonFaultTest, ToFileMakesANewFileWholeOrNotAtAll) {
 TEST_F(JsonFaultTest, ToFileReplacesAFileWholeOrNotAtAll) {
   SweepCalls(ToFile(kOld));
   SweepMemory(ToFile(kOld));
+}
+
+TEST_F(JsonFaultTest, ToFileTakesALeftTemporaryAwayOrFails) {
+  const auto leave = [this] { WriteText(temporary, "half"); };
+  SweepCalls(ToFileOver(leave));
+  SweepMemory(ToFileOver(leave));
+}
+
+TEST_F(JsonFaultTest, ToFileTakesAPlantedLinkAwayOrFails) {
+  const auto plant = [this] { EXPECT_EQ(symlink("nowhere", temporary.c_str()), 0); };
+  SweepCalls(ToFileOver(plant));
+  SweepMemory(ToFileOver(plant));
+}
+
+// The bit that lets its owner read it is taken away last.
+TEST_F(JsonFaultTest, ToFileKeepsAFileFromItsOwnerOrFails) {
+  constexpr mode_t kMode = 0020;
+  Fault::Operation operation = ToFileOver([this] { chmod(path.c_str(), kMode); });
+  operation.check = [this, checkFile = operation.check](const Outcome& outcome) {
+    checkFile(outcome);
+    struct stat status = {};
+    EXPECT_EQ(stat(path.c_str(), &status), 0);
+    const bool mayBeRead = outcome.Failed("fchmod") || wasLeftReadable;
+    wasLeftReadable = (status.st_mode & S_IRUSR) != 0;
+    EXPECT_TRUE(mayBeRead || !wasLeftReadable);
+    EXPECT_EQ(status.st_mode & ~mode_t{S_IRUSR}, mode_t{S_IFREG | kMode});
+  };
+  SweepCalls(operation);
+  SweepMemory(operation);
 }

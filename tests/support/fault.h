@@ -42,6 +42,8 @@ std::vector<std::string> FailedCalls();
 // Whether this call, one that can fail with `errors`, is to fail; errno is set then.
 bool Hits(const char* call, std::initializer_list<int> errors);
 
+bool IsSuspended();
+
 // Calls made while it lives neither count nor fail.
 class Suspension {
  public:

@@ -19,8 +19,10 @@
 #include <new>
 
 #include "support/fault.h"
+#include "support/interception.h"
 
 using Fault::Hits;
+using Fault::Intercepts;
 using Fault::kNoMemory;
 
 namespace {
@@ -43,6 +45,7 @@ int FailStream(FILE* stream) {
 #define FAULT_CALL(Result, name, failure, parameters, arguments, ...) \
   extern "C" Result Fault_##name parameters __asm__(#name);           \
   extern "C" Result Fault_##name parameters {                         \
+    if (Intercepts(#name)) return failure;                            \
     if (Hits(#name, {__VA_ARGS__})) return failure;                   \
     return Next<Result parameters>(#name) arguments;                  \
   }

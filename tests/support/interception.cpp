@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <cstdlib>
 #include <utility>
 
@@ -10,7 +11,6 @@
 namespace Fault {
 namespace {
 
-// Not a container that grows: it is looked at within calls of malloc.
 std::array<Interception*, 8> waiting{};
 
 // "fstatat64" and "__fstatat64_time64" are "fstatat".
@@ -39,14 +39,16 @@ Interception::Interception(std::string callName, int callNumber, int error)
 
 Interception::~Interception() { *std::find(waiting.begin(), waiting.end(), this) = nullptr; }
 
-int Intercept(std::string_view call) {
+bool Intercepts(std::string_view call) {
+  if (IsSuspended() || LogCapture::IsRecording()) return false;
   int error = kGoOn;
   for (Interception* const one : waiting) {
     if (one == nullptr || one->call != PlainName(call) || --one->number != 0) continue;
     const Suspension suspension;
     error = one->action();
   }
-  return error;
+  if (error != kGoOn) errno = error;
+  return error != kGoOn;
 }
 
 }  // namespace Fault

@@ -30,15 +30,15 @@ class Interception {
   bool HasRun() const { return number <= 0; }
 
  private:
-  friend int Intercept(std::string_view call);
+  friend bool Intercepts(std::string_view call);
 
   const std::string call;
   int number;  // how many calls are still to come, this one included
   const std::function<int()> action;
 };
 
-// Runs the action that waits for this call. Answers the errno to fail with, or kGoOn.
-int Intercept(std::string_view call);
+// Runs the action that waits for this call, if any. Whether the call is to fail; errno is set then.
+bool Intercepts(std::string_view call);
 
 }  // namespace Fault
 
