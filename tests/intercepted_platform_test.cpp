@@ -1,0 +1,82 @@
+// Calls of the platform's stand-ins that fail where nothing else does.
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <functional>
+#include <set>
+
+#include "kelocore.h"
+#include "kelorandom.h"
+#include "support/clean_test.h"
+#include "support/interception.h"
+#include "support/process.h"
+
+namespace {
+
+using Fault::Interception;
+
+int Exec(const char* program) { return KLIBCExec(program, nullptr, nullptr, nullptr, nullptr); }
+
+// Runs `body` in a child that has nothing open but these streams.
+void RunWithStreams(const std::set<int>& streams, const std::function<void()>& body) {
+  EXPECT_EQ(RunInChild([&] {
+              for (const int fd : OpenDescriptors()) {
+                if (streams.count(fd) == 0) close(fd);
+              }
+              body();
+              EXPECT_EQ(OpenDescriptors(), streams);
+            }),
+            0);
+}
+
+using InterceptedProgramTest = CleanTest;
+
+// Both ends of its pipe come on numbers of standard streams, and are to be moved.
+TEST_F(InterceptedProgramTest, FailsWhereAPipeCannotBeMovedAboveTheStreams) {
+  for (const int number : {1, 2}) {
+    RunWithStreams({STDERR_FILENO}, [number] {
+      const Interception noDescriptor("fcntl", number, EMFILE);
+      errno = 0;
+      EXPECT_EQ(Exec("/bin/true"), -1);
+      EXPECT_EQ(errno, EMFILE);
+      EXPECT_TRUE(noDescriptor.HasRun());
+    });
+  }
+}
+
+// The end that the supervisor reports through has the number that it would be moved to.
+TEST_F(InterceptedProgramTest, RunsWhereThePipeIsInPlaceAlready) {
+  RunWithStreams({STDIN_FILENO, STDOUT_FILENO}, [] {
+    EXPECT_EQ(Exec("/bin/true"), 0);
+    EXPECT_EQ(Exec("/bin/false"), -1);
+  });
+}
+
+constexpr int kAborted = 3;
+
+using InterceptedRandomTest = CleanTest;
+
+TEST_F(InterceptedRandomTest, AnInterruptedDrawIsMadeAgain) {
+  const Interception signal("getrandom", 1, EINTR);
+  const unsigned int drawn = KELO::RANDOM::KELORandom().urandom(5, 6);
+  EXPECT_TRUE(drawn == 5 || drawn == 6) << drawn;
+  EXPECT_TRUE(signal.HasRun());
+}
+
+// No number would be honest.
+TEST_F(InterceptedRandomTest, AKernelWithoutTheCallEndsTheProcess) {
+  const int status = RunInChild([] {
+    Handle(
+        SIGABRT, [](int /*number*/) { _exit(kAborted); }, 0);
+    const Interception missing("getrandom", 1, ENOSYS);
+    KELO::RANDOM::KELORandom().urandom(5, 6);
+  });
+  ASSERT_TRUE(WIFEXITED(status));
+  EXPECT_EQ(WEXITSTATUS(status), kAborted);
+}
+
+}  // namespace
