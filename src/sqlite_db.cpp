@@ -33,6 +33,9 @@ Statement Prepare(sqlite3* db, const std::string& sql, int& code) {
   return Statement(stmt);
 }
 
+// A library in C throws nothing, which the compiler cannot know.
+int Step(const Statement& stmt) noexcept { return sqlite3_step(stmt.get()); }
+
 bool IsBusyOrLocked(int code) { return code == SQLITE_BUSY || code == SQLITE_LOCKED; }
 
 // JsonCpp reports memory that it cannot get as an error of its own.
@@ -207,8 +210,8 @@ bool SqliteDB::Select(const std::string& sql, const TakeRow& takeRow) {
   SetErr(ERR::ERR_DATABASE_OPERATION);
   int code = SQLITE_OK;
   const Statement stmt = Prepare(dbHandle, sql, code);
-  if (code == SQLITE_OK) code = sqlite3_step(stmt.get());
-  while (code == SQLITE_ROW && takeRow(stmt.get())) code = sqlite3_step(stmt.get());
+  if (code == SQLITE_OK) code = Step(stmt);
+  while (code == SQLITE_ROW && takeRow(stmt.get())) code = Step(stmt);
   if (code != SQLITE_ROW && code != SQLITE_DONE) {
     SetDBErr(code, nullptr);
     return false;

@@ -22,6 +22,7 @@ using testing::IsEmpty;
 bool opensWithoutHandle = false;
 bool refusesBusyTimeout = false;
 bool givesNoText = false;
+bool givesNoName = false;
 
 template <typename Function>
 Function Next(const char* name, Function /*type*/) {
@@ -48,6 +49,11 @@ extern "C" int sqlite3_busy_timeout(sqlite3* db, int milliseconds) {
 extern "C" const unsigned char* sqlite3_column_text(sqlite3_stmt* stmt, int column) {
   if (givesNoText) return nullptr;
   return Next("sqlite3_column_text", &sqlite3_column_text)(stmt, column);
+}
+
+extern "C" const char* sqlite3_column_name(sqlite3_stmt* stmt, int column) {
+  if (givesNoName) return nullptr;
+  return Next("sqlite3_column_name", &sqlite3_column_name)(stmt, column);
 }
 
 namespace {
@@ -427,6 +433,14 @@ TEST_F(SqliteDBTest, ANullTextIsAnEmptyOne) {
   const std::vector<std::string> rows = Rows(*db, "SELECT 'x' AS t, 1 AS n");
   givesNoText = false;
   EXPECT_THAT(rows, ElementsAre("n:1, t:''"));
+}
+
+TEST_F(SqliteDBTest, ANullNameIsOneThatThereIsNoMemoryFor) {
+  record.AddValue("old", 1);
+  givesNoName = true;
+  EXPECT_THROW(db->SelectByCommand("SELECT 1 AS n", record), std::bad_alloc);
+  givesNoName = false;
+  EXPECT_EQ(record.ToStr(), "old:1");
 }
 
 TEST_F(SqliteDBTest, StatementEndsAtAnEmbeddedNul) {
