@@ -322,6 +322,19 @@ TEST_F(CacheProcessTest, AWaiterLooksAgainEvery300To1000MsWhileTheLockIsTakenAnd
   }
 }
 
+TEST_F(CacheProcessTest, AWaiterSleepsFrom300To1000MsBetweenTwoLooks) {
+  WriteCacheFile("\"old\"", kStale);
+  WriteText(pidFile, std::to_string(getppid()));
+  int sleeps = 0;
+  TestClock::SkipSleeps([&] {
+    if (++sleeps == kManySleeps) WriteCacheFile("\"fresh\"");
+  });
+  EXPECT_EQ(MakeCache().Read(), "fresh");
+  ExpectManySleepsFrom(300, 1000);
+  ExpectLog({StartsWaiting(), FinishesWaiting()});
+  std::filesystem::remove(pidFile);
+}
+
 // --- The refresher
 
 TEST_F(CacheProcessTest, ARefresherUpdatesBehindTheCallersBack) {

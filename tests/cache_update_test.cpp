@@ -134,6 +134,15 @@ TEST_F(CacheUpdateTest, TriesToWriteTwoMoreTimesThanTheRetryLimit) {
   std::filesystem::remove_all(path);
 }
 
+TEST_F(CacheUpdateTest, SleepsFrom300To1000MsBetweenTwoWrites) {
+  BlockPath(path);
+  TestClock::SkipSleeps();
+  EXPECT_FALSE(MakeCache(true, kManySleeps - 1).UpdateWithData(1));
+  ExpectManySleepsFrom(300, 1000);
+  ExpectLog({WriteFailed(kManySleeps - 1)});
+  std::filesystem::remove_all(path);
+}
+
 TEST_F(CacheUpdateTest, AWriteSucceedsAtALaterTry) {
   BlockPath(path);
   TestClock::SkipSleeps([this] { std::filesystem::remove_all(path); });
@@ -186,6 +195,13 @@ TEST_F(CacheUpdateTest, FetchesTwoMoreTimesThanTheRetryLimit) {
     EXPECT_EQ(SleepsWithin(500, 1000), static_cast<size_t>(fetches - 1));
     ExpectLog({FetchFailed(retryLimit)});
   }
+}
+
+TEST_F(CacheUpdateTest, SleepsFrom500To1000MsBetweenTwoFetches) {
+  TestClock::SkipSleeps();
+  EXPECT_FALSE(MakeCache(true, kManySleeps - 1).DoUpdate());
+  ExpectManySleepsFrom(500, 1000);
+  ExpectLog({FetchFailed(kManySleeps - 1)});
 }
 
 TEST_F(CacheUpdateTest, SleepsForRealBetweenTwoFetches) {

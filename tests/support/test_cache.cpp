@@ -5,8 +5,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <ctime>
 #include <filesystem>
+#include <vector>
 
 #include "support/test_clock.h"
 
@@ -36,6 +38,16 @@ void CacheFixture::WriteCacheFile(const std::string& data, int age) const {
 void CacheFixture::SetMtime(time_t seconds) const {
   const timespec times[2] = {{seconds, 0}, {seconds, 0}};
   ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
+}
+
+void CacheFixture::ExpectManySleepsFrom(unsigned int low, unsigned int high) {
+  const std::vector<unsigned int> sleeps = TestClock::TakeSleeps();
+  ASSERT_EQ(sleeps.size(), size_t{kManySleeps});
+  const auto [shortest, longest] = std::minmax_element(sleeps.begin(), sleeps.end());
+  EXPECT_GE(*shortest, low * 1000);
+  EXPECT_LT(*shortest, (low + 8) * 1000);
+  EXPECT_GT(*longest, (high - 8) * 1000);
+  EXPECT_LE(*longest, high * 1000);
 }
 
 void CacheFixture::RunWithOwnTmp(const std::string& size, const std::function<void()>& body) {
