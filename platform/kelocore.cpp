@@ -90,13 +90,18 @@ bool ParseNumber(std::string_view text, uint64_t* number) {
   return error == std::errc() && rest == end;
 }
 
-// One write to a file that begins empty: a reader sees no pid or the whole file.
+// The first byte comes last and alone. Before it a reader finds no digit there and thus no pid,
+// however many writes the rest takes and wherever they break off.
 bool WritePidFile(int fd, const char* text) {
   const size_t length = strlen(text);
   if (fchmod(fd, 0644) != 0) return false;
-  const ssize_t written = Retry([&] { return write(fd, text, length); });
-  if (written >= 0 && static_cast<size_t>(written) < length) errno = ENOSPC;
-  return written == static_cast<ssize_t>(length);
+  for (size_t done = 1; done < length;) {
+    const ssize_t count =
+        Retry([&] { return pwrite(fd, text + done, length - done, static_cast<off_t>(done)); });
+    if (count <= 0) return false;
+    done += static_cast<size_t>(count);
+  }
+  return Retry([&] { return pwrite(fd, text, 1, 0); }) == 1;
 }
 
 }  // namespace
@@ -150,7 +155,7 @@ int KLIBCProcAlive(int pid) {
 
 // The old file is removed, not written to: whoever planted a link under the name gains nothing, and
 // no reader meets a mixture of old and new. No temporary stands beside it, so none can stay behind;
-// a writer killed half-way leaves no file or an empty one, both of which name nobody.
+// a writer killed half-way leaves no file or one without its first byte, both of which name nobody.
 int KLIBCProcPidFileCreate(const char* path) {
   ProcStat self;
   if (!ReadProcStat(getpid(), &self)) return -1;

@@ -135,6 +135,7 @@ TEST_F(CacheFaultTest, AReadGivesTheDocumentOrTheDefault) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 TEST_F(CacheFaultTest, AnUpdateIsMadeOrFails) {
@@ -156,6 +157,7 @@ TEST_F(CacheFaultTest, AnUpdateIsMadeOrFails) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 TEST_F(CacheFaultTest, AWriteIsMadeOrTold) {
@@ -168,6 +170,7 @@ TEST_F(CacheFaultTest, AWriteIsMadeOrTold) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 // The refresher holds the write end until it has ended.
@@ -196,6 +199,7 @@ TEST_F(CacheFaultTest, ARefreshInTheBackgroundLeavesTheOldOrTheNewDocument) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 TEST_F(CacheFaultTest, ARemovalAnswersWhatUnlinkDid) {

@@ -1,6 +1,8 @@
 // Holds the fault injector against what the library really calls.
 
 #include <dlfcn.h>
+#include <fcntl.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <set>
@@ -108,4 +110,43 @@ TEST_F(FaultCallsTest, CallsOfAForkedChildCountToo) {
   EXPECT_EQ(RunInChild([] { EXPECT_NE(access("/", F_OK), -1); }), 0);
   EXPECT_EQ(access("/", F_OK), -1);
   EXPECT_EQ(Fault::Disarm(), 1);
+}
+
+TEST_F(FaultCallsTest, AShortTransferMovesAByteOrAHalf) {
+  WriteText(Path("file"), "123456");
+  const int fd = open(Path("file").c_str(), O_RDWR | O_CLOEXEC);
+  char data[6];
+  Fault::Arm({Fault::kOneByte, 1, 1});
+  EXPECT_EQ(read(fd, data, sizeof data), 1);
+  EXPECT_EQ(read(fd, data, sizeof data), 5);
+  EXPECT_EQ(Fault::Disarm(), 1);
+  Fault::Arm({Fault::kHalf, 1, 2});
+  EXPECT_EQ(pwrite(fd, "abcdef", 6, 0), 3);
+  EXPECT_EQ(write(fd, "ghij", 4), 2);
+  EXPECT_EQ(Fault::Disarm(), 2);
+  close(fd);
+  EXPECT_EQ(ReadText(Path("file")), "abc456gh");
+}
+
+TEST_F(FaultCallsTest, AFullDiskTakesAHalfAndThenNothing) {
+  const int fd = open(Path("file").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
+  Fault::Arm({Fault::kDiskFull, 2, Fault::kForGood});
+  EXPECT_EQ(write(fd, "ab", 2), 2);
+  EXPECT_EQ(write(fd, "cdef", 4), 2);
+  EXPECT_EQ(write(fd, "ef", 2), -1);
+  EXPECT_EQ(errno, ENOSPC);
+  EXPECT_EQ(Fault::Disarm(), 2);
+  close(fd);
+  EXPECT_EQ(ReadText(Path("file")), "abcd");
+}
+
+// Their reports are a few bytes long, and those go as a whole.
+TEST_F(FaultCallsTest, APipeIsNeverShort) {
+  int ends[2];
+  ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
+  Fault::Arm({Fault::kOneByte, 1, 1});
+  EXPECT_EQ(write(ends[1], "1234", 4), 4);
+  EXPECT_EQ(Fault::Disarm(), 0);
+  close(ends[0]);
+  close(ends[1]);
 }

@@ -101,6 +101,7 @@ TEST_F(FileFaultTest, ReadGivesTheWholeDocumentOrLeavesTheValue) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 TEST_F(FileFaultTest, ReadOfADescriptorGivesTheWholeDocumentOrLeavesTheValue) {
@@ -193,6 +194,7 @@ TEST_F(FileFaultTest, KeysAndValuesComeWholeOrNotAtAll) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 TEST_F(FileFaultTest, ADirectoryIsCreatedOrItsFailureTold) {

@@ -92,16 +92,19 @@ TEST_F(JsonFaultTest, FromFileGivesTheWholeDocumentOrLeavesTheValue) {
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
 }
 
 TEST_F(JsonFaultTest, ToFileMakesANewFileWholeOrNotAtAll) {
   SweepCalls(ToFile(""));
   SweepMemory(ToFile(""));
+  SweepTransfers(ToFile(""));
 }
 
 TEST_F(JsonFaultTest, ToFileReplacesAFileWholeOrNotAtAll) {
   SweepCalls(ToFile(kOld));
   SweepMemory(ToFile(kOld));
+  SweepTransfers(ToFile(kOld));
 }
 
 TEST_F(JsonFaultTest, ToFileTakesALeftTemporaryAwayOrFails) {

@@ -143,6 +143,7 @@ void SqliteDBFaultTest::SweepWriting(const std::function<void()>& prepare,
   };
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
+  SweepTransfers({prepare, run, check});
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{"base"});
 }
 
@@ -164,6 +165,7 @@ void SqliteDBFaultTest::SweepReading(const std::function<bool(SqliteDB&)>& actio
   };
   SweepCalls({[] {}, run, check});
   SweepMemory({[] {}, run, check});
+  SweepTransfers({[] {}, run, check});
 }
 
 Rows ToRows(const std::vector<SqliteValueList>& records) {
@@ -259,6 +261,7 @@ TEST_F(SqliteDBFaultTest, AWideTextComesWholeOrNotAtAll) {
     }
   };
   SweepMemory({[] {}, run, check});
+  SweepTransfers({[] {}, run, check});
 }
 
 TEST_F(SqliteDBFaultTest, RecordsComeWholeOrNotAtAll) {

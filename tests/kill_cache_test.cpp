@@ -133,12 +133,12 @@ TEST_F(KilledUpdateTest, MayBeFollowedByAnotherKilledUpdate) {
 TEST_F(KilledUpdateTest, ReachesTheDiskBeforeItsName) {
   Prepare();
   const std::string temporary = ".c.cached.kelodr-0";
-  EXPECT_EQ(
-      Tracer::FileCalls(cacheDir, [this] { Refresh("new"); }),
-      (std::vector<std::string>{
-          "remove c.cached.pid", "create c.cached.pid", "mode c.cached.pid", "write c.cached.pid",
-          "create " + temporary, "write " + temporary, "mode " + temporary, "sync " + temporary,
-          "rename " + temporary + " c.cached", "sync .", "remove c.cached.pid"}));
+  EXPECT_EQ(Tracer::FileCalls(cacheDir, [this] { Refresh("new"); }),
+            (std::vector<std::string>{
+                "remove c.cached.pid", "create c.cached.pid", "mode c.cached.pid",
+                "write c.cached.pid", "write c.cached.pid", "create " + temporary,
+                "write " + temporary, "mode " + temporary, "sync " + temporary,
+                "rename " + temporary + " c.cached", "sync .", "remove c.cached.pid"}));
 }
 
 class KilledLockCycleTest : public KilledUpdateTest {

@@ -175,6 +175,11 @@ TEST_F(PidFileTest, ReadsZeroForASecondLineThatIsNoStartTime) {
   EXPECT_EQ(ReadOf(pid + "\n" + StartTime(getpid()) + "\nmore\n"), 0);
 }
 
+TEST_F(PidFileTest, ReadsZeroForAFileWhoseFirstByteIsNotWrittenYet) {
+  const std::string rest = std::to_string(getpid()) + "\n" + StartTime(getpid()) + "\n";
+  EXPECT_EQ(ReadOf(std::string(1, '\0') + rest), 0);
+}
+
 TEST_F(PidFileTest, ReadsZeroWithAStartTimeOnceTheProcessIsGone) {
   EXPECT_EQ(RunInChild([&] { EXPECT_EQ(KLIBCProcPidFileCreate(path.c_str()), 0); }), 0);
   EXPECT_NE(ReadText(path), "");
@@ -278,7 +283,7 @@ TEST_F(PidFileTest, LeavesNothingBehindWhenItIsCutShort) {
               signal(SIGXFSZ, SIG_IGN);
               LowerLimit(RLIMIT_FSIZE, 2);
               EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
-              EXPECT_EQ(errno, ENOSPC);
+              EXPECT_EQ(errno, EFBIG);
             }),
             0);
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});

@@ -38,6 +38,31 @@ State* NewState() {
 // A signal that never stops coming is no fault of the system's; this many in a row is bad enough.
 constexpr int kSignalsInARow = 10;
 
+// Not 0 for what sets errno.
+int ErrnoOf(int error) {
+  if (error == Fault::kNoMemory) return ENOMEM;
+  if (error == Fault::kDiskFull) return ENOSPC;
+  return error > 0 ? error : 0;
+}
+
+// A transfer of less than was asked for is no failure.
+bool IsFailure(int error) { return error != Fault::kOneByte && error != Fault::kHalf; }
+
+std::string NameOf(int error) {
+  switch (error) {
+    case Fault::kNoMemory:
+      return "fails: no memory";
+    case Fault::kOneByte:
+      return "moves one byte";
+    case Fault::kHalf:
+      return "moves a half";
+    case Fault::kDiskFull:
+      return "fills the disk";
+    default:
+      return std::string("fails: ") + strerror(error);
+  }
+}
+
 // True when an exception came out that is not to.
 bool RunCaught(const Fault::Operation& operation, bool mayThrowJsonError, Fault::Outcome& outcome) {
   try {
@@ -71,9 +96,11 @@ void Arm(const Plan& plan) {
   state->armed = true;
 }
 
+int Failures() { return state->failures; }
+
 int Disarm() {
   state->armed = false;
-  return state->failures;
+  return Failures();
 }
 
 std::vector<std::string> FailedCalls() {
@@ -96,7 +123,7 @@ bool Hits(const char* call, std::initializer_list<int> errors) {
   size_t known = 0;
   while (state->failed[known] != nullptr && state->failed[known] != call) ++known;
   state->failed.at(known) = call;
-  errno = plan.error == kNoMemory ? ENOMEM : plan.error;
+  if (ErrnoOf(plan.error) != 0) errno = ErrnoOf(plan.error);
   return true;
 }
 
@@ -120,7 +147,8 @@ void FaultTest::SetUp() {
 
 void FaultTest::TearDown() {
   close(bystander);
-  std::cout << "[  faults  ] " << runs << " runs, " << failures << " failed calls\n";
+  std::cout << "[  faults  ] " << runs << " runs, " << failures << " failed calls, "
+            << shortTransfers << " short transfers\n";
   CleanTest::TearDown();
 }
 
@@ -134,6 +162,26 @@ void FaultTest::SweepCalls(const Fault::Operation& operation) {
 void FaultTest::SweepMemory(const Fault::Operation& operation) {
   Sweep(operation, Fault::kNoMemory, Fault::kOnce);
   Sweep(operation, Fault::kNoMemory, forGood);
+}
+
+void FaultTest::SweepTransfers(const Fault::Operation& operation) {
+  operation.prepare();
+  LogCapture::Clear();
+  operation.run();
+  undisturbedLog = LogCapture::Take();
+  const int before = shortTransfers;
+  for (const int portion : {Fault::kOneByte, Fault::kHalf}) {
+    Sweep(operation, portion, Fault::kOnce);
+    Sweep(operation, portion, Fault::kForGood);
+  }
+  EXPECT_GT(shortTransfers, before) << "nothing was moved";
+  Sweep(operation, Fault::kDiskFull, forGood);
+}
+
+void FaultTest::ExpectUndisturbed(const Fault::Outcome& outcome) const {
+  EXPECT_TRUE(outcome.succeeded);
+  EXPECT_FALSE(outcome.threw);
+  EXPECT_EQ(outcome.log, undisturbedLog);
 }
 
 void FaultTest::Sweep(const Fault::Operation& operation, int error, int times) {
@@ -156,17 +204,21 @@ bool FaultTest::RunFailing(const Fault::Operation& operation, const Fault::Plan&
   outcome.failures = Fault::Disarm();
   outcome.failed = Fault::FailedCalls();
   outcome.log = LogCapture::Take();
-  const std::string error = plan.error == Fault::kNoMemory ? "no memory" : strerror(plan.error);
-  SCOPED_TRACE("call " + std::to_string(plan.first) + " fails: " + error + ", " +
+  SCOPED_TRACE("call " + std::to_string(plan.first) + " " + NameOf(plan.error) + ", " +
                std::to_string(outcome.failures) +
-               " failures: " + testing::PrintToString(outcome.failed));
+               " times: " + testing::PrintToString(outcome.failed));
   ExpectNothingLeft(descriptors, uid, gid);
   EXPECT_EQ(lseek(bystander, 0, SEEK_END), 0) << "written to a file of the caller's";
   EXPECT_FALSE(threwWrongly) << "an exception came out";
+  const int hits = outcome.failures;
+  if (!IsFailure(plan.error)) {
+    outcome = {outcome.succeeded, outcome.threw, 0, 0, {}, outcome.log};
+    ExpectUndisturbed(outcome);
+  }
   operation.check(outcome);
   ++runs;
-  failures += outcome.failures;
-  return outcome.failures > 0;
+  (IsFailure(plan.error) ? failures : shortTransfers) += hits;
+  return hits > 0;
 }
 
 void FaultTest::RunUnfailed(const Fault::Operation& operation) {

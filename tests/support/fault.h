@@ -7,6 +7,8 @@
 #ifndef KELODRCORE_TESTS_SUPPORT_FAULT_H_
 #define KELODRCORE_TESTS_SUPPORT_FAULT_H_
 
+#include <dlfcn.h>
+
 #include <climits>
 #include <functional>
 #include <initializer_list>
@@ -19,6 +21,14 @@ namespace Fault {
 
 // Stands in place of an errno: what fails is memory that operator new, malloc or SQLite asks for.
 constexpr int kNoMemory = -1;
+
+// Stand in its place too: a call that moves data to or from a file moves one byte, or a half of
+// what it is asked to. That is no failure.
+constexpr int kOneByte = -2;
+constexpr int kHalf = -3;
+
+// The disk becomes full: the first write of the plan writes a half, the others fail with ENOSPC.
+constexpr int kDiskFull = -4;
 
 constexpr int kOnce = 1;
 constexpr int kForGood = INT_MAX;
@@ -33,7 +43,8 @@ struct Plan {
 // The calls of children forked later count too, until Disarm().
 void Arm(const Plan& plan);
 
-// The number of calls that failed.
+// The number of calls that failed, so far and when the plan ends.
+int Failures();
 int Disarm();
 
 // The names of the calls that failed since Arm(), each once, in the order of the first failures.
@@ -43,6 +54,12 @@ std::vector<std::string> FailedCalls();
 bool Hits(const char* call, std::initializer_list<int> errors);
 
 bool IsSuspended();
+
+// The definition of a call that stands behind this program's own.
+template <typename Function>
+Function* Next(const char* call) {
+  return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, call));
+}
 
 // Calls made while it lives neither count nor fail.
 class Suspension {
@@ -85,6 +102,9 @@ class FaultTest : public CleanTest {
 
   void SweepCalls(const Fault::Operation& operation);
   void SweepMemory(const Fault::Operation& operation);
+  // Moves less than asked, which is to change nothing: result, log and effect. Fills the disk as
+  // well.
+  void SweepTransfers(const Fault::Operation& operation);
 
   // Whether JsonCpp's own exception may come out where it finds no memory.
   bool mayThrowJsonError = false;
@@ -96,11 +116,14 @@ class FaultTest : public CleanTest {
   void Sweep(const Fault::Operation& operation, int error, int times);
   bool RunFailing(const Fault::Operation& operation, const Fault::Plan& plan);
   void RunUnfailed(const Fault::Operation& operation);
+  void ExpectUndisturbed(const Fault::Outcome& outcome) const;
 
   // An empty file that the test's process happens to have open; nobody may write to it.
   int bystander = -1;
+  std::vector<LogLine> undisturbedLog;
   int runs = 0;
   int failures = 0;
+  int shortTransfers = 0;
 };
 
 #endif  // KELODRCORE_TESTS_SUPPORT_FAULT_H_

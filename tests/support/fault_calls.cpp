@@ -3,12 +3,12 @@
 // A call is listed with the errors that its manual page gives, as far as sweeps ask for them, and
 // EINTR wherever a file system of user space or of the network may answer so. What a call has done
 // when it fails is what it really has done: close has closed, a failed stream remembers its error.
+// Those that move data are in fault_transfers.cpp.
 
 // Both the old and the 64-bit names are defined here.
 #undef _FILE_OFFSET_BITS
 #undef _TIME_BITS
 
-#include <dlfcn.h>
 #include <sqlite3.h>
 #include <sys/types.h>
 
@@ -24,13 +24,9 @@
 using Fault::Hits;
 using Fault::Intercepts;
 using Fault::kNoMemory;
+using Fault::Next;
 
 namespace {
-
-template <typename Function>
-Function* Next(const char* name) {
-  return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, name));
-}
 
 int FailStream(FILE* stream) {
   stream->_flags |= _IO_ERR_SEEN;
@@ -97,13 +93,6 @@ FAULT_FCNTL(__fcntl_time64)
 FAULT_CALL(long long, __time64, -1, (long long* out), (out), EIO)
 #endif
 
-FAULT_CALL(ssize_t, read, -1, (int fd, void* data, size_t size), (fd, data, size), EINTR, EIO)
-FAULT_CALL(ssize_t, write, -1, (int fd, const void* data, size_t size), (fd, data, size), EINTR,
-           EIO, ENOSPC)
-FAULT_CALL(ssize_t, pread64, -1, (int fd, void* data, size_t size, off64_t offset),
-           (fd, data, size, offset), EINTR, EIO)
-FAULT_CALL(ssize_t, pwrite64, -1, (int fd, const void* data, size_t size, off64_t offset),
-           (fd, data, size, offset), EINTR, EIO, ENOSPC)
 FAULT_CALL(int, ftruncate64, -1, (int fd, off64_t size), (fd, size), EINTR, EIO)
 FAULT_CALL(void*, mmap64, reinterpret_cast<void*>(-1),
            (void* at, size_t size, int access, int flags, int fd, off64_t offset),
