@@ -1,4 +1,5 @@
-// SQLite's own calls and memory fail as well as the library's.
+// SQLite's own calls and memory fail as well as the library's: those of the C library, and those of
+// SQLite's interface to the system.
 
 #include <sqlite3.h>
 #include <unistd.h>
@@ -6,7 +7,9 @@
 #include <algorithm>
 #include <functional>
 
+#include "kelodrcore/err.h"
 #include "kelodrcore/sqlite_db.h"
+#include "support/failing_vfs.h"
 #include "support/fault.h"
 
 using Fault::Outcome;
@@ -21,6 +24,9 @@ using KeloDRCore::UpdateCommand;
 namespace {
 
 constexpr unsigned int kRetries = 1;
+
+// How often SQLite asks for a lock within the busy time-out of a second.
+constexpr int kLocksOfOneAttempt = 20;
 
 sqlite3_mem_methods sqliteMemory;
 
@@ -43,7 +49,7 @@ const bool isConfigured = [] {
   failing.xMalloc = SqliteMalloc;
   failing.xRealloc = SqliteRealloc;
   return sqlite3_config(SQLITE_CONFIG_MALLOC, &failing) == SQLITE_OK &&
-         sqlite3_initialize() == SQLITE_OK;
+         FailingVfs::Register() == SQLITE_OK;
 }();
 
 using Rows = std::vector<std::string>;
@@ -63,6 +69,10 @@ class SqliteDBFaultTest : public FaultTest {
   // The file with kBefore in its table.
   void MakeFile() const;
 
+  // The same file as a writer leaves it that is killed in the middle: changed, and its old pages in
+  // the journal. Made once.
+  void MakeUnfinishedFile();
+
   // Runs `action` with an object of its own; what `action` answers must agree with its error.
   bool With(const std::function<bool(SqliteDB&)>& action);
 
@@ -75,12 +85,23 @@ class SqliteDBFaultTest : public FaultTest {
   // Sweeps one that gives `rows` into `found`, which it begins by emptying.
   void SweepReading(const std::function<bool(SqliteDB&)>& action, const Rows& rows);
 
+  // Sweeps the calls of SQLite's interface to the system.
+  void SweepFileCalls(const Fault::Operation& operation);
+  // A lock that another has is waited for: in one attempt, or in two.
+  void SweepBusyLocks(const Fault::Operation& operation);
+  void SweepAll(const Fault::Operation& operation);
+
+  void CheckError(const Outcome& outcome) const;
   bool TookAsMissing(const Outcome& outcome) const;
 
   bool missingIsNotTold = false;
+  bool isUnfinished = false;  // a journal that seems to end early has nothing more to give back
+  Json::Value error;          // of the last operation, null when it succeeded or threw
   std::string path;
   sqlite3_int64 memoryBefore = 0;
   Rows found;
+  std::string unfinishedFile;
+  std::string unfinishedJournal;
   const SqliteTableHandler table{"t", "n INTEGER PRIMARY KEY, s TEXT"};
 };
 
@@ -96,9 +117,30 @@ void SqliteDBFaultTest::MakeFile() const {
               "INSERT INTO t VALUES (2, 'two')"));
 }
 
+void SqliteDBFaultTest::MakeUnfinishedFile() {
+  const std::string journal = path + "-journal";
+  if (unfinishedFile.empty()) {
+    MakeFile();
+    sqlite3* db = nullptr;
+    ASSERT_EQ(sqlite3_open(path.c_str(), &db), SQLITE_OK);
+    ASSERT_EQ(sqlite3_exec(db, "BEGIN; UPDATE t SET s = 'torn'", nullptr, nullptr, nullptr), 0);
+    ASSERT_EQ(sqlite3_db_cacheflush(db), SQLITE_OK);
+    unfinishedFile = ReadText(path);
+    unfinishedJournal = ReadText(journal);
+    sqlite3_close(db);
+  }
+  RemoveFile();
+  WriteText(path, unfinishedFile);
+  WriteText(journal, unfinishedJournal);
+}
+
 bool SqliteDBFaultTest::With(const std::function<bool(SqliteDB&)>& action) {
+  error = Json::Value();
   SqliteDB db(path, kRetries, "label");
-  return action(db);
+  const bool isDone = action(db);
+  const Fault::Suspension suspension;
+  if (!isDone) error = db.GetErr();
+  return isDone;
 }
 
 int AddRow(void* rows, int /*columns*/, char** values, char** /*names*/) {
@@ -128,6 +170,55 @@ bool SqliteDBFaultTest::TookAsMissing(const Outcome& outcome) const {
   return missingIsNotTold && statFailed && outcome.log.empty();
 }
 
+// What SQLite said is classified: busy and locked apart from the rest.
+void SqliteDBFaultTest::CheckError(const Outcome& outcome) const {
+  const Json::Value& details = error["err_msg"];
+  if (!details.isObject()) return;
+  const bool isBusy = details["sqlite_errcode"] == SQLITE_BUSY;
+  EXPECT_EQ(error["err_code"],
+            isBusy ? KeloDRCore::ERR::ERR_DATABASE_LOCK : KeloDRCore::ERR::ERR_DATABASE_OPERATION);
+  EXPECT_NE(details["sqlite_errmsg"], "");
+  if (outcome.error == FailingVfs::kFull) {
+    EXPECT_EQ(details["sqlite_errcode"], SQLITE_FULL);
+  }
+}
+
+void SqliteDBFaultTest::SweepBusyLocks(const Fault::Operation& operation) {
+  const auto checkDone = [&](const Outcome& outcome) {
+    operation.check(outcome);
+    EXPECT_TRUE(outcome.succeeded);
+  };
+  const auto checkTold = [&](const Outcome& outcome) {
+    operation.check(outcome);
+    EXPECT_EQ(outcome.succeeded, outcome.failures == 0);
+    EXPECT_EQ(outcome.succeeded, error.isNull());
+    if (outcome.succeeded) return;
+    EXPECT_EQ(error["err_code"], KeloDRCore::ERR::ERR_DATABASE_LOCK);
+    EXPECT_TRUE(std::any_of(outcome.log.begin(), outcome.log.end(), [](const LogLine& line) {
+      return line.message.find("Reach retry limit [2], failed to ") == 0;
+    }));
+  };
+  Sweep({operation.prepare, operation.run, checkDone}, FailingVfs::kBusy, Fault::kOnce);
+  Sweep({operation.prepare, operation.run, checkDone}, FailingVfs::kBusy, kLocksOfOneAttempt);
+  Sweep({operation.prepare, operation.run, checkTold}, FailingVfs::kBusy, Fault::kForGood);
+}
+
+void SqliteDBFaultTest::SweepFileCalls(const Fault::Operation& operation) {
+  for (const int failure : {FailingVfs::kError, FailingVfs::kFull, FailingVfs::kShortRead}) {
+    if (failure == FailingVfs::kShortRead && isUnfinished) continue;
+    Sweep(operation, failure, Fault::kOnce);
+    Sweep(operation, failure, Fault::kForGood);
+  }
+  SweepBusyLocks(operation);
+}
+
+void SqliteDBFaultTest::SweepAll(const Fault::Operation& operation) {
+  SweepCalls(operation);
+  SweepMemory(operation);
+  SweepTransfers(operation);
+  SweepFileCalls(operation);
+}
+
 void SqliteDBFaultTest::SweepWriting(const std::function<void()>& prepare,
                                      const std::function<bool(SqliteDB&)>& action,
                                      const Rows& after) {
@@ -136,14 +227,13 @@ void SqliteDBFaultTest::SweepWriting(const std::function<void()>& prepare,
   const auto run = [&] { return With(action); };
   const auto check = [&](const Outcome& outcome) {
     EXPECT_EQ(sqlite3_memory_used(), memoryBefore);
+    CheckError(outcome);
     const Rows rows = Read();
     const bool mayBeUndone = !outcome.succeeded || TookAsMissing(outcome);
     EXPECT_TRUE(rows == after || (mayBeUndone && rows == before)) << testing::PrintToString(rows);
     EXPECT_TRUE(outcome.succeeded || outcome.threw || !outcome.log.empty());
   };
-  SweepCalls({prepare, run, check});
-  SweepMemory({prepare, run, check});
-  SweepTransfers({prepare, run, check});
+  SweepAll({prepare, run, check});
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{"base"});
 }
 
@@ -156,6 +246,7 @@ void SqliteDBFaultTest::SweepReading(const std::function<bool(SqliteDB&)>& actio
   };
   const auto check = [&](const Outcome& outcome) {
     EXPECT_EQ(sqlite3_memory_used(), memoryBefore);
+    CheckError(outcome);
     if (outcome.succeeded) {
       EXPECT_EQ(found, rows);
     } else {
@@ -163,9 +254,7 @@ void SqliteDBFaultTest::SweepReading(const std::function<bool(SqliteDB&)>& actio
     }
     EXPECT_EQ(Read(), kBefore);
   };
-  SweepCalls({[] {}, run, check});
-  SweepMemory({[] {}, run, check});
-  SweepTransfers({[] {}, run, check});
+  SweepAll({[] {}, run, check});
 }
 
 Rows ToRows(const std::vector<SqliteValueList>& records) {
@@ -179,6 +268,14 @@ Rows ToRows(const std::vector<SqliteValueList>& records) {
 TEST_F(SqliteDBFaultTest, AStatementIsDoneWholeOrNotAtAll) {
   const auto action = [](SqliteDB& db) { return db.Exec("REPLACE INTO t VALUES (3, 'three')"); };
   SweepWriting([this] { MakeFile(); }, action, {"1 one", "2 two", "3 three"});
+}
+
+TEST_F(SqliteDBFaultTest, AnUnfinishedWriteIsUndoneWholeBeforeTheNext) {
+  isUnfinished = true;
+  MakeUnfinishedFile();
+  ASSERT_NE(unfinishedFile.find("torn"), std::string::npos);
+  const auto action = [](SqliteDB& db) { return db.Exec("REPLACE INTO t VALUES (3, 'three')"); };
+  SweepWriting([this] { MakeUnfinishedFile(); }, action, {"1 one", "2 two", "3 three"});
 }
 
 TEST_F(SqliteDBFaultTest, AnInsertMakesFileTableAndRowOrFails) {

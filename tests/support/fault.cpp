@@ -59,7 +59,7 @@ std::string NameOf(int error) {
     case Fault::kDiskFull:
       return "fills the disk";
     default:
-      return std::string("fails: ") + strerror(error);
+      return "fails: " + (error > 0 ? strerror(error) : "error " + std::to_string(error));
   }
 }
 

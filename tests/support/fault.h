@@ -105,6 +105,8 @@ class FaultTest : public CleanTest {
   // Moves less than asked, which is to change nothing: result, log and effect. Fills the disk as
   // well.
   void SweepTransfers(const Fault::Operation& operation);
+  // One error, `times` calls in a row.
+  void Sweep(const Fault::Operation& operation, int error, int times);
 
   // Whether JsonCpp's own exception may come out where it finds no memory.
   bool mayThrowJsonError = false;
@@ -113,7 +115,6 @@ class FaultTest : public CleanTest {
   int forGood = Fault::kForGood;
 
  private:
-  void Sweep(const Fault::Operation& operation, int error, int times);
   bool RunFailing(const Fault::Operation& operation, const Fault::Plan& plan);
   void RunUnfailed(const Fault::Operation& operation);
   void ExpectUndisturbed(const Fault::Outcome& outcome) const;

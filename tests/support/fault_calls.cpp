@@ -9,6 +9,7 @@
 #undef _FILE_OFFSET_BITS
 #undef _TIME_BITS
 
+#include <fcntl.h>
 #include <sqlite3.h>
 #include <sys/types.h>
 
@@ -31,6 +32,12 @@ namespace {
 int FailStream(FILE* stream) {
   stream->_flags |= _IO_ERR_SEEN;
   return EOF;
+}
+
+// What is given back is not held by anybody else.
+bool Unlocks(int command, long argument) {
+  if (command != F_SETLK && command != F_SETLK64) return false;
+  return reinterpret_cast<const struct flock*>(argument)->l_type == F_UNLCK;
 }
 
 }  // namespace
@@ -63,9 +70,13 @@ int FailStream(FILE* stream) {
 #define FAULT_FSTATAT(name)                                                       \
   FAULT_CALL(int, name, -1, (int dir, const char* path, void* status, int flags), \
              (dir, path, status, flags), EINTR, EIO, EACCES, ENOMEM)
-#define FAULT_FCNTL(name)                                                                         \
-  FAULT_CALL(int, name, -1, (int fd, int command, long argument), (fd, command, argument), EINTR, \
-             EIO, EMFILE, EACCES, EAGAIN)
+#define FAULT_FCNTL(name)                                                         \
+  extern "C" int Fault_##name(int fd, int command, long argument) __asm__(#name); \
+  extern "C" int Fault_##name(int fd, int command, long argument) {               \
+    if (Intercepts(#name) || Hits(#name, {EINTR, EIO, EMFILE})) return -1;        \
+    if (!Unlocks(command, argument) && Hits(#name, {EACCES, EAGAIN})) return -1;  \
+    return Next<int(int, int, long)>(#name)(fd, command, argument);               \
+  }
 
 FAULT_OPEN(open)
 FAULT_OPEN(open64)
