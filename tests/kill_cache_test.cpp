@@ -90,6 +90,15 @@ class KilledUpdateTest : public CacheFixture {
                            ExpectNextUpdateSucceeds(moment);
                          });
   }
+
+  int SweepRefreshes(const Sample& sample, const Succession& refreshes) {
+    return SweepPairs(
+        sample, [this] { Prepare(); }, refreshes,
+        [this](const Moment& second) {
+          ExpectWhole({"old", "new", "newer"}, second);
+          ExpectNextUpdateSucceeds(second);
+        });
+  }
 };
 
 TEST_F(KilledUpdateTest, LeavesTheOldDocumentOrTheNewOneAndNoLockHeld) {
@@ -120,14 +129,17 @@ TEST_F(KilledUpdateTest, MayBeADetachedOneOrItsCaller) {
 }
 
 TEST_F(KilledUpdateTest, MayBeFollowedByAnotherKilledUpdate) {
-  const int kills = SweepPairs(
-      {7, 5}, [this] { Prepare(); }, [this] { Refresh("new"); }, [this] { Refresh("newer"); },
-      [this](const Moment& second) {
-        ExpectWhole({"old", "new", "newer"}, second);
-        ExpectNextUpdateSucceeds(second);
-      });
-  EXPECT_GT(kills, 50);
-  RecordProperty("kills", kills);
+  const int pairs =
+      SweepRefreshes({7, 5}, {[this] { Refresh("new"); }, [this] { Refresh("newer"); }});
+  EXPECT_GT(pairs, 50);
+  RecordProperty("kills", pairs);
+}
+
+TEST_F(KilledUpdateTest, MayBeADetachedOneAfterAnother) {
+  const int pairs = SweepRefreshes(
+      {11, 9}, {[this] { Refresh("new", false); }, [this] { Refresh("newer", false); }, 3});
+  EXPECT_GT(pairs, 50);
+  RecordProperty("kills", pairs);
 }
 
 TEST_F(KilledUpdateTest, ReachesTheDiskBeforeItsName) {
@@ -152,6 +164,12 @@ class KilledLockCycleTest : public KilledUpdateTest {
     return Sum(Tracer::Sweep(
         prepare, [this] { Cycle(); }, [this](const Moment&) { ExpectFree(lockName); }));
   }
+
+  int SweepCycles(const Sample& sample, const std::function<void()>& prepare, int processes) {
+    const auto cycle = [this] { Cycle(); };
+    return SweepPairs(sample, prepare, {cycle, cycle, processes},
+                      [this](const Moment&) { ExpectFree(lockName); });
+  }
 };
 
 TEST_F(KilledLockCycleTest, LeavesTheLockFree) {
@@ -165,6 +183,21 @@ TEST_F(KilledLockCycleTest, LeavesTheLockFreeWhenItMakesTheDirectory) {
   const int kills = Sweep([this] { RemoveLockDir(); });
   EXPECT_GT(kills, 60);
   RecordProperty("kills", kills);
+}
+
+TEST_F(KilledLockCycleTest, MayBeFollowedByAnotherKilledCycle) {
+  Cycle();
+  const int pairs = SweepCycles(
+      {3, 2}, [] {}, 1);
+  EXPECT_GT(pairs, 10);
+  RecordProperty("kills", pairs);
+}
+
+TEST_F(KilledLockCycleTest, MayBeFollowedByAnotherKilledCycleThatMakesTheDirectory) {
+  const int pairs = SweepCycles(
+      {17, 13}, [this] { RemoveLockDir(); }, 3);
+  EXPECT_GT(pairs, 50);
+  RecordProperty("kills", pairs);
 }
 
 }  // namespace

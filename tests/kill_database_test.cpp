@@ -123,8 +123,8 @@ TEST_P(KilledInsertTest, LeavesTheRowOrNotAndTheDatabaseSound) {
 // back.
 TEST_P(KilledInsertTest, MayBeFollowedByAnotherKilledInsert) {
   const int kills = SweepPairs(
-      {7, 5}, [this] { Prepare(); }, [this] { InsertAndAcknowledge(2); },
-      [this] { InsertAndAcknowledge(3); },
+      {7, 5}, [this] { Prepare(); },
+      {[this] { InsertAndAcknowledge(2); }, [this] { InsertAndAcknowledge(3); }},
       [this](const Moment& second) { ExpectNextInsertSucceeds(second); });
   EXPECT_GT(kills, 30);
   RecordProperty("kills", kills);

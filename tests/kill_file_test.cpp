@@ -100,8 +100,8 @@ TEST_P(KilledWriterTest, LeavesAWholeDocumentAndOneTemporaryAtMost) {
 
 TEST_P(KilledWriterTest, MayBeFollowedByAnotherKilledWriter) {
   const int kills = SweepPairs(
-      {1, 1}, [this] { Prepare(); }, [this] { toFile("new", Written()); },
-      [this] { toFile("newer", Written()); },
+      {1, 1}, [this] { Prepare(); },
+      {[this] { toFile("new", Written()); }, [this] { toFile("newer", Written()); }},
       [this](const Moment& second) {
         ExpectOneOf({"old", "new", "newer"}, second);
         HasLeftover(second);

@@ -26,19 +26,26 @@ Sample StepsOf(const Sample& sample) {
 }  // namespace
 
 int SweepPairs(const Sample& sample, const std::function<void()>& prepare,
-               const std::function<void()>& first, const std::function<void()>& second,
-               const std::function<void(const Moment&)>& check) {
+               const Succession& operations, const std::function<void(const Moment&)>& check) {
   const Sample step = StepsOf(sample);
   int pairs = 0;
-  bool killedFirst = true;
-  for (Moment one; killedFirst && !testing::Test::HasFailure(); one.call += step.first) {
-    bool killedSecond = true;
-    for (Moment two{0, one.call % step.second}; killedSecond; two.call += step.second) {
-      prepare();
-      killedFirst = Tracer::KilledAt(one, first);
-      killedSecond = Tracer::KilledAt(two, second);
-      check(two);
-      pairs += killedFirst && killedSecond;
+  bool killedFirst = false;
+  // Whether the second operation was killed.
+  const auto killBoth = [&](const Moment& one, const Moment& two) {
+    prepare();
+    killedFirst = Tracer::KilledAt(one, operations.first);
+    const bool killedSecond = Tracer::KilledAt(two, operations.second);
+    check(two);
+    pairs += killedFirst && killedSecond;
+    return killedSecond;
+  };
+  for (Moment one; one.process < operations.processes; one = {one.process + 1, 0}) {
+    killedFirst = true;
+    for (; killedFirst && !testing::Test::HasFailure(); one.call += step.first) {
+      for (int process = 0; process < operations.processes; ++process) {
+        Moment two{process, one.call % step.second};
+        while (killBoth(one, two)) two.call += step.second;
+      }
     }
   }
   return pairs;

@@ -15,13 +15,20 @@ struct Sample {
   int second;
 };
 
-// Kills `first` and then `second` at pairs of their instants and runs `check` after each pair;
-// `prepare` runs before it. The second one's instants start elsewhere for each of the first one's,
-// so that neighbours differ. With KELODR_EVERY_PAIR in the environment every pair is taken, in
-// builds whose processes fork slowly fewer than the sample. Returns how many pairs there were. Only
-// process 0 of either is killed.
+// Two operations, one after the other, and how many processes each of them consists of.
+struct Succession {
+  std::function<void()> first;
+  std::function<void()> second;
+  int processes = 1;
+};
+
+// Kills one process of the first operation and then one of the second at pairs of their instants
+// and runs `check` after each pair; `prepare` runs before it. The second one's instants start
+// elsewhere for each of the first one's, so that neighbours differ. With KELODR_EVERY_PAIR in the
+// environment every pair is taken, in builds whose processes fork slowly fewer than the sample.
+// Returns how many pairs there were.
 int SweepPairs(const Sample& sample, const std::function<void()>& prepare,
-               const std::function<void()>& first, const std::function<void()>& second,
+               const Succession& operations,
                const std::function<void(const Tracer::Moment&)>& check);
 
 // Runs `action` and expects it to be done at once: well below the shortest time that the library
