@@ -204,9 +204,9 @@ bool SqliteDB::DoExecSqliteCommand(const std::string& sql) {
   return code == SQLITE_OK;
 }
 
-// Hands each row to `takeRow` until that answers false or no row is left.
+// One attempt: hands each row to `takeRow` until that answers false or no row is left.
 template <typename TakeRow>
-bool SqliteDB::Select(const std::string& sql, const TakeRow& takeRow) {
+bool SqliteDB::TrySelect(const std::string& sql, const TakeRow& takeRow) {
   SetErr(ERR::ERR_DATABASE_OPERATION);
   int code = SQLITE_OK;
   const Statement stmt = Prepare(dbHandle, sql, code);
@@ -220,8 +220,9 @@ bool SqliteDB::Select(const std::string& sql, const TakeRow& takeRow) {
   return true;
 }
 
-bool SqliteDB::SelectFirst(const std::string& sql, SqliteValueList& record, const char* function) {
-  return Select(sql, [&](sqlite3_stmt* stmt) {
+bool SqliteDB::TrySelectFirst(const std::string& sql, SqliteValueList& record,
+                              const char* function) {
+  return TrySelect(sql, [&](sqlite3_stmt* stmt) {
     SqliteValueList row;
     RowReader(stmt, function).Read(row);
     record = std::move(row);
@@ -229,10 +230,10 @@ bool SqliteDB::SelectFirst(const std::string& sql, SqliteValueList& record, cons
   });
 }
 
-bool SqliteDB::SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
-                         const char* function) {
+bool SqliteDB::TrySelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
+                            const char* function) {
   std::optional<RowReader> reader;
-  return Select(sql, [&](sqlite3_stmt* stmt) {
+  return TrySelect(sql, [&](sqlite3_stmt* stmt) {
     if (!reader) reader.emplace(stmt, function);
     records.emplace_back();
     try {
@@ -246,12 +247,12 @@ bool SqliteDB::SelectAll(const std::string& sql, std::vector<SqliteValueList>& r
 }
 
 bool SqliteDB::DoSelectSqliteRecord(const std::string& sql, SqliteValueList& record) {
-  return SelectFirst(sql, record, __func__);
+  return TrySelectFirst(sql, record, __func__);
 }
 
 bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
                                      std::vector<SqliteValueList>& records) {
-  return SelectAll(sql, records, __func__);
+  return TrySelectAll(sql, records, __func__);
 }
 
 // Makes attempts until one succeeds, one fails otherwise than by a lock, or the limit is reached.
@@ -313,7 +314,7 @@ bool SqliteDB::OpenForQuery(const std::string& sql, const char* emptyMessage) {
 bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) {
   if (!OpenForQuery(sql, "Empty command to select record")) return false;
   unsigned int retries = 0;
-  if (!RetryWhileLocked([&] { return SelectFirst(sql, record, "SelectByCommand"); }, retries)) {
+  if (!RetryWhileLocked([&] { return TrySelectFirst(sql, record, "SelectByCommand"); }, retries)) {
     KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to select command[%s] with err [%s]",
                retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
     return false;
@@ -322,7 +323,7 @@ bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) 
   return true;
 }
 
-// Selects many rows with `attempt`, in the name of SelectByCommand.
+// All attempts of a query for many rows, in the name of SelectByCommand.
 template <typename Attempt>
 bool SqliteDB::SelectRows(const std::string& sql, const Attempt& attempt) {
   const char* const function = "SelectByCommand";
@@ -339,7 +340,7 @@ bool SqliteDB::SelectRows(const std::string& sql, const Attempt& attempt) {
 }
 
 bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records) {
-  return SelectRows(sql, [&] { return SelectAll(sql, records, "SelectByCommand"); });
+  return SelectRows(sql, [&] { return TrySelectAll(sql, records, "SelectByCommand"); });
 }
 
 bool SqliteDB::IsTableExisted(const std::string& tableName) {
@@ -349,7 +350,7 @@ bool SqliteDB::IsTableExisted(const std::string& tableName) {
   sql += "';";
   bool isFound = false;
   const auto takeRow = [&isFound](sqlite3_stmt* /*stmt*/) { return isFound = true; };
-  SelectRows(sql, [&] { return Select(sql, takeRow); });
+  SelectRows(sql, [&] { return TrySelect(sql, takeRow); });
   return isFound;
 }
 

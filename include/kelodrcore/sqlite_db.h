@@ -166,14 +166,14 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// @}
 
  private:
-  KELODR_LOCAL void SetErr(int code) const;
+  KELODR_LOCAL void SetErr(int code) const;  // a code without details
 
   template <typename TakeRow>
-  KELODR_LOCAL bool Select(const std::string& sql, const TakeRow& takeRow);
-  KELODR_LOCAL bool SelectFirst(const std::string& sql, SqliteValueList& record,
-                                const char* function);
-  KELODR_LOCAL bool SelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
-                              const char* function);
+  KELODR_LOCAL bool TrySelect(const std::string& sql, const TakeRow& takeRow);
+  KELODR_LOCAL bool TrySelectFirst(const std::string& sql, SqliteValueList& record,
+                                   const char* function);
+  KELODR_LOCAL bool TrySelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
+                                 const char* function);
 
   template <typename Attempt>
   KELODR_LOCAL bool RetryWhileLocked(const Attempt& attempt, unsigned int& retries);
@@ -181,7 +181,6 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   KELODR_LOCAL bool OpenForQuery(const std::string& sql, const char* emptyMessage);
   template <typename Attempt>
   KELODR_LOCAL bool SelectRows(const std::string& sql, const Attempt& attempt);
-
   template <typename Rows>
   KELODR_LOCAL bool SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function);
 
