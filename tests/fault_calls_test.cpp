@@ -88,6 +88,16 @@ TEST_F(FaultCallsTest, EveryCallThatTheLibraryMakesCanBeFailed) {
   }
 }
 
+// So that its memory can fail under a sanitizer too, which has the other calls to itself.
+TEST_F(FaultCallsTest, TheLibrarysOwnMemoryComesFromOperatorNew) {
+  const std::set<std::string> imports = ImportsOfTheLibrary();
+  for (const char* const call : {"malloc", "calloc", "realloc", "reallocarray", "strdup", "strndup",
+                                 "aligned_alloc", "posix_memalign", "asprintf", "vasprintf"}) {
+    EXPECT_EQ(imports.count(call), 0U) << call;
+  }
+  EXPECT_TRUE(IsInterposed("_Znwm") || IsInterposed("_Znwj"));
+}
+
 TEST_F(FaultCallsTest, CallsFailFromTheOneNamedForAsManyAsNamed) {
   Fault::Arm({EIO, 2, 2});
   EXPECT_NE(access("/", F_OK), -1);

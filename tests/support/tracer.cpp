@@ -4,12 +4,14 @@
 #include <gtest/gtest.h>
 #include <sys/ptrace.h>
 #include <sys/syscall.h>
+#include <sys/user.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <climits>
 #include <csignal>
+#include <cstddef>
 #include <cstdint>
 #include <filesystem>
 #include <map>
@@ -194,6 +196,23 @@ std::optional<std::string> Describe(const Call& call, const std::string& directo
   return text;
 }
 
+bool Moves(const Call& call) {
+  constexpr uint64_t kMoving[] = {SYS_read, SYS_write, SYS_pread64, SYS_pwrite64};
+  return std::count(std::begin(kMoving), std::end(kMoving), call.number) > 0 &&
+         call.arguments[2] > 1;
+}
+
+// The register keeps the size after the call, which to the function that makes it is a scratch
+// register.
+void SetSize(pid_t pid, long size) {
+#ifdef __x86_64__
+  constexpr size_t kThirdArgument = offsetof(user, regs) + offsetof(user_regs_struct, rdx);
+#else
+  constexpr size_t kThirdArgument = offsetof(user, regs) + offsetof(user_regs_struct, edx);
+#endif
+  EXPECT_EQ(ptrace(PTRACE_POKEUSER, pid, kThirdArgument, size), 0);
+}
+
 }  // namespace
 
 std::ostream& operator<<(std::ostream& out, const Moment& moment) {
@@ -240,6 +259,19 @@ std::vector<std::string> FileCalls(const std::string& directory,
   };
   Tree(watch).Run(body);
   return calls;
+}
+
+int CutTransfers(const std::string& directory, int first, const std::function<void()>& body) {
+  int seen = 0;
+  int cut = 0;
+  const Watcher watch = [&](const Call& call) {
+    if (!Moves(call) || !Below(directory, OpenFile(call.pid, call.arguments[0]))) return;
+    if (++seen < first) return;
+    SetSize(call.pid, 1);
+    ++cut;
+  };
+  Tree(watch).Run(body);
+  return cut;
 }
 
 }  // namespace Tracer

@@ -37,6 +37,11 @@ std::vector<int> Sweep(const std::function<void()>& prepare, const std::function
 // is ".".
 std::vector<std::string> FileCalls(const std::string& directory, const std::function<void()>& body);
 
+// Runs `body` in a forked child, where from its `first`-th read or write of a file below
+// `directory` on each moves one byte only, as the kernel may; those that the C library makes for
+// its streams are among them. Returns how many were cut so.
+int CutTransfers(const std::string& directory, int first, const std::function<void()>& body);
+
 }  // namespace Tracer
 
 #endif  // KELODRCORE_TESTS_SUPPORT_TRACER_H_
