@@ -31,24 +31,25 @@ RESULTS = WORK / "results.tsv"
 
 # The test programs of each source file, the quickest first; the first that fails ends a mutant.
 TESTS = {
-    "cache": ["cache_test", "cache_process_test"],
+    "cache": ["cache_test", "cache_process_test", "fault_cache_test"],
     "container": ["container_test"],
-    "document_file": ["json_value_test", "fault_json_test"],
+    "document_file": ["intercepted_document_test", "json_value_test", "fault_json_test",
+                      "kill_test --gtest_filter=PowerLoss*:*ReachesTheDisk*"],
     "err": ["err_test"],
     "file": ["file_test", "key_value_test", "fault_file_test"],
     "file_lock": ["file_lock_test", "fault_file_lock_test"],
-    "json_reader": ["json_value_test", "response_test"],
+    "json_reader": ["json_value_test", "intercepted_locale_test", "response_test"],
     "json_value": ["json_value_test", "fault_json_test"],
-    "privilege": ["file_test", "cache_test", "fault_file_test"],
+    "privilege": ["privilege_test", "file_test", "cache_test"],
     "request": ["request_test"],
     "response": ["response_test"],
     "sqlite_command": ["sqlite_command_test", "sqlite_select_command_test"],
     "sqlite_condition": ["sqlite_condition_test"],
     "sqlite_db": ["sqlite_db_test", "sqlite_db_row_test", "sqlite_db_table_test",
-                  "sqlite_db_memory_test", "sqlite_db_retry_test", "fault_sqlite_db_test",
-                  "sqlite_db_process_test"],
+                  "sqlite_db_retry_test", "sqlite_db_process_test", "sqlite_db_memory_test",
+                  "fault_sqlite_db_test"],
     "sqlite_table_handler": ["sqlite_table_handler_test"],
-    "sqlite_value": ["sqlite_value_test", "sqlite_value_list_test", "sqlite_db_row_test"],
+    "sqlite_value": ["sqlite_value_list_test", "sqlite_db_row_test", "sqlite_value_test"],
     "utils": ["utils_test", "fault_utils_test"],
     "validator": ["utils_test"],
 }
@@ -65,9 +66,13 @@ BOOLEAN = re.compile(r"\b(true|false)\b")
 CONDITION = re.compile(r"\b(?:if|while) \(")
 CALL = re.compile(r"^ +(?:(?:\(void\))?[\w:.>-]+\(.*\));$", re.M)
 STRING = re.compile(r'"(?:[^"\\\n]|\\.)*"')
-# Every mount of the file system read-only but /tmp; a shell is process 1 there and takes orphans.
+# The object of a source file that a test program has a copy of.
+COPY = re.compile(r"tests/CMakeFiles/\S+/__/src/(\w+)\.cpp\.o")
+# Every mount of the file system read-only but /tmp; a shell is process 1 there and takes orphans. A
+# program that ends before its last test, with whatever status, leaves the file.
 SANDBOX = ["unshare", "--mount", "--pid", "--fork", "--kill-child", "--mount-proc", "bash", "-c",
-           'mount -t tmpfs tmpfs /tmp && mount -o remount,bind,ro / && "$@"; exit $?', "bash"]
+           'mount -t tmpfs tmpfs /tmp && mount -o remount,bind,ro / && '
+           '"$@" && [ ! -e $TEST_PREMATURE_EXIT_FILE ]; exit $?', "bash"]
 
 Mutant = collections.namedtuple("Mutant", "file line start end new key")
 
@@ -138,6 +143,7 @@ class Worker:
         self.dir = WORK / f"worker{number}"
         self.dir.mkdir(parents=True, exist_ok=True)
         self.commands = commands
+        self.linked = set()  # the test programs with a copy of what the mutant changes
 
     def run_mutant(self, mutant, limits):
         text = mutant.file.read_text()
@@ -145,14 +151,14 @@ class Worker:
         source.write_text(text[:mutant.start] + mutant.new + text[mutant.end:])
         if not self.build(mutant.file, source):
             return "not compiled"
-        for program in TESTS[mutant.file.stem]:
-            outcome = self.run_test(program, limits[program])
+        for test in TESTS[mutant.file.stem]:
+            outcome = self.run_test(test, limits[test])
             if outcome != "passed":
                 return outcome
         return "survived"
 
     def build(self, original, source):
-        compiler, link = self.commands
+        compiler, link, copies = self.commands
         named, compile_command = compiler[original]
         compile_command = compile_command.replace(named, str(source))
         target = re.search(r" -o (\S+)", compile_command).group(1)
@@ -161,16 +167,25 @@ class Worker:
         compile_command = re.sub(r" -(Werror|MD|g)\b| -M[TF] \S+", "", compile_command)
         library = self.dir / "libkelodrcore.so.1"
         link_command = re.sub(r" -o \S+", f" -o {library}", link.replace(target, str(mutated)))
+        commands = [f"{compile_command} -w -I{ROOT}/src", link_command]
+        self.linked = set()
+        for program, copy, command in copies[original.stem]:
+            name = pathlib.Path(program).name
+            command = command.replace(copy, str(mutated))
+            commands.append(command.replace(f" -o {program}", f" -o {self.dir / name}"))
+            self.linked.add(name)
         run = lambda command: subprocess.run(command, shell=True, cwd=BUILD, timeout=300,
                                              capture_output=True).returncode == 0
-        return run(f"{compile_command} -w -I{ROOT}/src") and run(link_command)
+        return all(run(command) for command in commands)
 
-    def run_test(self, program, limit):
-        command = SANDBOX + [str(BUILD / "tests" / program), "--gtest_brief=1",
-                             "--gtest_fail_fast"]
+    def run_test(self, test, limit):
+        name, *arguments = test.split()
+        directory = self.dir if name in self.linked else BUILD / "tests"
+        command = SANDBOX + [str(directory / name), *arguments, "--gtest_brief=1", "--gtest_fail_fast"]
         process = subprocess.Popen(command, stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
                                    stderr=subprocess.DEVNULL, start_new_session=True,
-                                   env={**os.environ, "LD_LIBRARY_PATH": str(self.dir)})
+                                   env={**os.environ, "LD_LIBRARY_PATH": str(self.dir),
+                                        "TEST_PREMATURE_EXIT_FILE": "/tmp/unfinished"})
         try:
             return "passed" if process.wait(limit) == 0 else "failed"
         except subprocess.TimeoutExpired:
@@ -182,14 +197,18 @@ class Worker:
 def build_commands():
     database = subprocess.run(["ninja", "-C", str(BUILD), "-t", "compdb"], check=True,
                               capture_output=True, text=True).stdout
-    compiler, link = {}, None
+    compiler, link, copies = {}, None, collections.defaultdict(list)
     for entry in json.loads(database):
         path = pathlib.Path(entry["directory"], entry["file"])
+        copy = COPY.search(entry["command"])
+        if copy and path.suffix != ".cpp":
+            command = re.sub(r" && cd .*", "", entry["command"])  # without looking for its tests
+            copies[copy.group(1)].append((entry["output"], copy.group(), command))
         if "/kelodrcore.dir/" in entry["output"] and path.suffix == ".cpp":
             compiler[path.resolve()] = entry["file"], entry["command"]
         if re.fullmatch(r"src/libkelodrcore\.so\.\d+\.[\d.]+", entry["output"]):
             link = entry["command"]
-    return compiler, link
+    return compiler, link, copies
 
 
 def read_results():
@@ -265,7 +284,7 @@ def main():
     parser.add_argument("--minutes", type=float, default=60, help="stop after that long (60)")
     parser.add_argument("--files", nargs="*", help="file names of src/ without .cpp; all without")
     parser.add_argument("--jobs", type=int, default=2, help="how many at once (2)")
-    parser.add_argument("--retry", action="store_true", help="measure earlier survivors again")
+    parser.add_argument("--retry", action="store_true", help="measure again what survived or timed out")
     parser.add_argument("--report", action="store_true", help="only show what was measured")
     arguments = parser.parse_args()
 
@@ -275,7 +294,7 @@ def main():
     if not arguments.report:
         results = read_results()
         due = [m for m in mutants if m.key not in results or
-               (arguments.retry and results[m.key] == "survived")]
+               (arguments.retry and results[m.key] in ("survived", "timed out"))]
         random.Random(1).shuffle(due)
         run_all(due, arguments.minutes, arguments.jobs)
     report(mutants, read_results())
