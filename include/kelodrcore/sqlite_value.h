@@ -74,7 +74,8 @@ class KELODR_EXPORT SqliteValue {
   /// The SQL literal of the value, whether it is valid or not: a text in single quotes with every
   /// single quote in it doubled and nothing else escaped, "1" or "0" for a bool, decimal digits for
   /// an integer within 32 bits (signed or unsigned). The empty text, deliberately, for anything
-  /// else: no value, and integers outside 32 bits.
+  /// else: no value, and integers outside 32 bits. (The name's spelling is the interface's own, as
+  /// in `ToFormatedInsertValues` and `SetReplacable`.)
   [[nodiscard]] std::string ToFormatedValue() const;
 
   /// Appends what `ToFormatedValue` returns, without a text in between.
