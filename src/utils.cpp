@@ -13,7 +13,7 @@
 namespace KeloDRCore {
 
 bool RandomSleepInMSec(unsigned int min, unsigned int max) {
-  if (min == 0 || max == 0 || min >= max) {
+  if (min == 0 || min >= max) {
     KELODR_LOG(ERR, __func__, "Invalid period [%u - %u] to sleep", min, max);
     return false;
   }

@@ -125,6 +125,7 @@ TEST_F(FileLockProcessTest, AFileReplacedAgainAndAgainIsGivenUpAfterTheTimeout) 
   LockCalls::beforeFlock = [this](int) { Replace(path); };
   FileLock lock(name);
   EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 0));
+  EXPECT_EQ(flocks, 11) << "ten successors are tried at once";
   EXPECT_TRUE(sleeps.empty());
   EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 2));
   EXPECT_EQ(sleeps, std::vector<useconds_t>(40, 50000));

@@ -10,12 +10,14 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <numeric>
 #include <set>
 #include <string>
 #include <vector>
 
 #include "kelodrcore/json_value.h"
 #include "support/clean_test.h"
+#include "support/test_clock.h"
 
 namespace {
 
@@ -347,6 +349,21 @@ TEST_F(JsonValueFileTest, TheTemporaryOfALivingWriterIsWaitedFor) {
   close(held);
   EXPECT_EQ(status, 0);
   ExpectDocument(Path("a"), Document("x"));
+}
+
+TEST_F(JsonValueFileTest, ALivingWriterIsWaitedForAMinuteAtMost) {
+  WriteText(Path("a"), "1");
+  WriteText(Path(TemporaryOf("a")), "half");
+  const int held = open(Path(TemporaryOf("a")).c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_EQ(flock(held, LOCK_EX), 0);
+  TestClock::SkipSleeps();
+  ExpectNotWritten(Path("a"), EBUSY);
+  const std::vector<unsigned int> pauses = TestClock::TakeSleeps();
+  TestClock::Reset();
+  close(held);
+  EXPECT_EQ(std::accumulate(pauses.begin(), pauses.end(), 0U), 60000000U);
+  EXPECT_EQ(ReadText(Path("a")), "1");
+  EXPECT_EQ(ReadText(Path(TemporaryOf("a"))), "half");
 }
 
 TEST_F(JsonValueFileTest, AFullDiskLeavesTheOldDocumentAndNothingElse) {
