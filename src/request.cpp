@@ -5,7 +5,6 @@
 #include <vector>
 
 namespace KeloDRCore {
-
 namespace {
 
 constexpr char kApi[] = "api";
@@ -39,7 +38,7 @@ Request::Request(const std::string& apiName, int apiVersion, const std::string& 
 
 Request::Request(const Json::Value& request) { setRequest(request); }
 
-Request::Request(Json::Value&& request) : params(std::move(request)) { TakeEnvelope(); }
+Request::Request(Json::Value&& request) : params(std::move(request)) { takeEnvelope(); }
 
 Request::~Request() = default;
 
@@ -92,17 +91,17 @@ bool Request::addParam(const Json::Value& members) {
 
 void Request::setRequest(const Json::Value& request) {
   params = request;
-  TakeEnvelope();
+  takeEnvelope();
 }
 
-void Request::TakeEnvelope() {
+void Request::takeEnvelope() {
   if (!params.isObject()) return;
   MoveText(params, kApi, api);
   MoveText(params, kMethod, method);
   MoveInt(params, kVersion, version);
 }
 
-Json::Value Request::MakeJson(Json::Value members) const {
+Json::Value Request::makeJson(Json::Value members) const {
   Json::Value json = CanHoldMembers(members) ? std::move(members) : Json::Value(Json::objectValue);
   json[kApi] = api;
   json[kMethod] = method;
@@ -110,9 +109,9 @@ Json::Value Request::MakeJson(Json::Value members) const {
   return json;
 }
 
-Json::Value Request::toJson() const { return MakeJson(params); }
+Json::Value Request::toJson() const { return makeJson(params); }
 
-Json::Value Request::takeJson() { return MakeJson(std::move(params)); }
+Json::Value Request::takeJson() { return makeJson(std::move(params)); }
 
 std::string Request::toStr() const { return api + "/" + method + "/" + std::to_string(version); }
 

@@ -5,10 +5,10 @@
 #include <vector>
 
 #include "kelodrcore/request.h"
-#include "request_samples.h"
 #include "support/clean_test.h"
 #include "support/json_text.h"
 #include "support/random_json.h"
+#include "support/request_samples.h"
 
 namespace {
 

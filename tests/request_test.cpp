@@ -7,9 +7,9 @@
 #include <type_traits>
 #include <vector>
 
-#include "request_samples.h"
 #include "support/clean_test.h"
 #include "support/json_text.h"
+#include "support/request_samples.h"
 
 namespace {
 

@@ -115,8 +115,8 @@ class KELODR_EXPORT Request {
 
  private:
   // Moves the three reserved members out of the parameters.
-  KELODR_LOCAL void TakeEnvelope();
-  KELODR_LOCAL Json::Value MakeJson(Json::Value members) const;
+  KELODR_LOCAL void takeEnvelope();
+  KELODR_LOCAL Json::Value makeJson(Json::Value members) const;
 
   static constexpr int kNoVersion = -1;
   static constexpr int kDefaultTimeout = 120;
