@@ -13,19 +13,7 @@
 #include <vector>
 
 #include "support/clean_test.h"
-
-namespace {
-
-std::vector<useconds_t> sleeps;  // what usleep was called with
-int usleepResult = 0;
-
-}  // namespace
-
-// Stands before the C library's, for the shared library as well.
-extern "C" int usleep(useconds_t microseconds) {
-  sleeps.push_back(microseconds);
-  return usleepResult;
-}
+#include "support/sleep.h"
 
 namespace {
 
@@ -37,15 +25,24 @@ class RandomSleepTest : public CleanTest {
  protected:
   void SetUp() override {
     CleanTest::SetUp();
-    sleeps.clear();
-    usleepResult = 0;
+    ReplaceSleeps([this](useconds_t microseconds) {
+      sleeps.push_back(microseconds);
+      return usleepResult;
+    });
+  }
+  void TearDown() override {
+    ReplaceSleeps(nullptr);
+    CleanTest::TearDown();
   }
 
-  static void ExpectRefused(unsigned int min, unsigned int max, const std::string& period) {
+  void ExpectRefused(unsigned int min, unsigned int max, const std::string& period) {
     EXPECT_FALSE(RandomSleepInMSec(min, max));
     EXPECT_EQ(sleeps, std::vector<useconds_t>{}) << "a refused period must not sleep";
     ExpectLog({Err("utils.cpp", "RandomSleepInMSec", "Invalid period " + period + " to sleep")});
   }
+
+  std::vector<useconds_t> sleeps;  // what usleep was called with
+  int usleepResult = 0;
 };
 
 TEST_F(RandomSleepTest, RefusesAPeriodThatStartsAtZero) {

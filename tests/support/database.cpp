@@ -2,17 +2,15 @@
 
 #include <gmock/gmock.h>
 #include <sqlite3.h>
-#include <time.h>
 #include <unistd.h>
 
 #include "kelodrcore/json_value.h"
+#include "support/sleep.h"
 
 namespace {
 
 constexpr useconds_t kSecond = 1000000;
 
-std::function<void()> pauseAction;
-std::function<void()> sqliteSleepAction;
 std::vector<unsigned int> pauseLengths;
 useconds_t sqliteSleeps = 0;
 
@@ -41,22 +39,6 @@ std::string FailureText(unsigned int retries, const std::string& wording, const 
 }
 
 }  // namespace
-
-// The linker lets this stand before the C library's, for the shared libraries as well.
-extern "C" int usleep(useconds_t microseconds) {
-  if (microseconds >= kSecond) {
-    pauseLengths.push_back(microseconds / 1000);
-    if (pauseAction) pauseAction();
-    return 0;
-  }
-  sqliteSleeps += microseconds;
-  if (sqliteSleepAction) {
-    sqliteSleepAction();
-    return 0;
-  }
-  const timespec length = {0, static_cast<long>(microseconds) * 1000};
-  return nanosleep(&length, nullptr);
-}
 
 void DatabaseTest::SetUp() {
   CleanTest::SetUp();
@@ -117,10 +99,19 @@ LogLine SelectFailed(unsigned int retries, const std::string& sql, const Json::V
 namespace Pauses {
 
 void Start(const std::function<void()>& onPause, const std::function<void()>& onSqliteSleep) {
-  pauseAction = onPause;
   pauseLengths.clear();
   sqliteSleeps = 0;
-  sqliteSleepAction = onSqliteSleep;
+  ReplaceSleeps([=](useconds_t microseconds) -> std::optional<int> {
+    if (microseconds >= kSecond) {
+      pauseLengths.push_back(microseconds / 1000);
+      if (onPause) onPause();
+      return 0;
+    }
+    sqliteSleeps += microseconds;
+    if (!onSqliteSleep) return std::nullopt;
+    onSqliteSleep();
+    return 0;
+  });
 }
 
 std::vector<unsigned int> Lengths() { return pauseLengths; }

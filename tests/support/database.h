@@ -64,8 +64,8 @@ LogLine ExecFailed(const std::string& function, unsigned int retries, const std:
                    const Json::Value& error);
 LogLine SelectFailed(unsigned int retries, const std::string& sql, const Json::Value& error);
 
-// The pauses between two attempts: this test binary's own usleep stands before the C library's.
-// Sleeps of a second or more are the library's and end at once, shorter ones are SQLite's.
+// The pauses between two attempts. Sleeps of a second or more are the library's and end at once,
+// shorter ones are SQLite's.
 namespace Pauses {
 
 // Forgets what was recorded and sets what runs in place of each pause, and in place of SQLite's own

@@ -6,10 +6,10 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <ctime>
 #include <filesystem>
 
 #include "kelodrcore/file_lock.h"
+#include "support/sleep.h"
 
 namespace LockCalls {
 
@@ -31,13 +31,6 @@ extern "C" int flock(int fd, int operation) noexcept {
   return static_cast<int>(syscall(SYS_flock, fd, operation));
 }
 
-extern "C" int usleep(useconds_t microseconds) {
-  LockCalls::sleeps.push_back(microseconds);
-  if (LockCalls::sleepAtOnce) return 0;
-  const timespec time{0, static_cast<long>(microseconds) * 1000};
-  return nanosleep(&time, nullptr);
-}
-
 void LockTest::SetUp() {
   CleanTest::SetUp();
   if (geteuid() != 0) GTEST_SKIP() << "needs root: lock files are made as root";
@@ -46,6 +39,11 @@ void LockTest::SetUp() {
   name = "test-" + dir.substr(dir.rfind('-') + 1);
   path = lockDir + "/" + name;
   LockCalls::Forget();
+  ReplaceSleeps([](useconds_t microseconds) -> std::optional<int> {
+    LockCalls::sleeps.push_back(microseconds);
+    if (LockCalls::sleepAtOnce) return 0;
+    return std::nullopt;
+  });
 }
 
 void LockTest::TearDown() {

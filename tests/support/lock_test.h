@@ -13,13 +13,14 @@
 
 #include "support/clean_test.h"
 
-// This program's own flock and usleep stand before the C library's, for the shared library as well:
-// they count, let a test act at the worst moment, and go on to the kernel.
+// This program's own flock stands before the C library's, for the shared library as well: it
+// counts, lets a test act at the worst moment, and goes on to the kernel. The sleeps are counted,
+// too.
 namespace LockCalls {
 
 extern int flocks;                      // calls so far
 extern std::vector<useconds_t> sleeps;  // their microseconds
-extern bool sleepAtOnce;                // usleep returns without sleeping
+extern bool sleepAtOnce;                // no sleep takes time
 // Runs before each flock, with its number (from 1).
 extern std::function<void(int)> beforeFlock;
 

@@ -1,35 +1,19 @@
 #include "support/test_clock.h"
 
-#include <unistd.h>
-
-#include <cerrno>
 #include <optional>
 #include <utility>
+
+#include "support/sleep.h"
 
 namespace {
 
 std::optional<time_t> fixedTime;
-bool skipping = false;
-std::function<void()> sleepHook;
 std::vector<unsigned int> sleeps;
 
 }  // namespace
 
-// The linker lets these stand before the C library's.
-extern "C" {
-
-int usleep(useconds_t microseconds) {
-  if (skipping) {
-    sleeps.push_back(microseconds);
-    if (sleepHook) sleepHook();
-    return 0;
-  }
-  timespec rest{static_cast<time_t>(microseconds / 1000000),
-                static_cast<long>(microseconds % 1000000) * 1000};
-  return nanosleep(&rest, nullptr);
-}
-
-time_t time(time_t* out) noexcept {
+// The linker lets this stand before the C library's.
+extern "C" time_t time(time_t* out) noexcept {
   time_t now = 0;
   if (fixedTime) {
     now = *fixedTime;
@@ -42,23 +26,23 @@ time_t time(time_t* out) noexcept {
   return now;
 }
 
-}  // extern "C"
-
 namespace TestClock {
 
 void SetTime(time_t now) { fixedTime = now; }
 
 void SkipSleeps(std::function<void()> duringSleep) {
-  skipping = true;
-  sleepHook = std::move(duringSleep);
+  ReplaceSleeps([duringSleep = std::move(duringSleep)](useconds_t microseconds) {
+    sleeps.push_back(microseconds);
+    if (duringSleep) duringSleep();
+    return 0;
+  });
 }
 
 std::vector<unsigned int> TakeSleeps() { return std::exchange(sleeps, {}); }
 
 void Reset() {
   fixedTime.reset();
-  skipping = false;
-  sleepHook = nullptr;
+  ReplaceSleeps(nullptr);
   sleeps.clear();
 }
 

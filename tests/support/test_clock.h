@@ -1,5 +1,5 @@
-// The time of day and the sleeps of a test program: its own time() and usleep() stand before the C
-// library's, for the shared library as well. Real until a test says otherwise.
+// The time of day and the sleeps of a test program: its own time() stands before the C library's,
+// as its usleep() does (sleep.h), for the shared library as well. Real until a test says otherwise.
 
 #ifndef KELODRCORE_TESTS_SUPPORT_TEST_CLOCK_H_
 #define KELODRCORE_TESTS_SUPPORT_TEST_CLOCK_H_
