@@ -54,16 +54,6 @@ struct Statement {
   std::string condition = "id=7";
 };
 
-void AppendValue(std::string& text, const Json::Value& value) {
-  const char* begin = nullptr;
-  const char* end = nullptr;
-  if (value.getString(&begin, &end)) {
-    AppendLiteral(text, begin, end);
-  } else {
-    AppendNumber(text, value.asInt64());
-  }
-}
-
 std::string InsertText(const Statement& statement) {
   std::string text;
   text.reserve(64 + statement.fields.size() * 48);

@@ -39,15 +39,20 @@ size_t SelectByHand(const std::string& path) {
   return records.size();
 }
 
+// An empty database, whose making is not measured.
+void MakeUntimed(benchmark::State& state, const std::string& path) {
+  state.PauseTiming();
+  MakeDatabase(path);
+  state.ResumeTiming();
+}
+
 void MeasureInsert(int rows, const char* contestant,
                    void (*insertAll)(const std::string&, const std::vector<Node>&)) {
   Register("growth insert", std::to_string(rows), contestant, [=](benchmark::State& state) {
     const std::vector<Node> nodes = MakeNodes(rows);
     const std::string path = ScratchPath("growth.db");
     for (auto _ : state) {
-      state.PauseTiming();
-      MakeDatabase(path);
-      state.ResumeTiming();
+      MakeUntimed(state, path);
       insertAll(path, nodes);
     }
   });
@@ -96,9 +101,7 @@ void MeasureValueInsert(size_t size, const char* contestant,
     const std::vector<Node> nodes = {{"10.0.0.1", 1, std::string(size, 'x'), true, 5566}};
     const std::string path = ScratchPath("value.db");
     for (auto _ : state) {
-      state.PauseTiming();
-      MakeDatabase(path);
-      state.ResumeTiming();
+      MakeUntimed(state, path);
       insertAll(path, nodes);
       Require((contestant == std::string(kLibrary) ? SelectWithLibrary : SelectByHand)(path) == 1,
               "select");

@@ -3,6 +3,7 @@
 #ifndef KELODRCORE_BENCH_RAW_CALLS_H_
 #define KELODRCORE_BENCH_RAW_CALLS_H_
 
+#include <json/json.h>
 #include <sqlite3.h>
 
 #include <string>
@@ -17,6 +18,18 @@ void AppendLiteral(std::string& text, const char* begin, const char* end);
 
 // Appends a number that the caller has made room for.
 void AppendNumber(std::string& text, long long number);
+
+// Appends a stored text or number. In the header, so that the compiler sees through it where it is
+// measured.
+inline void AppendValue(std::string& text, const Json::Value& value) {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  if (value.getString(&begin, &end)) {
+    AppendLiteral(text, begin, end);
+  } else {
+    AppendNumber(text, value.asInt64());
+  }
+}
 
 // The INSERT statement of a node.
 void RenderInsert(const Node& node, std::string& text);

@@ -45,13 +45,7 @@ void AppendText(std::string& text, const Record& record) {
   for (const auto& [name, value] : record) {
     text.append(separator).append(name) += ':';
     separator = ", ";
-    const char* begin = nullptr;
-    const char* end = nullptr;
-    if (value.getString(&begin, &end)) {
-      AppendLiteral(text, begin, end);
-    } else {
-      AppendNumber(text, value.asInt64());
-    }
+    AppendValue(text, value);
   }
 }
 

@@ -5,33 +5,13 @@
 #include <unistd.h>
 
 #include <map>
-#include <sstream>
 
 #include "fuzz.h"
+#include "support/key_value_reference.h"
 
 namespace {
 
 namespace File = KeloDRCore::File;
-
-template <typename V>
-V Extract(const std::string& text) {
-  std::istringstream stream(text);
-  V value{};
-  stream >> value;
-  return value;
-}
-
-template <typename V>
-std::map<std::string, V> Reference(const std::string& text) {
-  std::map<std::string, V> result;
-  std::istringstream lines(text);
-  for (std::string line; std::getline(lines, line);) {
-    const size_t equal = line.find('=');
-    if (equal == std::string::npos || equal == 0 || equal + 1 == line.size()) continue;
-    result[Extract<std::string>(line.substr(0, equal))] = Extract<V>(line.substr(equal + 1));
-  }
-  return result;
-}
 
 // A NaN is equal to nothing.
 template <typename V>

@@ -10,6 +10,7 @@
 
 #include "kelodrcore/file.h"
 #include "support/clean_test.h"
+#include "support/key_value_reference.h"
 #include "support/special_files.h"
 
 namespace {
@@ -257,29 +258,6 @@ TEST_F(KeyValueTest, ADoubleOutOfRangeIsTheNearestBound) {
 }
 
 // --- the whole, against streams ------------------------------------------------------------------
-
-template <typename V>
-V Extracted(const std::string& text) {
-  std::istringstream stream(text);
-  stream.imbue(std::locale::classic());
-  V value{};
-  stream >> value;
-  return value;
-}
-
-// What the file means, told with a stream a token.
-template <typename V>
-std::map<std::string, V> Reference(const std::string& text) {
-  std::map<std::string, V> map;
-  std::istringstream lines(text);
-  for (std::string line; std::getline(lines, line);) {
-    const size_t separator = line.find('=');
-    if (separator == std::string::npos || separator == 0 || separator + 1 == line.size()) continue;
-    map[Extracted<std::string>(line.substr(0, separator))] =
-        Extracted<V>(line.substr(separator + 1));
-  }
-  return map;
-}
 
 template <typename V>
 bool SameValue(const V& a, const V& b) {
