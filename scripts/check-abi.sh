@@ -8,6 +8,10 @@ cd "$(dirname "$0")/.."
 library=build/package/src/libkelodrcore.so.1
 baseline=abi/libkelodrcore1.abi.gz
 
+case ${1:-} in
+  '' | --update) ;;
+  *) echo "check-abi.sh: there is no option $1" >&2; exit 2 ;;
+esac
 scripts/build.sh package
 if [ "${1:-}" = --update ]; then
   abidw --headers-dir include --no-show-locs --no-corpus-path --drop-private-types "$library" |
