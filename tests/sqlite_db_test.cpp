@@ -335,18 +335,28 @@ TEST_F(SqliteDBTest, SetDBErrClassifiesItsOwnError) {
 
 TEST_F(SqliteDBTest, ErrorsCarryNoName) { EXPECT_EQ(db->GetErrCodeStr(404), ""); }
 
-TEST_F(SqliteDBTest, FailureLineShowsTheErrorOfTheSubclass) {
-  class NamingDB : public SqliteDB {
+TEST_F(SqliteDBTest, FailureLinesShowTheErrorOfTheSubclass) {
+  class OtherDB : public SqliteDB {
    public:
     using SqliteDB::SqliteDB;
+    Json::Value GetErr() const override {
+      Json::Value err = SqliteDB::GetErr();
+      err["label"] = "other";
+      return err;
+    }
     std::string GetErrCodeStr(int code) const override { return KeloDRCore::ERR::ToString(code); }
   };
-  NamingDB named(path, 0, "");
-  EXPECT_FALSE(named.Exec("DROP TABLE missing"));
+  OtherDB other(path, 0, "");
   Json::Value expected = Error(404, 1, "no such table: missing");
   expected["err_code_str"] = KeloDRCore::ERR::ToString(404);
-  EXPECT_EQ(named.GetErr(), expected);
-  ExpectLog({ExecFailed("Exec", 0, "DROP TABLE missing", expected)});
+  expected["label"] = "other";
+  const std::string sql = "SELECT * FROM missing";
+  EXPECT_FALSE(other.Exec(sql));
+  EXPECT_EQ(other.GetErr(), expected);
+  EXPECT_FALSE(other.SelectByCommand(sql, record));
+  EXPECT_FALSE(other.SelectByCommand(sql, records));
+  ExpectLog({ExecFailed("Exec", 0, sql, expected), SelectFailed(0, sql, expected),
+             ExecFailed("SelectByCommand", 0, sql, expected)});
 }
 
 TEST_F(SqliteDBTest, ExecRunsAStatementWithoutALine) {
