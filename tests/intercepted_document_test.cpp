@@ -65,6 +65,16 @@ TEST_F(InterceptedDocumentTest, AFileThatGrowsWhileItIsReadIsReadToItsEnd) {
   EXPECT_TRUE(later.HasRun());
 }
 
+// No file system should do so; one that did must not be asked for ever.
+TEST_F(InterceptedDocumentTest, AWriteThatMovesNothingIsAFailure) {
+  WriteText(path, "\"old\"");
+  const Interception full("write", 1, Fault::kMoveNothing);
+  ExpectNotWritten(EIO);
+  EXPECT_TRUE(full.HasRun());
+  EXPECT_EQ(ReadText(path), "\"old\"");
+  EXPECT_EQ(NamesIn(dir), Names{"document"});
+}
+
 TEST_F(InterceptedDocumentTest, LinksThatBecomeALoopAreRefused) {
   WriteText(Path("file"), "\"old\"");
   ASSERT_EQ(symlink("file", path.c_str()), 0);

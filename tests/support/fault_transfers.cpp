@@ -30,7 +30,10 @@ bool IsFile(int fd) {
 
 // How many of `size` bytes the call moves; false when it fails.
 bool Permits(const char* call, Kind kind, int fd, size_t& size) {
-  if (Intercepts(call)) return false;
+  if (Intercepts(call)) {
+    if (errno != Fault::kMoveNothing) return false;
+    size = 0;
+  }
   if (kind == Kind::kWrite ? Hits(call, {EINTR, EIO, ENOSPC}) : Hits(call, {EINTR, EIO})) {
     return false;
   }

@@ -13,6 +13,9 @@ namespace Fault {
 // Lets the call go on.
 constexpr int kGoOn = 0;
 
+// Stands in place of an errno: a call that moves data moves nothing, which is no failure to it.
+constexpr int kMoveNothing = -1;
+
 // While it lives, `action` runs before the `number`-th call of `call`, counted from 1 since it was
 // made; that call then fails with the errno that `action` answered, unless that is kGoOn. `call` is
 // the name in the manual page, whatever it is called for large files and late dates. What `action`
