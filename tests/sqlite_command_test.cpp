@@ -192,6 +192,20 @@ TYPED_TEST(FieldCommandTest, EveryTypeIsRenderedAsItsLiteral) {
       std::string::npos);
 }
 
+TYPED_TEST(FieldCommandTest, AValueOfEachTypeReplacesTheOneBefore) {
+  TypeParam command;
+  for (const char* const name : {"a", "b", "c", "d", "e", "f"}) {
+    EXPECT_TRUE(command.AddFieldValue(name, "before"));
+  }
+  EXPECT_TRUE(command.AddFieldValue("a", std::string("x")));
+  EXPECT_TRUE(command.AddFieldValue("b", true));
+  EXPECT_TRUE(command.AddFieldValue("c", -5));
+  EXPECT_TRUE(command.AddFieldValue("d", 5U));
+  EXPECT_TRUE(command.AddFieldValue("e", 6L));
+  EXPECT_TRUE(command.AddFieldValue("f", "y"));
+  EXPECT_NE(Dump(command).find("values:[a='x',b=1,c=-5,d=5,e=6,f='y']"), std::string::npos);
+}
+
 TYPED_TEST(FieldCommandTest, AnEmptyNameIsRefused) {
   TypeParam command;
   const std::string before = Dump(command);
