@@ -22,8 +22,8 @@ namespace KeloDRCore::File {
 /// A missing file is deliberately a success that leaves `value` alone: callers treat it as the
 /// absence of a document. The lines are joined without their newlines, which matters only to a
 /// string that spans lines.
-/// @return false for an empty path, a file that cannot be opened, and text that is not one JSON
-///     document; `value` is then unchanged.
+/// @return false for an empty path, a file that cannot be opened or not be read to its end (the
+///     latter not logged), and text that is not one JSON document; `value` is then unchanged.
 KELODR_EXPORT bool Read(const std::string& path, Json::Value& value);
 
 /// Reads the JSON document from the current position of `fd` to its end into `value`, and closes
@@ -31,7 +31,7 @@ KELODR_EXPORT bool Read(const std::string& path, Json::Value& value);
 ///
 /// Newlines are kept. The text is taken in pieces of at most one line and 1023 bytes; a NUL byte
 /// hides the rest of its piece. A signal does not end the reading.
-/// @return false for a descriptor that cannot be read from, and for text that is not one JSON
+/// @return false for a descriptor that cannot be read to its end, and for text that is not one JSON
 ///     document; `value` is then unchanged.
 KELODR_EXPORT bool Read(int fd, Json::Value& value);
 
@@ -82,9 +82,9 @@ KELODR_EXPORT bool RemoveDir(const std::string& path);
 /// one out of range becomes the nearest bound of its type. White space and numbers are those of the
 /// classic locale. There are no comments. A line that is empty, has no "=", or has nothing at all
 /// on one side of it is logged and skipped.
-/// @return -1 for an empty path or a file that cannot be opened, 0 for a missing file (not logged);
-///     `map` is then unchanged. Otherwise `map` holds exactly what was read, and the result is the
-///     number of its entries.
+/// @return -1 for an empty path and for a file that cannot be opened or not be read to its end, 0
+///     for a missing file (not logged); `map` is then unchanged. Otherwise `map` holds exactly what
+///     was read, and the result is the number of its entries.
 template <typename K, typename V>
 int Read(const std::string& path, std::map<K, V>& map);
 
