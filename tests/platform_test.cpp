@@ -112,6 +112,18 @@ class PidFileTest : public CleanTest {
     return KLIBCReadPidFile(path.c_str());
   }
 
+  // A process whose files may have so many bytes makes no pid file, and leaves nothing of one.
+  void ExpectNothingOfAFileWithin(rlim_t bytes) const {
+    EXPECT_EQ(RunInChild([&] {
+                signal(SIGXFSZ, SIG_IGN);
+                LowerLimit(RLIMIT_FSIZE, bytes);
+                EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
+                EXPECT_EQ(errno, EFBIG);
+              }),
+              0);
+    EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
+  }
+
   std::string path;
 };
 
@@ -266,28 +278,10 @@ TEST_F(PidFileTest, FailsWithErrnoOverADirectory) {
   EXPECT_EQ(KLIBCFileCheckDir(path.c_str()), 1);
 }
 
-TEST_F(PidFileTest, LeavesNothingBehindWhenItCannotBeWritten) {
-  EXPECT_EQ(RunInChild([&] {
-              signal(SIGXFSZ, SIG_IGN);
-              LowerLimit(RLIMIT_FSIZE, 0);
-              EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
-              EXPECT_EQ(errno, EFBIG);
-            }),
-            0);
-  EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
-}
+TEST_F(PidFileTest, LeavesNothingBehindWhenItCannotBeWritten) { ExpectNothingOfAFileWithin(0); }
 
 // A file written to the limit in part is as bad as one not written.
-TEST_F(PidFileTest, LeavesNothingBehindWhenItIsCutShort) {
-  EXPECT_EQ(RunInChild([&] {
-              signal(SIGXFSZ, SIG_IGN);
-              LowerLimit(RLIMIT_FSIZE, 2);
-              EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
-              EXPECT_EQ(errno, EFBIG);
-            }),
-            0);
-  EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
-}
+TEST_F(PidFileTest, LeavesNothingBehindWhenItIsCutShort) { ExpectNothingOfAFileWithin(2); }
 
 TEST_F(PidFileTest, IsNeverSeenHalfWritten) {
   std::atomic<bool> done{false};
