@@ -4,7 +4,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 #include <memory>
 #include <sstream>
 
@@ -41,11 +40,6 @@ void Require(bool condition, const std::string& what) {
 std::string ScratchPath(const std::string& name) {
   static const ScratchDir dir;
   return dir.path / name;
-}
-
-std::string ReadWhole(const std::string& path) {
-  std::ifstream stream(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(stream), {}};
 }
 
 void WriteWhole(const std::string& path, const std::string& text) {

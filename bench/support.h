@@ -29,7 +29,6 @@ void Require(bool condition, const std::string& what);
 // A file in a directory of this run, which is removed at its end.
 std::string ScratchPath(const std::string& name);
 
-std::string ReadWhole(const std::string& path);
 void WriteWhole(const std::string& path, const std::string& text);
 
 // "16 B", "4 KiB", "1 MiB"

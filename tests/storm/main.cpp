@@ -13,6 +13,7 @@
 
 #include <chrono>
 #include <cstdio>
+#include <cstdlib>
 #include <filesystem>
 #include <map>
 
@@ -33,17 +34,19 @@ const std::map<std::string, Kind> kKinds = {
     {"readers", {Readers, {"", 5, 0, 50000, 1}}},
 };
 
+const std::map<std::string, int Settings::*> kNumbers = {{"processes", &Settings::processes},
+                                                         {"seconds", &Settings::seconds},
+                                                         {"count", &Settings::count},
+                                                         {"seed", &Settings::seed}};
+
+// Takes "NAME=NUMBER"; false for any other text.
 bool Set(Settings& settings, const std::string& argument) {
   const size_t end = argument.find('=');
-  if (end == std::string::npos) return false;
-  const std::string name = argument.substr(0, end);
-  const int value = atoi(argument.c_str() + end + 1);
-  if (name == "processes") settings.processes = value;
-  if (name == "seconds") settings.seconds = value;
-  if (name == "count") settings.count = value;
-  if (name == "seed") settings.seed = static_cast<unsigned int>(value);
-  return value > 0 &&
-         (name == "processes" || name == "seconds" || name == "count" || name == "seed");
+  const auto found = kNumbers.find(argument.substr(0, end));
+  if (end == std::string::npos || found == kNumbers.end()) return false;
+  int& number = settings.*found->second;
+  number = atoi(argument.c_str() + end + 1);
+  return number > 0;
 }
 
 std::string MakeDirectory() {
@@ -61,7 +64,7 @@ int Run(const std::string& name, const Kind& kind) {
   const std::chrono::duration<double> length = std::chrono::steady_clock::now() - start;
   std::filesystem::remove_all(settings.dir);
   std::filesystem::remove_all("/tmp/.kelodr_lock" + settings.dir);
-  printf("%s: %d processes, seed %u, %.1f s: %s%s\n", name.c_str(), settings.processes,
+  printf("%s: %d processes, seed %d, %.1f s: %s%s\n", name.c_str(), settings.processes,
          settings.seed, length.count(), figures.c_str(), IsAllWell() ? "" : ": WRONG");
   return IsAllWell() ? 0 : 1;
 }

@@ -51,8 +51,7 @@ bool IsWhole(const Json::Value& document) {
 }
 
 std::mt19937 Generator(const Settings& settings, int worker, int life) {
-  std::seed_seq seeds{settings.seed, static_cast<unsigned int>(worker),
-                      static_cast<unsigned int>(life)};
+  std::seed_seq seeds{settings.seed, worker, life};
   return std::mt19937(seeds);
 }
 

@@ -19,7 +19,7 @@ struct Settings {
   int processes;
   int seconds;
   int count;
-  unsigned int seed;
+  int seed;
 };
 
 // Each returns the figures for its report; what they run is told in main.cpp.
