@@ -122,6 +122,24 @@ TEST(LayoutTest, ConditionsWithoutFieldsOfTheirOwnAddNone) {
   EXPECT_EQ(sizeof(SqliteRecord), sizeof(void*));
 }
 
+// Only the field itself shows it: a condition, once set, is never empty again.
+TEST(LayoutTest, AConditionTakesADeletesPermissionBack) {
+  DeleteCommand command;
+  const auto deletesAll = [&command] {
+    bool flag = false;
+    const size_t place = Fields(&command).front().offset;
+    std::memcpy(&flag, reinterpret_cast<const char*>(&command) + place, sizeof(flag));
+    return flag;
+  };
+  EXPECT_FALSE(deletesAll());
+  command.DeleteAll();
+  EXPECT_TRUE(deletesAll());
+  EXPECT_FALSE(command.SetCondition(""));
+  EXPECT_TRUE(deletesAll());
+  EXPECT_TRUE(command.SetCondition("id=1"));
+  EXPECT_FALSE(deletesAll());
+}
+
 // In the Itanium C++ ABI a pointer to a virtual function is one more than its slot's offset.
 template <typename Function>
 size_t SlotOf(Function function) {
