@@ -22,6 +22,7 @@ const std::set<std::string> kHarmless = {
     "__snprintf_chk", "__memcpy_chk", "__memmove_chk",
     // Numbers.
     "fmod", "trunc", "difftime", "__difftime64", "__udivdi3", "__umoddi3", "__divdi3", "__moddi3",
+    "__ctzdi2",
     // The process itself.
     "_exit", "abort", "closefrom", "environ", "__environ", "getegid", "geteuid", "getpid", "kill",
     "pthread_mutex_lock", "pthread_mutex_unlock", "pthread_sigmask", "setsid", "sigemptyset",
