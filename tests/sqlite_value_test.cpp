@@ -368,6 +368,22 @@ TEST_F(SqliteValueTest, AnyTextIsRenderedAsTheRegexRendersItAndReadBackBySqlite)
   }
 }
 
+TEST_F(SqliteValueTest, OneOrTwoQuotesAreDoubledWhereverTheyStand) {
+  for (const size_t length : {1, 7, 8, 9, 15, 16, 17, 24, 63, 64, 65, 200}) {
+    const std::string text(length, 'x');
+    for (size_t first = 0; first < length; ++first) {
+      for (size_t second = first; second < length; ++second) {
+        std::string quoted = text;
+        quoted[first] = quoted[second] = '\'';
+        std::string expected = quoted;
+        expected.insert(second, "'");
+        if (first != second) expected.insert(first, "'");
+        ASSERT_EQ(SqliteValue(quoted).ToFormatedValue(), "'" + expected + "'");
+      }
+    }
+  }
+}
+
 TEST_F(SqliteValueTest, TextsWithNulBytesAreRenderedAsTheRegexRendersThem) {
   std::mt19937 random(7);
   for (unsigned int i = 0; i < 10000; ++i) {
