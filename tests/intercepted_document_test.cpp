@@ -43,6 +43,12 @@ class InterceptedDocumentTest : public CleanTest {
     EXPECT_EQ(errno, error);
   }
 
+  static ino_t InodeOf(const std::string& file) {
+    struct stat status = {};
+    EXPECT_EQ(stat(file.c_str(), &status), 0) << file;
+    return status.st_ino;
+  }
+
   std::string path;
   std::string temporary;
 };
@@ -138,22 +144,33 @@ TEST_F(InterceptedDocumentTest, APlantedLinkMayHaveBecomeTheTemporaryOfAnotherWr
   EXPECT_TRUE(other.HasRun());
 }
 
-// What is mounted over the temporary may have its inode number.
+// What is mounted over the temporary has its inode number: file systems of this kind count from 1.
 TEST_F(InterceptedDocumentTest, AFileOfAnotherFileSystemIsNotTheTemporary) {
-  WriteText(path, "\"old\"");
-  ASSERT_EQ(mkdir(Path("other").c_str(), 0755), 0);
-  if (!RunWithOwnMounts([this] {
-        ASSERT_EQ(mount("tmpfs", Path("other").c_str(), "tmpfs", 0, "size=64k"), 0);
-        WriteText(Path("other/file"), "mine");
-        const Interception other("flock", 1, [this] {
-          EXPECT_EQ(mount(Path("other/file").c_str(), temporary.c_str(), nullptr, MS_BIND, nullptr),
-                    0);
-          return kGoOn;
-        });
+  const auto mountAt = [](const std::string& where) {
+    ASSERT_EQ(mount("tmpfs", where.c_str(), "tmpfs", 0, "size=64k"), 0);
+  };
+  const auto makeTwin = [this] {
+    const std::string twin = Path("other/twin");
+    for (int made = 0; made < 100; ++made) {
+      WriteText(twin, "mine");
+      if (InodeOf(twin) == InodeOf(temporary)) break;
+      EXPECT_EQ(rename(twin.c_str(), Path("other/" + std::to_string(made)).c_str()), 0);
+    }
+    EXPECT_EQ(mount(twin.c_str(), temporary.c_str(), nullptr, MS_BIND, nullptr), 0);
+    return kGoOn;
+  };
+  if (!RunWithOwnMounts([&] {
+        mountAt(dir);
+        WriteText(path, "\"old\"");
+        ASSERT_EQ(mkdir(Path("other").c_str(), 0755), 0);
+        mountAt(Path("other"));
+        const Interception other("flock", 1, makeTwin);
         ExpectNotWritten(EBUSY);
         EXPECT_TRUE(other.HasRun());
         EXPECT_EQ(ReadText(path), "\"old\"");
         EXPECT_EQ(ReadText(temporary), "mine");
+        ASSERT_EQ(umount(temporary.c_str()), 0);
+        EXPECT_EQ(ReadText(temporary), "");
       })) {
     GTEST_SKIP() << "needs the right to mount a file system";
   }
