@@ -65,8 +65,9 @@ class InputFile {
 template <int kSize>
 bool ReadChunk(FILE* stream, char (&chunk)[kSize]) {
   int length = 0;
-  while (length < kSize - 1 && (length == 0 || chunk[length - 1] != '\n')) {
-    const int byte = getc(stream);
+  int byte = EOF;
+  while (length < kSize - 1 && byte != '\n') {
+    byte = getc(stream);
     if (byte != EOF) {
       chunk[length++] = static_cast<char>(byte);
     } else if (ferror(stream) != 0 && errno == EINTR) {
@@ -224,8 +225,7 @@ class NumberReader : private std::num_get<char, const char*> {
   NumberReader() : format(nullptr) { format.imbue(std::locale::classic()); }
 
   void Extract(std::string_view text, int& out) {
-    long wide = 0;
-    Get(SkipSpace(text), wide);
+    const auto wide = Get<long>(SkipSpace(text));
     constexpr long kMin = std::numeric_limits<int>::min();
     constexpr long kMax = std::numeric_limits<int>::max();
     out = static_cast<int>(std::clamp(wide, kMin, kMax));
@@ -237,15 +237,16 @@ class NumberReader : private std::num_get<char, const char*> {
     const char* const end = rest.data() + rest.size();
     const auto [stop, error] = std::from_chars(rest.data(), end, out);
     const bool plain = error == std::errc() && IsDigit(stop[-1]) && (stop == end || IsSpace(*stop));
-    if (!plain) Get(rest, out);
+    if (!plain) out = Get<double>(rest);
   }
 
  private:
   template <typename Number>
-  void Get(std::string_view text, Number& out) {
-    out = 0;
+  Number Get(std::string_view text) {
+    Number number = 0;
     std::ios_base::iostate ignored = std::ios_base::goodbit;
-    if (!text.empty()) get(text.data(), text.data() + text.size(), format, ignored, out);
+    if (!text.empty()) get(text.data(), text.data() + text.size(), format, ignored, number);
+    return number;
   }
 
   std::basic_ios<char> format;  // where the facet looks for flags and locale

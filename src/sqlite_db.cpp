@@ -261,10 +261,9 @@ bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
 
 // Makes attempts until one succeeds, one fails otherwise than by a lock, or the limit is reached.
 // Leaves the classified error of the last one behind. `retries` counts one past the limit when the
-// limit ends the loop, and is what the callers' messages show.
+// limit ends the loop, and is what the callers' messages show; it comes in as 0.
 template <typename Attempt>
 bool SqliteDB::RetryWhileLocked(const Attempt& attempt, unsigned int& retries) {
-  retries = 0;
   while (!attempt()) {
     const ErrRecorder raw = ThrowOnlyBadAlloc([this] { return ErrRecorder(*this); });
     SetDBErr(raw);
@@ -406,7 +405,6 @@ bool SqliteDB::Exec(const SqliteCommand& cmd) {
     return false;
   }
   KELODR_LOG(INFO, __func__, "%s Exec cmd success", logLabel.c_str());
-  SetErr(0);
   return true;
 }
 
@@ -451,9 +449,7 @@ bool SqliteDB::SelectWithCommand(const SelectCommand& cmd, Rows& rows, const cha
     KELODR_LOG(ERR, function, "%s", "Failed to create table");
     return false;
   }
-  if (!SelectByCommand(cmd.GetCommand(), rows)) return false;
-  SetErr(0);
-  return true;
+  return SelectByCommand(cmd.GetCommand(), rows);
 }
 
 bool SqliteDB::SelectRecord(const SelectCommand& cmd, SqliteValueList& record) {

@@ -17,6 +17,7 @@
 #include <stdexcept>
 
 #include "kelodrcore/file_lock.h"
+#include "support/counting_generator.h"
 #include "support/process.h"
 #include "support/test_clock.h"
 
@@ -323,6 +324,7 @@ TEST_F(CacheProcessTest, AWaiterLooksAgainEvery300To1000MsWhileTheLockIsTakenAnd
 }
 
 TEST_F(CacheProcessTest, AWaiterSleepsFrom300To1000MsBetweenTwoLooks) {
+  const CountingGenerator draws;
   WriteCacheFile("\"old\"", kStale);
   WriteText(pidFile, std::to_string(getppid()));
   int sleeps = 0;
@@ -346,7 +348,7 @@ TEST_F(CacheProcessTest, ARefresherUpdatesBehindTheCallersBack) {
         atoi(ReadText(pidFile).c_str()) == getpid() && getpid() != caller && getsid(0) == getpid();
     return finish.Wait();
   };
-  EXPECT_EQ(cache.Read(), "old");
+  EXPECT_EQ(RunInChild([&] { EXPECT_EQ(cache.Read(), "old"); }), 0);
   finish.Cause();
   EXPECT_EQ(JoinAll(), 1);
   EXPECT_EQ(cache.Read(), true);
@@ -400,14 +402,15 @@ std::string exitFile;
 TEST_F(CacheProcessTest, ARefresherRunsNoExitHandlerAndFlushesNoStream) {
   WriteCacheFile("\"old\"", kStale);
   exitFile = Path("exit");
-  EXPECT_EQ(RunInChild([&] {
-              FILE* stream = fopen(Path("stream").c_str(), "w");
-              fputs("once", stream);
-              atexit([] { std::ofstream(exitFile, std::ios::app) << "once"; });
-              EXPECT_TRUE(MakeCache(false, -1).Update());
-              exit(testing::Test::HasFailure() ? 1 : 0);
-            }),
-            0);
+  constexpr int kReturned = 7;
+  const int status = RunInChild([&] {
+    FILE* stream = fopen(Path("stream").c_str(), "w");
+    fputs("once", stream);
+    atexit([] { std::ofstream(exitFile, std::ios::app) << "once"; });
+    EXPECT_TRUE(MakeCache(false, -1).Update());
+    exit(testing::Test::HasFailure() ? 1 : kReturned);
+  });
+  EXPECT_EQ(WEXITSTATUS(status), kReturned);
   EXPECT_EQ(JoinAll(), 1);
   EXPECT_EQ(ReadText(Path("stream")), "once");
   EXPECT_EQ(ReadText(exitFile), "once");

@@ -241,6 +241,21 @@ TEST_F(CacheTest, AModificationTimeBeyond32BitsIsOneLikeAnyOther) {
   EXPECT_FALSE(cache.IsTimeout());
 }
 
+// -1 alone stands for a file that cannot be looked at.
+TEST_F(CacheTest, AModificationTimeBefore1970IsOneLikeAnyOther) {
+  const TestCache cache = MakeCache();
+  const auto expectLoaded = [&](const char* data) {
+    WriteCacheFile(data);
+    SetMtime(-2);
+    EXPECT_EQ(JsonValue::toString(cache.GetCachedData()), data);
+  };
+  expectLoaded("1");
+  std::filesystem::remove(path);
+  EXPECT_TRUE(cache.GetCachedData().isNull());
+  expectLoaded("2");
+  ExpectLog({NoData(), UsesDefault()});
+}
+
 // --- IsTimeout
 
 TEST_F(CacheTest, AMissingFileIsStaleWhateverTheTimeout) {

@@ -10,6 +10,7 @@
 #include <filesystem>
 
 #include "kelodrcore/json_value.h"
+#include "support/counting_generator.h"
 #include "support/test_cache.h"
 #include "support/test_clock.h"
 
@@ -135,6 +136,7 @@ TEST_F(CacheUpdateTest, TriesToWriteTwoMoreTimesThanTheRetryLimit) {
 }
 
 TEST_F(CacheUpdateTest, SleepsFrom300To1000MsBetweenTwoWrites) {
+  const CountingGenerator draws;
   BlockPath(path);
   TestClock::SkipSleeps();
   EXPECT_FALSE(MakeCache(true, kManySleeps - 1).UpdateWithData(1));
@@ -198,6 +200,7 @@ TEST_F(CacheUpdateTest, FetchesTwoMoreTimesThanTheRetryLimit) {
 }
 
 TEST_F(CacheUpdateTest, SleepsFrom500To1000MsBetweenTwoFetches) {
+  const CountingGenerator draws;
   TestClock::SkipSleeps();
   EXPECT_FALSE(MakeCache(true, kManySleeps - 1).DoUpdate());
   ExpectManySleepsFrom(500, 1000);

@@ -2,6 +2,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <functional>
 
 #include "kelodrcore/json_value.h"
@@ -30,6 +31,9 @@ class JsonFaultTest : public FaultTest {
   }
 
   Fault::Operation ToFile(const std::string& old);
+  // Success means that everything was done: only the release of what the writer had open, and a
+  // lock that was tried again, may have failed.
+  static void ExpectAllDone(const Outcome& outcome);
   // The same over an old file, with something else that is there when it begins.
   Fault::Operation ToFileOver(const std::function<void()>& arrange);
 
@@ -38,6 +42,13 @@ class JsonFaultTest : public FaultTest {
   bool wasLeftReadable = false;
   const Json::Value newDocument = Document(kNew);
 };
+
+void JsonFaultTest::ExpectAllDone(const Outcome& outcome) {
+  if (!outcome.succeeded || outcome.error <= 0 || outcome.error == EINTR) return;
+  for (const std::string& call : outcome.failed) {
+    EXPECT_TRUE(call == "close" || call == "flock") << call;
+  }
+}
 
 // The document is the old or the new one. A temporary stays only where its removal failed, or where
 // its lock could not be had for a minute, without which it may be another writer's; the next call
@@ -56,6 +67,7 @@ Fault::Operation JsonFaultTest::ToFile(const std::string& old) {
         outcome.Failed("unlinkat") || (outcome.Failed("flock") && outcome.error == EAGAIN);
     EXPECT_LE(NamesIn(dir).size(), documents + (mayLeaveTemporary ? 1 : 0));
     EXPECT_EQ(outcome.log, std::vector<LogLine>{});
+    ExpectAllDone(outcome);
   };
   return {prepare, run, check};
 }
@@ -73,6 +85,7 @@ Fault::Operation JsonFaultTest::ToFileOver(const std::function<void()>& arrange)
     EXPECT_TRUE(text == kNew || (!outcome.succeeded && text == kOld)) << text;
     EXPECT_LE(NamesIn(dir).size(), outcome.succeeded ? 1U : 2U);
     EXPECT_EQ(outcome.log, std::vector<LogLine>{});
+    ExpectAllDone(outcome);
   };
   return {prepare, toFile.run, check};
 }

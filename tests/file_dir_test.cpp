@@ -248,4 +248,14 @@ TEST_F(FileDirTest, OnlyAnOpenRegularFileIsARegularFile) {
   EXPECT_FALSE(File::IsRegularFile(file));
 }
 
+TEST_F(FileDirTest, ARegularFileMayHaveTheNumberOfTheStandardInput) {
+  WriteText(Path("file"), "x");
+  EXPECT_EQ(RunInChild([this] {
+              close(STDIN_FILENO);
+              ASSERT_EQ(open(Path("file").c_str(), O_RDONLY | O_CLOEXEC), STDIN_FILENO);
+              EXPECT_TRUE(File::IsRegularFile(STDIN_FILENO));
+            }),
+            0);
+}
+
 }  // namespace

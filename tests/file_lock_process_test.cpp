@@ -144,6 +144,19 @@ TEST_F(FileLockProcessTest, ALockFileThatCannotBeOpenedAnewFailsAtOnce) {
   EXPECT_TRUE(sleeps.empty());
 }
 
+TEST_F(FileLockProcessTest, ALockWhoseDirectoryCannotBeMadeAnewFailsAtOnce) {
+  LockCalls::beforeFlock = [this](int) {
+    std::filesystem::remove_all(path);
+    WriteText(path, "");
+  };
+  FileLock lock(name + "/lock");
+  EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 5));
+  const std::vector<LogLine> lines = LogCapture::Take();
+  ASSERT_FALSE(lines.empty());
+  EXPECT_EQ(lines.back(), Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + path + "/lock]"));
+  EXPECT_EQ(flocks, 1);
+}
+
 // --- processes -----------------------------------------------------------------------------------
 
 TEST_F(FileLockProcessTest, WithoutNonBlockTheKernelWaits) {

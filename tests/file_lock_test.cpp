@@ -300,6 +300,23 @@ TEST_F(FileLockTest, UnlockLeavesDescriptorZeroAlone) {
             0);
 }
 
+TEST_F(FileLockTest, UnlockReleasesAnyDescriptorAboveZero) {
+  EXPECT_EQ(RunInChild([this] {
+              const int output = dup(STDOUT_FILENO);
+              close(STDOUT_FILENO);
+              FileLock lock(name);
+              ASSERT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 0));
+              ASSERT_EQ(DescriptorOf(path), STDOUT_FILENO);
+              lock.unlock();
+              EXPECT_TRUE(IsFree());
+              ASSERT_TRUE(lock.setLockFile(name));
+              lock.~FileLock();
+              dup2(output, STDOUT_FILENO);
+              new (&lock) FileLock;
+            }),
+            0);
+}
+
 TEST_F(FileLockTest, TryLockAnswersAndNeverHolds) {
   FileLock lock(name);
   EXPECT_TRUE(lock.tryLock(LOCK_EX | LOCK_NB));

@@ -81,6 +81,19 @@ TEST_F(InterceptedDocumentTest, AWriteThatMovesNothingIsAFailure) {
   EXPECT_EQ(NamesIn(dir), Names{"document"});
 }
 
+// The old file says to whom; until its mode is taken over, that is its owner alone.
+TEST_F(InterceptedDocumentTest, ANewTextIsNobodyElsesWhileItIsWritten) {
+  umask(0);
+  WriteText(path, "\"old\"");
+  struct stat status = {};
+  const Interception write("write", 1, [&] {
+    EXPECT_EQ(stat(temporary.c_str(), &status), 0);
+    return kGoOn;
+  });
+  ExpectWritten();
+  EXPECT_EQ(status.st_mode, mode_t{S_IFREG | 0600});
+}
+
 TEST_F(InterceptedDocumentTest, LinksThatBecomeALoopAreRefused) {
   WriteText(Path("file"), "\"old\"");
   ASSERT_EQ(symlink("file", path.c_str()), 0);
@@ -140,6 +153,17 @@ TEST_F(InterceptedDocumentTest, APlantedLinkMayHaveBecomeTheTemporaryOfAnotherWr
     return kGoOn;
   });
   // Only a leftover is opened for reading alone, and closed again.
+  ExpectWritten();
+  EXPECT_TRUE(other.HasRun());
+}
+
+// Between its creation and its lock, when it looks like a dead writer's.
+TEST_F(InterceptedDocumentTest, AnotherFileUnderItsNameIsNotTheTemporary) {
+  const Interception other("flock", 1, [&] {
+    EXPECT_EQ(unlink(temporary.c_str()), 0);
+    WriteText(temporary, "half");
+    return kGoOn;
+  });
   ExpectWritten();
   EXPECT_TRUE(other.HasRun());
 }

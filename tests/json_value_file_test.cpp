@@ -10,7 +10,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <numeric>
 #include <set>
 #include <string>
 #include <vector>
@@ -49,6 +48,7 @@ class JsonValueFileTest : public CleanTest {
     umaskBefore = umask(022);
   }
   void TearDown() override {
+    TestClock::Reset();
     umask(umaskBefore);
     CleanTest::TearDown();
   }
@@ -241,6 +241,19 @@ TEST_F(JsonValueFileTest, ALinkToNothingMakesTheFileThatItNames) {
   ExpectDocument(Path("target"), Document("x"));
 }
 
+TEST_F(JsonValueFileTest, AsManyLinksAreFollowedAsTheKernelFollows) {
+  std::string path = Path("file");
+  for (int link = 1; link <= 40; ++link) {
+    const std::string next = Path("link" + std::to_string(link));
+    ASSERT_EQ(symlink(path.c_str(), next.c_str()), 0);
+    path = next;
+  }
+  ASSERT_TRUE(toFile(Document("x"), path));
+  ExpectDocument(Path("file"), Document("x"));
+  ASSERT_EQ(symlink(path.c_str(), Path("one more").c_str()), 0);
+  ExpectNotWritten(Path("one more"), ELOOP);
+}
+
 TEST_F(JsonValueFileTest, ALoopOfLinksIsAFailure) {
   ASSERT_EQ(symlink("two", Path("one").c_str()), 0);
   ASSERT_EQ(symlink("one", Path("two").c_str()), 0);
@@ -351,19 +364,66 @@ TEST_F(JsonValueFileTest, TheTemporaryOfALivingWriterIsWaitedFor) {
   ExpectDocument(Path("a"), Document("x"));
 }
 
-TEST_F(JsonValueFileTest, ALivingWriterIsWaitedForAMinuteAtMost) {
-  WriteText(Path("a"), "1");
-  WriteText(Path(TemporaryOf("a")), "half");
-  const int held = open(Path(TemporaryOf("a")).c_str(), O_RDONLY | O_CLOEXEC);
-  ASSERT_EQ(flock(held, LOCK_EX), 0);
+// A living writer of the file "a", which the test lets end when the writer under test has waited.
+class WaitingWriterTest : public JsonValueFileTest {
+ protected:
+  void SetUp() override {
+    JsonValueFileTest::SetUp();
+    WriteText(Path(TemporaryOf("a")), "half");
+    other = open(Path(TemporaryOf("a")).c_str(), O_RDONLY | O_CLOEXEC);
+    ASSERT_EQ(flock(other, LOCK_EX), 0);
+  }
+  void TearDown() override {
+    close(other);
+    JsonValueFileTest::TearDown();
+  }
+
+  void EndOther() const { EXPECT_EQ(flock(other, LOCK_UN), 0); }
+
+ private:
+  int other = -1;
+};
+
+TEST_F(WaitingWriterTest, GivesUpAfterAMinute) {
   TestClock::SkipSleeps();
   ExpectNotWritten(Path("a"), EBUSY);
-  const std::vector<unsigned int> pauses = TestClock::TakeSleeps();
-  TestClock::Reset();
-  close(held);
-  EXPECT_EQ(std::accumulate(pauses.begin(), pauses.end(), 0U), 60000000U);
-  EXPECT_EQ(ReadText(Path("a")), "1");
+  EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>(60000, 1000));
+  EXPECT_EQ(NamesIn(dir), Names{TemporaryOf("a")});
   EXPECT_EQ(ReadText(Path(TemporaryOf("a"))), "half");
+}
+
+TEST_F(WaitingWriterTest, KeepsTheModeThatTheFileGotMeanwhile) {
+  WriteText(Path("a"), "1");
+  ASSERT_EQ(chmod(Path("a").c_str(), 0644), 0);
+  TestClock::SkipSleeps([this] {
+    EXPECT_EQ(chmod(Path("a").c_str(), 0640), 0);
+    EndOther();
+  });
+  ASSERT_TRUE(toFile(Document("x"), Path("a")));
+  EXPECT_EQ(ModeOf(Path("a")), 0640U);
+}
+
+TEST_F(WaitingWriterTest, KeepsTheModeOfAFileThatWentAwayMeanwhile) {
+  WriteText(Path("a"), "1");
+  ASSERT_EQ(chmod(Path("a").c_str(), 0640), 0);
+  TestClock::SkipSleeps([this] {
+    EXPECT_EQ(unlink(Path("a").c_str()), 0);
+    EndOther();
+  });
+  ASSERT_TRUE(toFile(Document("x"), Path("a")));
+  EXPECT_EQ(ModeOf(Path("a")), 0640U);
+}
+
+// The directory is locked by another writer that takes the link away.
+TEST_F(JsonValueFileTest, APlantedLinkIsTakenAwayOnceItsDirectoryIsFree) {
+  ASSERT_EQ(symlink("nowhere", Path(TemporaryOf("a")).c_str()), 0);
+  const int directory = open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  ASSERT_EQ(flock(directory, LOCK_EX), 0);
+  TestClock::SkipSleeps([&] { EXPECT_EQ(flock(directory, LOCK_UN), 0); });
+  EXPECT_TRUE(toFile(Document("x"), Path("a")));
+  EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>{1000});
+  EXPECT_EQ(NamesIn(dir), Names{"a"});
+  close(directory);
 }
 
 TEST_F(JsonValueFileTest, AFullDiskLeavesTheOldDocumentAndNothingElse) {

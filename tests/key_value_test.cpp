@@ -243,9 +243,10 @@ TEST_F(KeyValueTest, AnIntOutOfRangeIsTheNearestBound) {
 
 TEST_F(KeyValueTest, ADoubleIsReadAsFarAsItIsOne) {
   const std::pair<const char*, double> rows[] = {
-      {"1", 1},       {"-1.5e3", -1500}, {" .5 ", 0.5}, {"5.", 5},     {"1e", 0},      {"1e+", 0},
-      {"1e+2", 100},  {"1E-2", 0.01},    {"0x10", 0},   {"inf", 0},    {"nan", 0},     {".", 0},
-      {"1.2.3", 1.2}, {"1,5", 1},        {"abc", 0},    {"12abc", 12}, {"1e5e5", 1e5}, {"+4", 4}};
+      {"1", 1},   {"-1.5e3", -1500}, {" .5 ", 0.5},  {"5.", 5},      {"1e", 0},
+      {"1e+", 0}, {"1e+2", 100},     {"1E-2", 0.01}, {"0x10", 0},    {"inf", 0},
+      {"nan", 0}, {"nan(1)", 0},     {".", 0},       {"1.2.3", 1.2}, {"1,5", 1},
+      {"abc", 0}, {"12abc", 12},     {"1e5e5", 1e5}, {"+4", 4}};
   for (const auto& [text, expected] : rows) EXPECT_EQ(Value<double>(text), expected) << text;
   EXPECT_TRUE(std::signbit(Value<double>("-0")));
 }

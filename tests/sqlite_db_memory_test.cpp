@@ -76,6 +76,19 @@ TEST_F(SqliteDBMemoryTest, QueriesFailCleanly) {
   });
 }
 
+TEST_F(SqliteDBMemoryTest, NoRowIsGivenHalf) {
+  FailEachAllocation([](SqliteDB& scarce) {
+    Records rows;
+    try {
+      scarce.SelectByCommand("SELECT n, s FROM t UNION ALL SELECT 2, s FROM t", rows);
+    } catch (const std::bad_alloc&) {
+      allocationsLeft = -1;
+      for (const SqliteValueList& row : rows) EXPECT_EQ(row.GetValues().size(), 2U);
+      throw;
+    }
+  });
+}
+
 TEST_F(SqliteDBMemoryTest, CommandsFailCleanly) {
   const SqliteTableHandler table("t", "n, s");
   FailEachAllocation([&](SqliteDB& scarce) {

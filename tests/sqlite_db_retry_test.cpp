@@ -4,7 +4,10 @@
 #include <gmock/gmock.h>
 #include <sqlite3.h>
 
+#include <set>
+
 #include "kelodrcore/sqlite_db.h"
+#include "support/counting_generator.h"
 #include "support/database.h"
 
 namespace {
@@ -74,6 +77,18 @@ TEST_F(SqliteDBRetryTest, ExecSucceedsOnTheLastAttempt) {
   Pauses::ExpectCount(3);
   ExpectLog(
       {Info(kFile, "Exec", "After retry [3] times, success to exec command [SELECT fail(5)]")});
+}
+
+TEST_F(SqliteDBRetryTest, ThePausesAreDrawnFromAllMillisecondsOfOneToTwoSeconds) {
+  Start(1100);
+  FailNextCalls(1100);
+  const CountingGenerator draws;
+  EXPECT_TRUE(db->Exec("SELECT fail(5)"));
+  std::set<unsigned int> expected;
+  for (unsigned int length = 1000; length <= 2000; ++length) expected.insert(length);
+  const std::vector<unsigned int> lengths = Pauses::Lengths();
+  EXPECT_EQ(std::set<unsigned int>(lengths.begin(), lengths.end()), expected);
+  LogCapture::Clear();
 }
 
 TEST_F(SqliteDBRetryTest, TheTwoQueriesCrossTheirWordings) {

@@ -92,6 +92,8 @@ TEST_F(SelectCommandTest, LimitsWithTheOffsetFirst) {
   EXPECT_EQ(command.GetCommand(), "SELECT id FROM job LIMIT 20, 10");
   EXPECT_TRUE(command.SetLimit(5));
   EXPECT_EQ(command.GetCommand(), "SELECT id FROM job LIMIT 20, 5");
+  EXPECT_TRUE(command.SetLimit(1));
+  EXPECT_EQ(command.GetCommand(), "SELECT id FROM job LIMIT 20, 1");
   EXPECT_TRUE(command.SetLimit(0, 1));
   EXPECT_EQ(command.GetCommand(), "SELECT id FROM job LIMIT 0, 1");
   const int most = std::numeric_limits<int>::max();

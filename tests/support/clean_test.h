@@ -23,7 +23,8 @@ std::string ReadText(const std::string& path);
 void WriteText(const std::string& path, const std::string& text);
 
 // Runs `body` in a forked child and returns its wait status: 0 when it returned and no expectation
-// of it failed. Failed expectations of the child are printed by the child.
+// of it failed; never 0 when it ended the process itself. Failed expectations of the child are
+// printed by the child.
 int RunInChild(const std::function<void()>& body);
 
 // Runs `body` in a child whose mounts are its own, and expects it to pass; false when this process

@@ -67,11 +67,11 @@ class CacheFixture : public CleanTest {
   // Sets the modification time of the cache file in seconds since the epoch.
   void SetMtime(time_t seconds) const;
 
-  // So many sleeps that, drawn from a whole range, some come within 8 ms of each of its bounds.
-  static constexpr int kManySleeps = 3000;
+  // So many sleeps that a CountingGenerator gives each length of their range.
+  static constexpr int kManySleeps = 800;
 
-  // Expects that the sleeps skipped since the last look are kManySleeps draws from that range, in
-  // milliseconds.
+  // Expects that the sleeps skipped since the last look are kManySleeps, of each length of that
+  // range, in milliseconds.
   static void ExpectManySleepsFrom(unsigned int low, unsigned int high);
 
   // Runs `body` in a child that sees an empty /tmp of `size`; skips the test when this

@@ -1,0 +1,83 @@
+// A claim whose pid file cannot be removed at once.
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <memory>
+#include <vector>
+
+#include "kelodrcore/file_lock.h"
+#include "support/interception.h"
+#include "support/process.h"
+#include "support/test_cache.h"
+
+namespace {
+
+using Fault::Interception;
+
+class InterceptedCacheTest : public CleanTest {
+ protected:
+  void SetUp() override {
+    CleanTest::SetUp();
+    if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+    cache = std::make_unique<TestCache>(dir, "c", 1000, true, 0);
+    cache->FetchGives(1);
+  }
+  void TearDown() override {
+    const std::string lock = KeloDRCore::FileLock::getLockFilePath(Path("c.cached.lock"));
+    unlink(lock.c_str());
+    rmdir(lock.substr(0, lock.rfind('/')).c_str());
+    CleanTest::TearDown();
+  }
+
+  // Updates the cache; the first calls that are to remove the pid file fail with these errors.
+  void UpdateWhileRemovalFails(const std::vector<int>& errors) {
+    std::vector<std::unique_ptr<Interception>> failures;
+    cache->fetch = [&](Json::Value& out) {
+      for (const int error : errors) {
+        const int number = static_cast<int>(failures.size()) + 1;
+        failures.push_back(std::make_unique<Interception>("unlink", number, error));
+      }
+      out = 1;
+      return true;
+    };
+    EXPECT_TRUE(cache->Update());
+    for (const auto& failure : failures) EXPECT_TRUE(failure->HasRun());
+  }
+
+  LogLine Starts() const {
+    return Debug("cache.cpp", "SetUpdating",
+                 "---> Start to update cache [" + Path("c.cached") + "]");
+  }
+  LogLine CannotUnlink(const std::string& reason) const {
+    return Notice("cache.cpp", "UnsetUpdating",
+                  "Failed to unlink [" + Path("c.cached.pid") + "] with ret[-1](" + reason + ")");
+  }
+  LogLine Finishes() const {
+    return Debug("cache.cpp", "UnsetUpdating",
+                 "<--- Finish to update cache [" + Path("c.cached") + "]");
+  }
+
+  using Names = std::vector<std::string>;
+  std::unique_ptr<TestCache> cache;
+};
+
+TEST_F(InterceptedCacheTest, IsReleasedAtTheThirdAttempt) {
+  UpdateWhileRemovalFails({EIO, EACCES});
+  ExpectLog({Starts(), Finishes()});
+  EXPECT_EQ(NamesIn(dir), Names{"c.cached"});
+}
+
+TEST_F(InterceptedCacheTest, IsGivenUpAfterTheThirdAttempt) {
+  UpdateWhileRemovalFails({EIO, EIO, EACCES});
+  ExpectLog({Starts(), CannotUnlink("Permission denied"), Finishes()});
+  EXPECT_EQ(NamesIn(dir), (Names{"c.cached", "c.cached.pid"}));
+}
+
+TEST_F(InterceptedCacheTest, IsNotTriedAgainWhereThePidFileIsGone) {
+  UpdateWhileRemovalFails({ENOENT});
+  ExpectLog({Starts(), CannotUnlink("No such file or directory"), Finishes()});
+  EXPECT_EQ(NamesIn(dir), (Names{"c.cached", "c.cached.pid"}));
+}
+
+}  // namespace
