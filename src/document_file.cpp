@@ -120,12 +120,11 @@ bool IsPath(const std::string& path) {
   return !path.empty() && path.find('\0') == std::string::npos;
 }
 
-// The state of a document's file, nothing when there is none. False for anything but a regular
-// file: a device or a queue must not be replaced by a file.
+// The state of a document's file; `state` comes in empty and stays so when there is none. False for
+// anything but a regular file: a device or a queue must not be replaced by a file.
 using State = std::optional<struct stat>;
 bool LookAt(int directory, const std::string& name, int flags, State& state) {
   struct stat found = {};
-  state.reset();
   if (!StatAt(directory, name, flags, found)) return errno == ENOENT;
   if (!S_ISREG(found.st_mode)) return Fail(S_ISDIR(found.st_mode) ? EISDIR : EINVAL);
   state = found;

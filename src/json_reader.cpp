@@ -21,9 +21,9 @@ int HexDigit(char c) {
   return -1;
 }
 
+// `number` comes in as 0.
 bool DecodeHex(const char*& at, const char* end, unsigned& number) {
   if (end - at < 4) return false;
-  number = 0;
   for (int i = 0; i < 4; ++i) {
     const int digit = HexDigit(*at++);
     if (digit < 0) return false;

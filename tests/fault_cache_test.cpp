@@ -139,6 +139,9 @@ TEST_F(CacheFaultTest, AReadGivesTheDocumentOrTheDefault) {
 }
 
 TEST_F(CacheFaultTest, AnUpdateIsMadeOrFails) {
+  const LogLine withoutLock =
+      Notice("cache.cpp", "UnsetUpdating", "Failed to lock to unset cache[" + path + "]");
+  size_t releasesWithoutLock = 0;
   const auto prepare = [this] { MakeCache(true, false); };
   const auto run = [this] {
     {
@@ -147,16 +150,20 @@ TEST_F(CacheFaultTest, AnUpdateIsMadeOrFails) {
     }
     return cache->Update();
   };
-  const auto check = [this](const Outcome& outcome) {
+  const auto check = [&](const Outcome& outcome) {
     // An updater that could not be told apart from none is waited for, and then there is no news.
     const bool waited = std::any_of(
         outcome.log.begin(), outcome.log.end(),
         [](const LogLine& line) { return line.message.find("start to block wait cache") == 0; });
     EXPECT_TRUE(!outcome.succeeded || waited || Document() == "new");
     CheckState(outcome);
+    releasesWithoutLock +=
+        static_cast<size_t>(std::count(outcome.log.begin(), outcome.log.end(), withoutLock));
   };
   SweepCalls({prepare, run, check});
+  releasesWithoutLock = 0;
   SweepMemory({prepare, run, check});
+  EXPECT_GT(releasesWithoutLock, 0U) << "a lock that there is no memory for is told";
   SweepTransfers({prepare, run, check});
 }
 

@@ -72,6 +72,13 @@ TEST_F(SqliteDBTableTest, IsTableExistedTellsPresentFromAbsent) {
   EXPECT_EQ(db->GetErr(), Error(0));
 }
 
+TEST_F(SqliteDBTableTest, IsTableExistedTakesANameOfAnyLength) {
+  const std::string name(1000, 'n');
+  EXPECT_FALSE(db->IsTableExisted(name));
+  ASSERT_TRUE(db->Exec("CREATE TABLE " + name + " (x)"));
+  EXPECT_TRUE(db->IsTableExisted(name));
+}
+
 TEST_F(SqliteDBTableTest, IsTableExistedAsksForTablesOnly) {
   Fill();
   ASSERT_TRUE(db->Exec("CREATE VIEW seen AS SELECT 1; CREATE INDEX byname ON node (name)"));

@@ -31,6 +31,13 @@ TEST_F(SelectCommandTest, NamesItsFieldsInTheOrderAdded) {
   EXPECT_EQ(SelectOf({"count(*)"}).GetCommand(), "SELECT count(*) FROM job");
 }
 
+TEST_F(SelectCommandTest, NamesAHundredFields) {
+  std::string names = "f";
+  for (int i = 1; i < 100; ++i) names += ",f";
+  EXPECT_EQ(SelectOf(std::vector<std::string>(100, "f")).GetCommand(),
+            "SELECT " + names + " FROM job");
+}
+
 TEST_F(SelectCommandTest, AnEmptyFieldIsRefusedWithoutALine) {
   auto command = SelectOf({});
   EXPECT_FALSE(command.AddField(""));
