@@ -36,8 +36,8 @@ void InsertWithSqliteCpp(const std::string& path, const std::vector<Node>& nodes
   transaction.commit();
 }
 
-void Measure(const std::string& contestant, const InsertAll& insertAll) {
-  Register("InsertRecord", "20,000 rows", contestant, [=](benchmark::State& state) {
+void Measure(const char* work, const std::string& contestant, const InsertAll& insertAll) {
+  Register("InsertRecord", work, contestant, [=](benchmark::State& state) {
     static const std::vector<Node> nodes = MakeNodes(kRows);
     static const std::string expected = Contents(DatabaseOf(kRows));
     const std::string path = ScratchPath("insert.db");
@@ -54,10 +54,12 @@ void Measure(const std::string& contestant, const InsertAll& insertAll) {
 }  // namespace
 
 void RegisterInsert() {
-  Measure(kLibrary, InsertWithLibrary);
-  Measure(kLimit, InsertByHand);
-  Measure("SQLiteCpp", InsertWithSqliteCpp);
-  Measure("SOCI", InsertWithSoci);
+  Measure("20,000 rows", kLibrary, InsertWithLibrary);
+  Measure("20,000 rows", kLimit, InsertByHand);
+  Measure("20,000 rows", "SQLiteCpp", InsertWithSqliteCpp);
+  Measure("20,000 rows", "SOCI", InsertWithSoci);
+  Measure("20,000 rows, one command for all", kLibrary, InsertWithOneCommand);
+  Measure("20,000 rows, one command for all", kLimit, InsertByHand);
 }
 
 }  // namespace bench

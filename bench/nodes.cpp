@@ -18,6 +18,21 @@ int AppendRow(void* contents, int columns, char** values, char** /*names*/) {
   return 0;
 }
 
+void SetFields(KeloDRCore::InsertCommand& command, const Node& node) {
+  command.AddFieldValue("address", node.address);
+  command.AddFieldValue("id", node.id);
+  command.AddFieldValue("name", node.name);
+  command.AddFieldValue("online", node.online);
+  command.AddFieldValue("port", node.port);
+}
+
+KeloDRCore::InsertCommand InsertOf(const KeloDRCore::SqliteTableHandler& table, const Node& node) {
+  KeloDRCore::InsertCommand command;
+  command.SetTable(table);
+  SetFields(command, node);
+  return command;
+}
+
 }  // namespace
 
 std::vector<Node> MakeNodes(int count) {
@@ -33,17 +48,6 @@ std::vector<Node> MakeNodes(int count) {
 }
 
 KeloDRCore::SqliteTableHandler NodeTable() { return {"nodes", kColumns}; }
-
-KeloDRCore::InsertCommand InsertOf(const KeloDRCore::SqliteTableHandler& table, const Node& node) {
-  KeloDRCore::InsertCommand command;
-  command.SetTable(table);
-  command.AddFieldValue("address", node.address);
-  command.AddFieldValue("id", node.id);
-  command.AddFieldValue("name", node.name);
-  command.AddFieldValue("online", node.online);
-  command.AddFieldValue("port", node.port);
-  return command;
-}
 
 sqlite3* OpenRaw(const std::string& path) {
   sqlite3* db = nullptr;
@@ -92,6 +96,18 @@ void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes) 
   KeloDRCore::SqliteDB db(path, 3, "bench");
   Require(db.Exec("BEGIN"), "BEGIN");
   for (const Node& node : nodes) Require(db.InsertRecord(InsertOf(table, node)), "InsertRecord");
+  Require(db.Exec("COMMIT"), "COMMIT");
+}
+
+void InsertWithOneCommand(const std::string& path, const std::vector<Node>& nodes) {
+  KeloDRCore::InsertCommand command;
+  command.SetTable(NodeTable());
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  Require(db.Exec("BEGIN"), "BEGIN");
+  for (const Node& node : nodes) {
+    SetFields(command, node);
+    Require(db.InsertRecord(command), "InsertRecord");
+  }
   Require(db.Exec("COMMIT"), "COMMIT");
 }
 

@@ -33,8 +33,6 @@ std::vector<Node> MakeNodes(int count);
 
 KeloDRCore::SqliteTableHandler NodeTable();
 
-KeloDRCore::InsertCommand InsertOf(const KeloDRCore::SqliteTableHandler& table, const Node& node);
-
 // An empty database file with an empty node table.
 void MakeDatabase(const std::string& path);
 
@@ -44,8 +42,10 @@ std::string DatabaseOf(int count);
 sqlite3* OpenRaw(const std::string& path);
 void ExecRaw(sqlite3* db, const char* sql);
 
-// Insert the nodes into the empty table inside one transaction: with the library, and at its limit.
+// Insert the nodes into the empty table inside one transaction: with the library, a command for
+// each row or one for all of them, and at its limit.
 void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes);
+void InsertWithOneCommand(const std::string& path, const std::vector<Node>& nodes);
 void InsertByHand(const std::string& path, const std::vector<Node>& nodes);
 
 // All rows of the table as one text, to hold databases against each other.
