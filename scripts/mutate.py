@@ -43,7 +43,7 @@ TESTS = {
     "privilege": ["privilege_test", "file_test", "cache_test"],
     "request": ["request_test"],
     "response": ["response_test"],
-    "sqlite_command": ["sqlite_command_test", "sqlite_select_command_test"],
+    "sqlite_command": ["sqlite_command_test", "sqlite_select_command_test", "layout_test"],
     "sqlite_condition": ["sqlite_condition_test"],
     "sqlite_db": ["sqlite_db_test", "sqlite_db_row_test", "sqlite_db_table_test",
                   "sqlite_db_retry_test", "sqlite_db_process_test", "sqlite_db_memory_test",

@@ -184,6 +184,7 @@ TEST_F(JsonValueTest, ReadsValuesOfEveryType) {
   EXPECT_EQ(Parsed(" \t\r\ntrue\n"), Json::Value(true));
   EXPECT_TRUE(Parsed("7").isInt());
   EXPECT_EQ(Parsed("-9223372036854775808"), Json::Value(Json::Value::minLargestInt));
+  EXPECT_EQ(Parsed("9223372036854775807"), Json::Value(Json::Value::maxLargestInt));
   EXPECT_EQ(Parsed("18446744073709551615"), Json::Value(Json::Value::maxLargestUInt));
   EXPECT_EQ(Parsed("18446744073709551616"), Json::Value(18446744073709551616.0));
   EXPECT_EQ(Parsed("-2.5e-1"), Json::Value(-0.25));
