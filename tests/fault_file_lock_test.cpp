@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <functional>
 #include <memory>
 
 #include "kelodrcore/file_lock.h"
@@ -49,6 +50,19 @@ class FileLockFaultTest : public FaultTest {
     return other.tryLock(kExclusive);
   }
 
+  // A lock is held or not as its answer says.
+  bool Take(FileLock& lock) const {
+    const bool taken = lock.lock(kExclusive, 1);
+    EXPECT_NE(taken, IsFree());
+    return taken;
+  }
+
+  void SweepTaking(const std::function<void()>& prepare, const std::function<bool()>& run) {
+    const auto check = [&](const Outcome& outcome) { CheckTaken(outcome); };
+    SweepCalls({prepare, run, check});
+    SweepMemory({prepare, run, check});
+  }
+
   void CheckTaken(const Outcome& outcome) const;
 
   const std::string name = "fault-test-" + std::to_string(getpid()) + "/lock";
@@ -75,13 +89,9 @@ TEST_F(FileLockFaultTest, ALockIsHeldOrNotGot) {
   const auto prepare = [&] { std::filesystem::remove_all(lockDir); };
   const auto run = [&] {
     FileLock lock(name);
-    const bool taken = lock.lock(kExclusive, 1);
-    EXPECT_NE(taken, IsFree());
-    return taken;
+    return Take(lock);
   };
-  const auto check = [&](const Outcome& outcome) { CheckTaken(outcome); };
-  SweepCalls({prepare, run, check});
-  SweepMemory({prepare, run, check});
+  SweepTaking(prepare, run);
 }
 
 TEST_F(FileLockFaultTest, AReleasedLockIsFreeOrItsFailureTold) {
@@ -113,13 +123,9 @@ TEST_F(FileLockFaultTest, AReusedLockIsHeldOrNotGot) {
       const Fault::Suspension suspension;
       EXPECT_TRUE(lock.tryLock(kExclusive));
     }
-    const bool taken = lock.lock(kExclusive, 1);
-    EXPECT_NE(taken, IsFree());
-    return taken;
+    return Take(lock);
   };
-  const auto check = [&](const Outcome& outcome) { CheckTaken(outcome); };
-  SweepCalls({prepare, run, check});
-  SweepMemory({prepare, run, check});
+  SweepTaking(prepare, run);
 }
 
 TEST_F(FileLockFaultTest, AProbeLeavesTheLockFree) {

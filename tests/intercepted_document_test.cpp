@@ -37,6 +37,17 @@ class InterceptedDocumentTest : public CleanTest {
     EXPECT_EQ(NamesIn(dir), Names{"document"});
   }
 
+  // Before the temporary is locked, it becomes another writer's.
+  void ExpectWrittenAlthoughReplaced() {
+    const Interception other("flock", 1, [&] {
+      EXPECT_EQ(unlink(temporary.c_str()), 0);
+      WriteText(temporary, "half");
+      return kGoOn;
+    });
+    ExpectWritten();
+    EXPECT_TRUE(other.HasRun());
+  }
+
   void ExpectNotWritten(int error) {
     errno = 0;
     EXPECT_FALSE(toFile("new", path));
@@ -147,25 +158,13 @@ TEST_F(InterceptedDocumentTest, APlantedLinkMayBeRemovedBySomebodyElse) {
 // That other writer is dead when its temporary is found.
 TEST_F(InterceptedDocumentTest, APlantedLinkMayHaveBecomeTheTemporaryOfAnotherWriter) {
   ASSERT_EQ(symlink("nowhere", temporary.c_str()), 0);
-  const Interception other("flock", 1, [&] {
-    EXPECT_EQ(unlink(temporary.c_str()), 0);
-    WriteText(temporary, "half");
-    return kGoOn;
-  });
   // Only a leftover is opened for reading alone, and closed again.
-  ExpectWritten();
-  EXPECT_TRUE(other.HasRun());
+  ExpectWrittenAlthoughReplaced();
 }
 
 // Between its creation and its lock, when it looks like a dead writer's.
 TEST_F(InterceptedDocumentTest, AnotherFileUnderItsNameIsNotTheTemporary) {
-  const Interception other("flock", 1, [&] {
-    EXPECT_EQ(unlink(temporary.c_str()), 0);
-    WriteText(temporary, "half");
-    return kGoOn;
-  });
-  ExpectWritten();
-  EXPECT_TRUE(other.HasRun());
+  ExpectWrittenAlthoughReplaced();
 }
 
 // What is mounted over the temporary has its inode number: file systems of this kind count from 1.
