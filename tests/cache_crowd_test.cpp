@@ -112,8 +112,9 @@ TEST_F(CacheCrowdTest, OfManyThatNeedFreshDataOneFetchesAtATime) {
   EXPECT_EQ(outcome.fresh + outcome.old, 64);
   EXPECT_GE(CheckedFetches(), 1);
   EXPECT_EQ(outcome.refreshers, 0);
-  // Only who lost the race for the claim goes on with the old data, and says so.
-  EXPECT_EQ(CountInMirror(ReadFailed()), static_cast<size_t>(outcome.old));
+  // Who loses the race for the claim goes on with the old data, and says so. Nothing is said by who
+  // loads the old document just before it is replaced and looks at its age just after.
+  EXPECT_LE(CountInMirror(ReadFailed()), static_cast<size_t>(outcome.old));
   EXPECT_EQ(MakeCache().Read(), "new");
 }
 
