@@ -9,6 +9,7 @@
 #include <set>
 
 #include "support/clean_test.h"
+#include "support/process.h"
 #include "support/program.h"
 
 namespace {
@@ -262,6 +263,11 @@ TEST_F(DrctlTest, WhatIsNoExportIsNotImported) {
 
 class DrctlCacheTest : public DrctlTest {
  protected:
+  void SetUp() override {
+    DrctlTest::SetUp();
+    if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+  }
+
   Outcome ListCached(const std::vector<std::string>& options = {}) {
     std::vector<std::string> arguments = {DRCTL,    "--verbose", "volume",      "list",
                                           "--json", "--cached",  "--cache-dir", Path("cache")};
