@@ -56,6 +56,8 @@ long long VolumeCache::FileTime() const {
 Json::Value VolumeCache::ReadVolumes(Source& source) {
   isScanned = false;
   Json::Value volumes = Read();
+  // Whoever loses the race for the claim is given what there was; the winner's data come.
+  if (!isScanned && IsTimeout()) volumes = Read();
   const long long fileTime = FileTime();
   if (isScanned) {
     source = Source::kScan;
