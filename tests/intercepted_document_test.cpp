@@ -28,7 +28,11 @@ class InterceptedDocumentTest : public CleanTest {
     CleanTest::SetUp();
     path = Path("document");
     temporary = Path(".document.kelodr-" + std::to_string(geteuid()));
-    umask(022);
+    umaskBefore = umask(022);
+  }
+  void TearDown() override {
+    umask(umaskBefore);
+    CleanTest::TearDown();
   }
 
   void ExpectWritten() {
@@ -62,6 +66,9 @@ class InterceptedDocumentTest : public CleanTest {
 
   std::string path;
   std::string temporary;
+
+ private:
+  mode_t umaskBefore = 0;
 };
 
 TEST_F(InterceptedDocumentTest, AFileThatGrowsWhileItIsReadIsReadToItsEnd) {
