@@ -8,7 +8,11 @@
 
 namespace KeloDRCore {
 
-// Makes a call that answers -1, or null, when it fails, until it does not fail with EINTR.
+// Far more than the signals that interrupt any wait.
+constexpr int kMostInterruptions = 1000000;
+
+// Makes a call that answers -1, or null, when it fails, until it does not fail with EINTR. Where
+// the interruptions do not end, EINTR is a failure like any other: nobody hangs.
 template <typename Call>
 auto Retry(Call call) {
   const auto isFailure = [](auto result) {
@@ -19,7 +23,9 @@ auto Retry(Call call) {
     }
   };
   auto result = call();
-  while (isFailure(result) && errno == EINTR) result = call();
+  for (int i = 0; i < kMostInterruptions && isFailure(result) && errno == EINTR; ++i) {
+    result = call();
+  }
   return result;
 }
 

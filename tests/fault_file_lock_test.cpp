@@ -117,6 +117,16 @@ TEST_F(FileLockFaultTest, AReleasedLockIsFreeOrItsFailureTold) {
   lock.reset();
 }
 
+TEST_F(FileLockFaultTest, InterruptionsWithoutEndAreAFailureToRelease) {
+  FileLock lock(name);
+  ASSERT_TRUE(lock.lock(kExclusive, 1));
+  Fault::Arm({EINTR, 1, Fault::kForGood});
+  lock.unlock();
+  EXPECT_GT(Fault::Disarm(), 1000);
+  EXPECT_EQ(LogCapture::Take().size(), 1U);  // "Failed to unlock"
+  EXPECT_FALSE(IsFree());
+}
+
 TEST_F(FileLockFaultTest, AReusedLockIsHeldOrNotGot) {
   const auto prepare = [] {};
   const auto run = [&] {

@@ -133,6 +133,16 @@ TEST_F(JsonFaultTest, ToFileTakesAPlantedLinkAwayOrFails) {
   SweepMemory(ToFileOver(plant));
 }
 
+TEST_F(JsonFaultTest, InterruptionsWithoutEndAreAFailureToWrite) {
+  WriteText(path, kOld);
+  Fault::Arm({EINTR, 1, Fault::kForGood});
+  EXPECT_FALSE(JsonValue::toFile("new", path));
+  const int error = errno;
+  EXPECT_GT(Fault::Disarm(), 1000);
+  EXPECT_EQ(error, EINTR);
+  EXPECT_EQ(ReadText(path), kOld);
+}
+
 // The bit that lets its owner read it is taken away last.
 TEST_F(JsonFaultTest, ToFileKeepsAFileFromItsOwnerOrFails) {
   if (!IsRoot()) GTEST_SKIP() << "needs root to read what its owner may not";
