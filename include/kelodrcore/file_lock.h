@@ -69,7 +69,7 @@ class KELODR_EXPORT FileLock {
   [[nodiscard]] bool lock(int type, unsigned int timeout);
 
   /// Whether the lock could be taken at this moment: takes it, with a timeout of 0, and releases it
-  /// at once. Never leaves it held.
+  /// at once. Never leaves it held (but on descriptor 0, which `unlock` leaves alone).
   bool tryLock(int type);
 
   /// Releases the lock and keeps the file open. Descriptor 0 is deliberately left alone.

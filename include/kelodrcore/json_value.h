@@ -40,8 +40,8 @@ KELODR_EXPORT bool fromFile(Json::Value& value, const std::string& path);
 /// the file that it names is replaced, or created, and the link stays.
 ///
 /// Writers of one file wait for each other, a minute at most (`EBUSY`); each leaves its whole
-/// document. Killed writers leave at most one temporary (".NAME.kelodr-UID", a long NAME cut; UID
-/// is the writer's effective user id), which the next write removes.
+/// document. Killed writers of one user leave at most one temporary (".NAME.kelodr-UID", a long
+/// NAME cut; UID is the writer's effective user id), which that user's next write removes.
 ///
 /// True once the document is on the disk. False with `errno` telling why, and with the old document
 /// in place: no such directory, a path that names something other than a regular file, an owner

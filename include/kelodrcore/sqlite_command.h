@@ -153,7 +153,8 @@ class KELODR_EXPORT SelectCommand : public SqliteCommand {
   /// Sorts ascending.
   void SetOrderByASC();
 
-  /// Sorts descending, which is the default; one direction applies to all order fields.
+  /// Sorts descending, which is the default. One direction is written, after the last order field;
+  /// SQLite applies it to that field, and sorts by those before it in ascending order.
   void SetOrderByDESC();
 
   /// Skips `first` rows and reads at most `count`. False, with nothing changed, for a `first` below
