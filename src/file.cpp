@@ -60,21 +60,13 @@ class InputFile {
   std::istream lines;
 };
 
-// fgets, except that an interrupted read is taken up again: fgets loses what it has read when a
-// signal handler returns into it.
+// fgets, except that an interrupted read is taken up again.
 template <int kSize>
 bool ReadChunk(FILE* stream, char (&chunk)[kSize]) {
   int length = 0;
-  int byte = EOF;
-  while (length < kSize - 1 && byte != '\n') {
-    byte = getc(stream);
-    if (byte != EOF) {
-      chunk[length++] = static_cast<char>(byte);
-    } else if (ferror(stream) != 0 && errno == EINTR) {
-      clearerr(stream);
-    } else {
-      break;
-    }
+  int byte = 0;
+  while (length < kSize - 1 && byte != '\n' && (byte = GetByte(stream)) != EOF) {
+    chunk[length++] = static_cast<char>(byte);
   }
   chunk[length] = '\0';
   return length > 0;

@@ -4,6 +4,7 @@
 #define KELODRCORE_SRC_RETRY_H_
 
 #include <cerrno>
+#include <cstdio>
 #include <type_traits>
 
 namespace KeloDRCore {
@@ -27,6 +28,18 @@ auto Retry(Call call) {
     result = call();
   }
   return result;
+}
+
+// getc, which getline and fgets cannot stand in for: they lose what they have read when a signal
+// handler returns into them.
+inline int GetByte(FILE* stream) {
+  int byte = getc(stream);
+  for (int i = 0; i < kMostInterruptions && byte == EOF; ++i) {
+    if (ferror(stream) == 0 || errno != EINTR) break;
+    clearerr(stream);
+    byte = getc(stream);
+  }
+  return byte;
 }
 
 }  // namespace KeloDRCore

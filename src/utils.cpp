@@ -3,12 +3,12 @@
 #include <stdio.h>
 #include <unistd.h>
 
-#include <cstdlib>
 #include <memory>
 
 #include "kelocore.h"
 #include "kelorandom.h"
 #include "log.h"
+#include "retry.h"
 
 namespace KeloDRCore {
 
@@ -30,13 +30,14 @@ std::string GenerateUUID() {
     KELODR_LOG(ERR, __func__, "Failed to exec the command [%s].", kCommand);
     return "";
   }
-  char* line = nullptr;
-  size_t capacity = 0;
-  const bool isRead = getline(&line, &capacity, output.get()) != -1;
-  const std::unique_ptr<char, void (*)(void*)> owner(line, free);
-  if (!isRead) return "";
-  KLIBCStrTrim(line, nullptr, nullptr);
-  return line;
+  std::string line;
+  FILE* const stream = output.get();
+  for (int byte = GetByte(stream); byte != EOF && byte != '\n'; byte = GetByte(stream)) {
+    line += static_cast<char>(byte);
+  }
+  if (ferror(stream) != 0) return "";  // the start of a UUID is none
+  KLIBCStrTrim(line.data(), nullptr, nullptr);
+  return line.c_str();  // which the trimming has shortened
 }
 
 }  // namespace KeloDRCore

@@ -211,6 +211,25 @@ TEST_F(GenerateUUIDTest, ALongLineIsReadWhole) {
   ExpectOutput("head -c 10000 /dev/zero | tr '\\0' x", std::string(10000, 'x'));
 }
 
+TEST_F(GenerateUUIDTest, ASignalDoesNotCutTheTextShort) {
+  // Signals the caller once it sleeps; it is awake when kill has returned.
+  const std::string interrupt =
+      "while ! grep -q '^State:.S' /proc/$caller/status; do :; done; kill -USR1 $caller\n";
+  const std::string script = "read caller <" + Path("caller") + "\n" + interrupt + "printf a\n" +
+                             interrupt + interrupt + "echo b\n" + interrupt;
+  if (!RunWithScript(kTool, script, [&] {
+        static volatile sig_atomic_t signals = 0;
+        struct sigaction action = {};
+        action.sa_handler = [](int) { signals = signals + 1; };
+        ASSERT_EQ(sigaction(SIGUSR1, &action, nullptr), 0);
+        WriteText(Path("caller"), std::to_string(getpid()) + "\n");
+        EXPECT_EQ(GenerateUUID(), "ab");
+        EXPECT_EQ(signals, 4);
+      })) {
+    GTEST_SKIP() << "needs root, to put another tool in place";
+  }
+}
+
 TEST_F(GenerateUUIDTest, TheToolIsWaitedFor) {
   if (!RunWithScript(kTool, "echo abc; exec >&-; : > '" + Path("done") + "'", [this] {
         EXPECT_EQ(GenerateUUID(), "abc");

@@ -151,8 +151,6 @@ FAULT_CALL(void*, newlocale, nullptr, (int mask, const char* name, void* base), 
 // Streams.
 FAULT_CALL(FILE*, fdopen, nullptr, (int fd, const char* mode), (fd, mode), EMFILE, ENOMEM)
 FAULT_CALL(int, getc, FailStream(stream), (FILE * stream), (stream), EINTR, EIO)
-FAULT_CALL(ssize_t, getline, FailStream(stream), (char** line, size_t* size, FILE* stream),
-           (line, size, stream), EINTR, EIO, ENOMEM)
 FAULT_CALL(int, fflush, FailStream(stream), (FILE * stream), (stream), EINTR, EIO, ENOSPC)
 FAULT_CALL(int, fclose, (Next<int(FILE*)>("fclose")(stream), errno = EIO, EOF), (FILE * stream),
            (stream), EIO)
