@@ -9,11 +9,14 @@
 
 namespace KeloDRCore {
 
-// Far more than the signals that interrupt any wait.
-constexpr int kMostInterruptions = 1000000;
+// Whether a call that has just failed, after so many interruptions, is to be made again. Where they
+// do not end, EINTR is a failure like any other: nobody hangs.
+inline bool IsInterrupted(int before) {
+  constexpr int kMost = 1000000;  // far more than the signals that interrupt any wait
+  return errno == EINTR && before < kMost;
+}
 
-// Makes a call that answers -1, or null, when it fails, until it does not fail with EINTR. Where
-// the interruptions do not end, EINTR is a failure like any other: nobody hangs.
+// Makes a call that answers -1, or null, when it fails, until it does not fail with EINTR.
 template <typename Call>
 auto Retry(Call call) {
   const auto isFailure = [](auto result) {
@@ -24,9 +27,7 @@ auto Retry(Call call) {
     }
   };
   auto result = call();
-  for (int i = 0; i < kMostInterruptions && isFailure(result) && errno == EINTR; ++i) {
-    result = call();
-  }
+  for (int i = 0; isFailure(result) && IsInterrupted(i); ++i) result = call();
   return result;
 }
 
@@ -34,8 +35,7 @@ auto Retry(Call call) {
 // handler returns into them.
 inline int GetByte(FILE* stream) {
   int byte = getc(stream);
-  for (int i = 0; i < kMostInterruptions && byte == EOF; ++i) {
-    if (ferror(stream) == 0 || errno != EINTR) break;
+  for (int i = 0; byte == EOF && ferror(stream) != 0 && IsInterrupted(i); ++i) {
     clearerr(stream);
     byte = getc(stream);
   }
