@@ -14,13 +14,13 @@
 #include <cstring>
 #include <string_view>
 
-#include "descriptor.h"
-#include "retry.h"
+#include "posix/descriptor.h"
+#include "posix/retry.h"
 
 namespace {
 
-using KeloDRCore::Descriptor;
-using KeloDRCore::Retry;
+using KeloDRCore::Posix::Descriptor;
+using KeloDRCore::Posix::Retry;
 
 constexpr char kWhiteSpace[] = " \t\n\r\v\f";
 

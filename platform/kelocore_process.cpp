@@ -14,14 +14,14 @@
 #include <utility>
 #include <vector>
 
-#include "descriptor.h"
 #include "kelocore.h"
-#include "retry.h"
+#include "posix/descriptor.h"
+#include "posix/retry.h"
 
 namespace {
 
-using KeloDRCore::Descriptor;
-using KeloDRCore::Retry;
+using KeloDRCore::Posix::Descriptor;
+using KeloDRCore::Posix::Retry;
 
 constexpr int kFirstFreeDescriptor = STDERR_FILENO + 1;
 

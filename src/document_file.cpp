@@ -22,14 +22,14 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <optional>
 #include <utility>
 
-#include "descriptor.h"
-#include "retry.h"
+#include "posix/descriptor.h"
+#include "posix/file_io.h"
+#include "posix/retry.h"
 
 namespace KeloDRCore {
 namespace {
@@ -38,26 +38,16 @@ constexpr int kMaxLinks = 40;                // as many as the kernel follows
 constexpr int kMaxAttempts = 60000;          // a minute of pauses
 constexpr useconds_t kPause = 1000;          // microseconds
 constexpr size_t kMaxNameInTemporary = 100;  // some file systems allow 143 bytes a name
-constexpr size_t kSmallestRead = 4096;
 constexpr mode_t kPermissionBits = 07777;
 
-bool Fail(int error) {
-  errno = error;
-  return false;
-}
+using Posix::Descriptor;
+using Posix::Fail;
+using Posix::IsSameFile;
+using Posix::OpenAt;
+using Posix::Retry;
+using Posix::StatAt;
 
-Descriptor OpenAt(int directory, const std::string& name, int flags, mode_t mode = 0) {
-  return Descriptor(
-      Retry([&] { return openat(directory, name.c_str(), flags | O_CLOEXEC, mode); }));
-}
-
-bool StatAt(int directory, const std::string& name, int flags, struct stat& found) {
-  return Retry([&] { return fstatat(directory, name.c_str(), &found, flags); }) == 0;
-}
-
-bool StatFile(const Descriptor& file, struct stat& found) {
-  return Retry([&] { return fstat(file.Get(), &found); }) == 0;
-}
+bool StatFile(const Descriptor& file, struct stat& found) { return Posix::Stat(file.Get(), found); }
 
 bool UnlinkAt(int directory, const std::string& name) {
   return Retry([&] { return unlinkat(directory, name.c_str(), 0); }) == 0 || errno == ENOENT;
@@ -81,38 +71,6 @@ bool SetMode(const Descriptor& file, mode_t mode) {
 
 bool SetOwner(const Descriptor& file, uid_t uid, gid_t gid) {
   return Retry([&] { return fchown(file.Get(), uid, gid); }) == 0;
-}
-
-bool WriteAll(const Descriptor& file, const std::string& text) {
-  size_t done = 0;
-  while (done < text.size()) {
-    const ssize_t count =
-        Retry([&] { return write(file.Get(), text.data() + done, text.size() - done); });
-    if (count < 0) return false;
-    if (count == 0) return Fail(EIO);
-    done += static_cast<size_t>(count);
-  }
-  return true;
-}
-
-bool ReadAll(const Descriptor& file, size_t expected, std::string& text) {
-  size_t done = 0;
-  // The byte more finds the end without growing; files of /proc give a size of 0, and some of them
-  // their content to the first read only.
-  text.resize(std::max(expected + 1, kSmallestRead));
-  while (true) {
-    const ssize_t count = Retry([&] { return read(file.Get(), &text[done], text.size() - done); });
-    if (count < 0) return false;
-    if (count == 0) break;
-    done += static_cast<size_t>(count);
-    if (done < text.size()) continue;
-    // The file has grown since it was looked at, or lies in /proc. Twice the text is too much for a
-    // string beyond a gibibyte on 32 bits, and beyond any memory elsewhere.
-    if (text.size() > text.max_size() / 2) return Fail(EFBIG);  // GCOVR_EXCL_BR_LINE
-    text.resize(2 * text.size());
-  }
-  text.resize(done);
-  return true;
 }
 
 // C strings end at the first NUL byte: such a path would name another file.
@@ -171,10 +129,6 @@ std::string TemporaryName(const std::string& name) {
     while (length > 1 && (static_cast<unsigned char>(name[length]) & 0xC0) == 0x80) --length;
   }
   return "." + name.substr(0, length) + ".kelodr-" + std::to_string(geteuid());
-}
-
-bool IsSameFile(const struct stat& one, const struct stat& other) {
-  return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
 // The temporary of one writer: from Claim() to Publish() it is locked and under its name; if
@@ -316,7 +270,7 @@ bool Replace(const Place& place, const std::string& text) {
   // While this writer waited for another, the file may have come into being, or changed.
   if (!LookAt(place.directory.Get(), place.name, AT_SYMLINK_NOFOLLOW, old)) return false;
   if (!old) old = before;
-  if (!WriteAll(temporary.File(), text)) return false;
+  if (!Posix::WriteAll(temporary.File().Get(), text)) return false;
   if (old && !TakeOver(temporary.File(), *old)) return false;
   if (!Sync(temporary.File()) || !temporary.Publish()) return false;
   return TakeReadBit(temporary.File(), old) && Sync(place.directory);
@@ -326,12 +280,11 @@ bool Replace(const Place& place, const std::string& text) {
 
 bool ReadDocumentFile(const std::string& path, std::string& text) {
   if (!IsPath(path)) return Fail(EINVAL);
-  const Descriptor file = OpenAt(AT_FDCWD, path, O_RDONLY | O_NONBLOCK);
+  const Descriptor file = Posix::Open(path, O_RDONLY | Posix::kHarmless);
   struct stat found = {};
   if (!file.IsOpen() || !StatFile(file, found)) return false;
   if (!S_ISREG(found.st_mode)) return Fail(EINVAL);
-  if (static_cast<unsigned long long>(found.st_size) >= text.max_size()) return Fail(EFBIG);
-  return ReadAll(file, static_cast<size_t>(found.st_size), text);
+  return Posix::ReadAll(file.Get(), text);
 }
 
 bool ReplaceDocumentFile(const std::string& path, const std::string& text) {

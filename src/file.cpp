@@ -20,8 +20,8 @@
 #include "kelocore.h"
 #include "kelodrcore/json_value.h"
 #include "log.h"
+#include "posix/retry.h"
 #include "privilege.h"
-#include "retry.h"
 
 namespace KeloDRCore::File {
 namespace {
@@ -35,7 +35,7 @@ using Stream = std::unique_ptr<FILE, StreamCloser>;
 class InputFile {
  public:
   explicit InputFile(const std::string& path)
-      : fd(Retry([&] { return open(path.c_str(), O_RDONLY | O_CLOEXEC); })),
+      : fd(Posix::Retry([&] { return open(path.c_str(), O_RDONLY | O_CLOEXEC); })),
         buffer(fd, std::ios::in),
         lines(&buffer) {
     // A buffer without a stream (no memory for one) does not own the descriptor.
@@ -65,7 +65,7 @@ template <int kSize>
 bool ReadChunk(FILE* stream, char (&chunk)[kSize]) {
   int length = 0;
   int byte = 0;
-  while (length < kSize - 1 && byte != '\n' && (byte = GetByte(stream)) != EOF) {
+  while (length < kSize - 1 && byte != '\n' && (byte = Posix::GetByte(stream)) != EOF) {
     chunk[length++] = static_cast<char>(byte);
   }
   chunk[length] = '\0';
@@ -79,7 +79,8 @@ WriteResult WriteAndSync(FILE* stream, int fd, const Json::Value& value) {
     return WriteResult::kWriteFailed;
   }
   if (fflush(stream) != 0) return WriteResult::kFlushFailed;
-  return Retry([&] { return fsync(fd); }) == 0 ? WriteResult::kDone : WriteResult::kSyncFailed;
+  return Posix::Retry([&] { return fsync(fd); }) == 0 ? WriteResult::kDone
+                                                      : WriteResult::kSyncFailed;
 }
 
 }  // namespace
@@ -121,7 +122,7 @@ bool Write(const std::string& path, const Json::Value& value) {
     KELODR_LOG(ERR, __func__, "%s", "Empty path to write.");
     return false;
   }
-  const Stream stream(Retry([&] { return fopen(path.c_str(), "we"); }));
+  const Stream stream(Posix::Retry([&] { return fopen(path.c_str(), "we"); }));
   if (!stream) {
     KELODR_LOG(ERR, __func__, "Failed to open file [%s]", path.c_str());
     return false;

@@ -9,8 +9,8 @@
 
 #include "kelodrcore/file.h"
 #include "log.h"
+#include "posix/retry.h"
 #include "privilege.h"
-#include "retry.h"
 
 namespace KeloDRCore {
 namespace {
@@ -90,7 +90,7 @@ bool FileLock::openLockedFile() {
   if (File::IsRegularFile(fd) && IsFileAt(path, fd)) return true;
 
   if (fd >= 0) close(fd);
-  fd = Retry([&] {
+  fd = Posix::Retry([&] {
     return open(path.c_str(), O_RDONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, kLockFileMode);
   });
   if (fd < 0) {
@@ -130,7 +130,7 @@ bool FileLock::tryLock(int type) {
 
 void FileLock::unlock() const {
   KELODR_PRIVILEGED();
-  if (fd > 0 && Retry([this] { return flock(fd, LOCK_UN); }) < 0) {
+  if (fd > 0 && Posix::Retry([this] { return flock(fd, LOCK_UN); }) < 0) {
     KELODR_LOG(ERR, __func__, "Failed to unlock [%s] with fd [%d], errno=[%m]", path.c_str(), fd);
   }
 }

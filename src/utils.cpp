@@ -8,7 +8,7 @@
 #include "kelocore.h"
 #include "kelorandom.h"
 #include "log.h"
-#include "retry.h"
+#include "posix/retry.h"
 
 namespace KeloDRCore {
 
@@ -32,7 +32,8 @@ std::string GenerateUUID() {
   }
   std::string line;
   FILE* const stream = output.get();
-  for (int byte = GetByte(stream); byte != EOF && byte != '\n'; byte = GetByte(stream)) {
+  for (int byte = Posix::GetByte(stream); byte != EOF && byte != '\n';
+       byte = Posix::GetByte(stream)) {
     line += static_cast<char>(byte);
   }
   if (ferror(stream) != 0) return "";  // the start of a UUID is none

@@ -1,14 +1,14 @@
 // A file descriptor that closes itself.
 
-#ifndef KELODRCORE_SRC_DESCRIPTOR_H_
-#define KELODRCORE_SRC_DESCRIPTOR_H_
+#ifndef KELODRCORE_POSIX_DESCRIPTOR_H_
+#define KELODRCORE_POSIX_DESCRIPTOR_H_
 
 #include <unistd.h>
 
 #include <cerrno>
 #include <utility>
 
-namespace KeloDRCore {
+namespace KeloDRCore::Posix {
 
 // Owns a descriptor, or none (-1). Closing it leaves errno alone, so that failure paths need not
 // save it.
@@ -36,6 +36,6 @@ class Descriptor {
   int fd = -1;
 };
 
-}  // namespace KeloDRCore
+}  // namespace KeloDRCore::Posix
 
-#endif  // KELODRCORE_SRC_DESCRIPTOR_H_
+#endif  // KELODRCORE_POSIX_DESCRIPTOR_H_

@@ -1,13 +1,13 @@
 // The one rule for calls that a signal interrupts: they are made again.
 
-#ifndef KELODRCORE_SRC_RETRY_H_
-#define KELODRCORE_SRC_RETRY_H_
+#ifndef KELODRCORE_POSIX_RETRY_H_
+#define KELODRCORE_POSIX_RETRY_H_
 
 #include <cerrno>
 #include <cstdio>
 #include <type_traits>
 
-namespace KeloDRCore {
+namespace KeloDRCore::Posix {
 
 // Whether a call that has just failed, after so many interruptions, is to be made again. Where they
 // do not end, EINTR is a failure like any other: nobody hangs.
@@ -42,6 +42,6 @@ inline int GetByte(FILE* stream) {
   return byte;
 }
 
-}  // namespace KeloDRCore
+}  // namespace KeloDRCore::Posix
 
-#endif  // KELODRCORE_SRC_RETRY_H_
+#endif  // KELODRCORE_POSIX_RETRY_H_

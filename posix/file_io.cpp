@@ -1,0 +1,78 @@
+#include "posix/file_io.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "posix/retry.h"
+
+namespace KeloDRCore::Posix {
+
+bool Fail(int error) {
+  errno = error;
+  return false;
+}
+
+Descriptor OpenAt(int directory, const std::string& path, int flags, mode_t mode) {
+  return Descriptor(
+      Retry([&] { return openat(directory, path.c_str(), flags | O_CLOEXEC, mode); }));
+}
+
+Descriptor Open(const std::string& path, int flags, mode_t mode) {
+  return OpenAt(AT_FDCWD, path, flags, mode);
+}
+
+bool Stat(int fd, struct stat& found) {
+  return Retry([&] { return fstat(fd, &found); }) == 0;
+}
+
+bool StatAt(int directory, const std::string& path, int flags, struct stat& found) {
+  return Retry([&] { return fstatat(directory, path.c_str(), &found, flags); }) == 0;
+}
+
+bool IsSameFile(const struct stat& one, const struct stat& other) {
+  return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
+bool HasName(int fd, const std::string& path) {
+  struct stat open = {};
+  struct stat named = {};
+  return Stat(fd, open) && StatAt(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, named) &&
+         IsSameFile(open, named);
+}
+
+bool ReadAll(int fd, std::string& text, size_t limit) {
+  // Files of /proc give a size of 0, and some of them their content to the first read only.
+  constexpr size_t kSmallestRead = 4096;
+  struct stat found = {};
+  if (!Stat(fd, found)) return false;
+  const auto size = static_cast<unsigned long long>(found.st_size);
+  if (size >= text.max_size() / 2) return Fail(EFBIG);
+  // The byte more finds the end without growing.
+  text.resize(std::min(limit, std::max(static_cast<size_t>(size) + 1, kSmallestRead)));
+  size_t done = 0;
+  while (done < limit) {
+    const ssize_t count = Retry([&] { return read(fd, &text[done], text.size() - done); });
+    if (count < 0) return false;
+    if (count == 0) break;
+    done += static_cast<size_t>(count);
+    if (done < text.size()) continue;
+    if (text.size() > text.max_size() / 2) return Fail(EFBIG);
+    text.resize(std::min(limit, 2 * text.size()));
+  }
+  text.resize(done);
+  return true;
+}
+
+bool WriteAll(int fd, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t count = Retry([&] { return write(fd, text.data(), text.size()); });
+    if (count < 0) return false;
+    if (count == 0) return Fail(EIO);
+    text.remove_prefix(static_cast<size_t>(count));
+  }
+  return true;
+}
+
+}  // namespace KeloDRCore::Posix
