@@ -2,9 +2,9 @@
 
 #include <utility>
 
-#include "field_setter.h"
 #include "kelodrcore/container.h"
 #include "log.h"
+#include "value_access.h"
 
 namespace KeloDRCore {
 namespace {
@@ -22,7 +22,7 @@ bool AddField(SqliteValueList& list, const std::string& field, const T& value) {
                SqliteValue(value).ToFormatedValue().c_str());
     return false;
   }
-  FieldSetter::Set(list, field, value);
+  ValueAccess::SetField(list, field, value);
   return true;
 }
 
@@ -44,7 +44,7 @@ void AppendAssignments(std::string& text, const SqliteValueList& list) {
     isFirst = false;
     text += field;
     text += '=';
-    value.AppendFormatedValue(text);
+    ValueAccess::AppendLiteral(text, value);
   }
 }
 
@@ -90,7 +90,7 @@ void AppendInsertValues(std::string& text, const SqliteValueList& list) {
   start = text.size();
   for (const auto& entry : list.GetValues()) {
     if (text.size() != start) text += ',';
-    entry.second.AppendFormatedValue(text);
+    ValueAccess::AppendLiteral(text, entry.second);
   }
   text += ')';
 }

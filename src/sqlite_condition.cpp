@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "log.h"
+#include "value_access.h"
 
 namespace KeloDRCore {
 namespace {
@@ -20,7 +21,7 @@ bool SetComparison(std::string& text, const std::string& lvalue, const char* com
     return false;
   }
   std::string rendered = lvalue + comparison;
-  value.AppendFormatedValue(rendered);
+  ValueAccess::AppendLiteral(rendered, value);
   text = std::move(rendered);
   return true;
 }
@@ -127,7 +128,7 @@ bool SqliteInFamily::SetValue(const std::string& lvalue, const std::vector<Sqlit
     }
     if (!isFirst) rendered += ',';
     isFirst = false;
-    value.AppendFormatedValue(rendered);
+    ValueAccess::AppendLiteral(rendered, value);
   }
   text = std::move(rendered += " )");
   return true;

@@ -7,12 +7,12 @@
 #include <optional>
 #include <utility>
 
-#include "field_setter.h"
 #include "kelocore.h"
 #include "kelodrcore/err.h"
 #include "kelodrcore/json_value.h"
 #include "kelodrcore/utils.h"
 #include "log.h"
+#include "value_access.h"
 
 namespace KeloDRCore {
 namespace {
@@ -106,7 +106,7 @@ class RowReader {
     if (name.empty()) {
       record.AddValue(name, payload);  // refuses and logs
     } else {
-      FieldSetter::Set(record, name, payload);
+      ValueAccess::SetField(record, name, payload);
     }
   }
 

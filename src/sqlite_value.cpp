@@ -1,15 +1,12 @@
 #include "kelodrcore/sqlite_value.h"
 
-#include <endian.h>
-
-#include <algorithm>
-#include <charconv>
 #include <cstdint>
 #include <cstring>
 #include <utility>
 
 #include "kelodrcore/json_value.h"
 #include "log.h"
+#include "value_access.h"
 
 namespace KeloDRCore {
 namespace {
@@ -21,86 +18,18 @@ Json::Value ToJson(unsigned long long number) {
   return Json::Value(static_cast<Json::UInt64>(number));
 }
 
-// Quotes are rare when there is less than one in so many bytes.
-constexpr size_t kRare = 64;
-
-// In blocks whose count fits a byte, so that the compiler can take many bytes at a time.
-size_t CountQuotes(const char* at, const char* end) {
-  size_t count = 0;
-  while (at != end) {
-    const char* const stop = at + std::min<std::ptrdiff_t>(end - at, 255);
-    unsigned char inBlock = 0;
-    for (; at != stop; ++at) inBlock = static_cast<unsigned char>(inBlock + (*at == '\''));
-    count += inBlock;
-  }
-  return count;
-}
-
-// Run by run, for texts in which quotes are rare.
-char* CopyRuns(const char* at, const char* end, char* out) {
-  while (const void* const found = std::memchr(at, '\'', static_cast<size_t>(end - at))) {
-    const char* const next = static_cast<const char*>(found) + 1;
-    out = std::copy(at, next, out);
-    *out++ = '\'';
+// Doubles each quote, byte for byte as replacing with a regular expression would.
+void AppendQuoted(std::string& text, const char* at, const char* end) {
+  text.reserve(text.size() + static_cast<size_t>(end - at) + 2);
+  text += '\'';
+  while (const void* const quote = std::memchr(at, '\'', static_cast<size_t>(end - at))) {
+    const char* const next = static_cast<const char*>(quote) + 1;
+    text.append(at, next);
+    text += '\'';
     at = next;
   }
-  return std::copy(at, end, out);
-}
-
-// Eight bytes at a time: all eight are copied, and those from a quote on once more, a byte farther.
-// `out` has room for the result. What is written beyond that of one word is overwritten by the next
-// word's, so the last words go byte by byte.
-char* CopyWords(const char* at, const char* end, char* out) {
-  constexpr uint64_t kLowBits = 0x7F7F7F7F7F7F7F7F;
-  constexpr uint64_t kQuotes = 0x2727272727272727;
-  constexpr std::ptrdiff_t kWord = sizeof(uint64_t);
-  for (; end - at >= 2 * kWord; at += kWord, out += kWord) {
-    uint64_t word = 0;
-    std::memcpy(&word, at, kWord);
-    std::memcpy(out, &word, kWord);
-    word = le64toh(word);
-    const uint64_t other = word ^ kQuotes;
-    uint64_t quotes = ~(((other & kLowBits) + kLowBits) | other | kLowBits);  // their high bits
-    for (; quotes != 0; quotes &= quotes - 1) {
-      const int place = __builtin_ctzll(quotes) / 8;
-      const uint64_t rest = htole64(word >> (8 * place));
-      ++out;
-      std::memcpy(out + place, &rest, kWord);
-    }
-  }
-  for (; at != end; ++at) {
-    *out++ = *at;
-    if (*at == '\'') *out++ = '\'';
-  }
-  return out;
-}
-
-// Doubles each quote, byte for byte as a regular expression would; two passes over the bytes cost a
-// small part of it.
-void AppendQuoted(std::string& text, const char* begin, const char* end) {
-  const auto length = static_cast<size_t>(end - begin);
-  const void* const first = std::memchr(begin, '\'', length);
-  if (first == nullptr) {
-    text.reserve(text.size() + length + 2);
-    text += '\'';
-    text.append(begin, length);
-    text += '\'';
-    return;
-  }
-  const size_t quotes = CountQuotes(static_cast<const char*>(first), end);
-  const size_t start = text.size();
-  text.resize(start + length + quotes + 2);
-  char* out = &text[start];
-  *out++ = '\'';
-  out = quotes * kRare < length ? CopyRuns(begin, end, out) : CopyWords(begin, end, out);
-  *out = '\'';
-}
-
-template <typename Integer>
-void AppendDecimal(std::string& text, Integer number) {
-  char digits[24];
-  const char* const end = std::to_chars(digits, digits + sizeof(digits), number).ptr;
-  text.append(digits, static_cast<size_t>(end - digits));
+  text.append(at, end);
+  text += '\'';
 }
 
 // Convert: true and `out` written when the payload can be read as that type.
@@ -218,23 +147,23 @@ bool SqliteValue::IsValid() const {
 
 std::string SqliteValue::ToFormatedValue() const {
   std::string text;
-  AppendFormatedValue(text);
+  ValueAccess::AppendLiteral(text, *this);
   return text;
 }
 
-void SqliteValue::AppendFormatedValue(std::string& text) const {
-  const Json::ValueType type = value.type();
-  if (type == Json::stringValue) {
+void ValueAccess::AppendLiteral(std::string& text, const SqliteValue& value) {
+  const Json::Value& payload = value.value;
+  if (payload.isString()) {
     const char* begin = nullptr;
     const char* end = nullptr;
-    value.getString(&begin, &end);
+    payload.getString(&begin, &end);
     AppendQuoted(text, begin, end);
-  } else if (type == Json::booleanValue) {
-    text += value.asBool() ? '1' : '0';
-  } else if (value.isInt()) {
-    AppendDecimal(text, value.asLargestInt());
-  } else if (value.isUInt()) {
-    AppendDecimal(text, value.asLargestUInt());
+  } else if (payload.isBool()) {
+    text += payload.asBool() ? '1' : '0';
+  } else if (payload.isInt()) {
+    text += std::to_string(payload.asInt());
+  } else if (payload.isUInt()) {
+    text += std::to_string(payload.asUInt());
   }
 }
 
@@ -306,7 +235,7 @@ std::string SqliteValueList::ToStr() const {
     if (!text.empty()) text += ", ";
     text += field;
     text += ':';
-    fieldValue.AppendFormatedValue(text);
+    ValueAccess::AppendLiteral(text, fieldValue);
   }
   return text;
 }

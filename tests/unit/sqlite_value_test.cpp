@@ -185,14 +185,6 @@ TEST_F(SqliteValueTest, ANullPointerIsNoValue) {
   EXPECT_FALSE(value.IsValid()) << "assigning does not make it valid";
 }
 
-TEST_F(SqliteValueTest, AppendingGivesTheSameLiteral) {
-  std::string text = "x=";
-  SqliteValue("a'b").AppendFormatedValue(text);
-  SqliteValue(-7).AppendFormatedValue(text);
-  SqliteValue().AppendFormatedValue(text);
-  EXPECT_EQ(text, "x='a''b'-7");
-}
-
 TEST_F(SqliteValueTest, CopyingCopiesPayloadAndValidity) {
   const SqliteValue valid(5);
   const SqliteValue copy(valid);
