@@ -14,6 +14,11 @@ bool Fail(int error) {
   return false;
 }
 
+std::string DirectoryOf(const std::string& path) {
+  const size_t slash = path.rfind('/');
+  return slash == std::string::npos ? "." : path.substr(0, slash + 1);
+}
+
 Descriptor OpenAt(int directory, const std::string& path, int flags, mode_t mode) {
   return Descriptor(
       Retry([&] { return openat(directory, path.c_str(), flags | O_CLOEXEC, mode); }));

@@ -23,6 +23,9 @@ constexpr int kHarmless = O_NONBLOCK | O_NOCTTY;
 // Sets errno for a failure that no call reports.
 bool Fail(int error);
 
+// The directory of the file at `path`: "a/" of "a/b", "." of "b".
+std::string DirectoryOf(const std::string& path);
+
 // A relative `path` begins at the open directory.
 Descriptor OpenAt(int directory, const std::string& path, int flags, mode_t mode = 0);
 Descriptor Open(const std::string& path, int flags, mode_t mode = 0);

@@ -27,9 +27,11 @@
 #include <optional>
 #include <utility>
 
+#include "kelodrcore/json_value.h"
 #include "posix/descriptor.h"
 #include "posix/file_io.h"
 #include "posix/retry.h"
+#include "posix/trust.h"
 
 namespace KeloDRCore {
 namespace {
@@ -78,17 +80,6 @@ bool IsPath(const std::string& path) {
   return !path.empty() && path.find('\0') == std::string::npos;
 }
 
-// The state of a document's file; `state` comes in empty and stays so when there is none. False for
-// anything but a regular file: a device or a queue must not be replaced by a file.
-using State = std::optional<struct stat>;
-bool LookAt(int directory, const std::string& name, int flags, State& state) {
-  struct stat found = {};
-  if (!StatAt(directory, name, flags, found)) return errno == ENOENT;
-  if (!S_ISREG(found.st_mode)) return Fail(S_ISDIR(found.st_mode) ? EISDIR : EINVAL);
-  state = found;
-  return true;
-}
-
 // Where a document's file is: an open directory and the name in it, links followed.
 struct Place {
   Descriptor directory;
@@ -104,22 +95,43 @@ bool ReadLink(const Place& place, std::string& target) {
   return true;
 }
 
-bool Locate(std::string path, Place& place) {
+// The place at the end of the links that begin with `path`, or of `path` itself.
+bool Locate(std::string path, Whose whose, Place& place) {
   int base = AT_FDCWD;
   for (int link = 0; link <= kMaxLinks; ++link) {
-    const size_t slash = path.rfind('/');
-    std::string parent = path.substr(0, slash + 1);  // nothing where there is no slash
-    if (parent.empty()) parent = ".";
-    Descriptor directory = OpenAt(base, parent, O_RDONLY | O_DIRECTORY);
+    Descriptor directory = OpenAt(base, Posix::DirectoryOf(path), O_RDONLY | O_DIRECTORY);
     if (!directory.IsOpen()) return false;
     place.directory = std::move(directory);
-    place.name = path.substr(slash + 1);
+    place.name = path.substr(path.rfind('/') + 1);
     if (place.name.empty()) return Fail(EISDIR);
+    if (whose == Whose::kBelieved) return true;
     if (!ReadLink(place, path)) return errno == EINVAL || errno == ENOENT;
     base = place.directory.Get();
   }
   // Only links that became a loop just now: the kernel refused any other before.
   return Fail(ELOOP);
+}
+
+// The state of the file that the new one takes its owner and mode from; `state` comes in empty and
+// stays so when there is none. False for what must not be replaced by a file.
+using State = std::optional<struct stat>;
+bool LookAt(const Place& place, Whose whose, State& state) {
+  struct stat found = {};
+  const int directory = place.directory.Get();
+  if (!StatAt(directory, place.name, AT_SYMLINK_NOFOLLOW, found)) return errno == ENOENT;
+  if (S_ISDIR(found.st_mode)) return Fail(EISDIR);
+  if (whose == Whose::kBelieved && !Posix::IsBelieved(found, directory)) return true;
+  if (!S_ISREG(found.st_mode)) return Fail(EINVAL);
+  state = found;
+  return true;
+}
+
+// The kernel looks first: it refuses what is not to be replaced before anything is touched, and
+// links that it would not follow itself.
+bool IsReplaceable(const std::string& path) {
+  struct stat found = {};
+  if (!StatAt(AT_FDCWD, path, 0, found)) return errno == ENOENT;
+  return S_ISREG(found.st_mode) || Fail(S_ISDIR(found.st_mode) ? EISDIR : EINVAL);
 }
 
 std::string TemporaryName(const std::string& name) {
@@ -261,14 +273,14 @@ bool TakeReadBit(const Descriptor& file, const State& old) {
 // there is nobody else's until its mode is taken over.
 mode_t ModeOfTemporary(const State& old) { return old ? 0600 : 0666; }
 
-bool Replace(const Place& place, const std::string& text) {
+bool Replace(const Place& place, Whose whose, const std::string& text) {
   State before;
   State old;
-  if (!LookAt(place.directory.Get(), place.name, AT_SYMLINK_NOFOLLOW, before)) return false;
+  if (!LookAt(place, whose, before)) return false;
   Temporary temporary(place);
   if (!temporary.Claim(ModeOfTemporary(before))) return false;
   // While this writer waited for another, the file may have come into being, or changed.
-  if (!LookAt(place.directory.Get(), place.name, AT_SYMLINK_NOFOLLOW, old)) return false;
+  if (!LookAt(place, whose, old)) return false;
   if (!old) old = before;
   if (!Posix::WriteAll(temporary.File().Get(), text)) return false;
   if (old && !TakeOver(temporary.File(), *old)) return false;
@@ -276,25 +288,30 @@ bool Replace(const Place& place, const std::string& text) {
   return TakeReadBit(temporary.File(), old) && Sync(place.directory);
 }
 
-}  // namespace
-
-bool ReadDocumentFile(const std::string& path, std::string& text) {
-  if (!IsPath(path)) return Fail(EINVAL);
-  const Descriptor file = Posix::Open(path, O_RDONLY | Posix::kHarmless);
+Descriptor OpenDocument(const std::string& path, Whose whose) {
+  if (whose == Whose::kBelieved) return Posix::OpenBelieved(path);
+  Descriptor file = Posix::Open(path, O_RDONLY | Posix::kHarmless);
   struct stat found = {};
-  if (!file.IsOpen() || !StatFile(file, found)) return false;
-  if (!S_ISREG(found.st_mode)) return Fail(EINVAL);
-  return Posix::ReadAll(file.Get(), text);
+  const bool isDocument =
+      file.IsOpen() && StatFile(file, found) && (S_ISREG(found.st_mode) || Fail(EINVAL));
+  if (!isDocument) file.Close();
+  return file;
 }
 
-bool ReplaceDocumentFile(const std::string& path, const std::string& text) {
+}  // namespace
+
+bool ReadDocument(Json::Value& value, const std::string& path, Whose whose) {
   if (!IsPath(path)) return Fail(EINVAL);
-  // The kernel looks first: it refuses what is not to be replaced before anything is touched, and
-  // links that it would not follow itself.
-  State state;
+  const Descriptor file = OpenDocument(path, whose);
+  std::string text;
+  return file.IsOpen() && Posix::ReadAll(file.Get(), text) && JsonValue::fromString(value, text);
+}
+
+bool ReplaceDocument(const Json::Value& value, const std::string& path, Whose whose) {
+  if (!IsPath(path)) return Fail(EINVAL);
+  if (whose == Whose::kAnybodys && !IsReplaceable(path)) return false;
   Place place;
-  if (!LookAt(AT_FDCWD, path, 0, state) || !Locate(path, place)) return false;
-  return Replace(place, text);
+  return Locate(path, whose, place) && Replace(place, whose, JsonValue::toString(value));
 }
 
 }  // namespace KeloDRCore

@@ -1,18 +1,27 @@
-// Whole documents in files: read at once, replaced in one step.
+// JSON documents in files: read at once, replaced in one step.
 
 #ifndef KELODRCORE_SRC_DOCUMENT_FILE_H_
 #define KELODRCORE_SRC_DOCUMENT_FILE_H_
+
+#include <json/forwards.h>
 
 #include <string>
 
 namespace KeloDRCore {
 
-// Reads the regular file at `path` to its end. False with errno set; `text` is then unspecified.
-bool ReadDocumentFile(const std::string& path, std::string& text);
+// Whose file counts at the name of a document.
+enum class Whose {
+  kAnybodys,  // as JsonValue::fromFile and toFile describe; links are followed
+  kBelieved,  // only a believed one (posix/trust.h); what else stands at the name counts as none
+};
 
-// Makes `text` the content of the file at `path`, as JsonValue::toFile describes. False with errno
-// set.
-bool ReplaceDocumentFile(const std::string& path, const std::string& text);
+// Parses the document of the file at `path` into `value`. False with `value` unchanged.
+bool ReadDocument(Json::Value& value, const std::string& path, Whose whose);
+
+// Makes `value` the document of the file at `path`. A file that counts keeps its owner and mode.
+// `kBelieved` replaces what stands at the name, a link included, by a new file of the writer's.
+// False with errno set.
+bool ReplaceDocument(const Json::Value& value, const std::string& path, Whose whose);
 
 }  // namespace KeloDRCore
 

@@ -141,12 +141,11 @@ bool fromString(Json::Value& value, const std::string& text) {
 }
 
 bool fromFile(Json::Value& value, const std::string& path) {
-  std::string text;
-  return ReadDocumentFile(path, text) && fromString(value, text);
+  return ReadDocument(value, path, Whose::kAnybodys);
 }
 
 bool toFile(const Json::Value& value, const std::string& path) {
-  return ReplaceDocumentFile(path, toString(value));
+  return ReplaceDocument(value, path, Whose::kAnybodys);
 }
 
 }  // namespace KeloDRCore::JsonValue
