@@ -34,7 +34,7 @@ TESTS = {
     "cache": ["cache_test", "intercepted_cache_test", "cache_process_test", "fault_cache_test"],
     "container": ["container_test"],
     "document_file": ["intercepted_document_test", "json_value_test", "fault_json_test",
-                      "kill_test --gtest_filter=PowerLoss*:*ReachesTheDisk*"],
+                      "kill_file_test --gtest_filter=PowerLoss*:*ReachesTheDisk*"],
     "err": ["err_test"],
     "file": ["file_test", "key_value_test", "intercepted_file_test", "fault_file_test"],
     "file_lock": ["file_lock_test", "fault_file_lock_test"],
