@@ -7,16 +7,17 @@
 #
 # The measurements go to build/bench/results, a JSON file for each comparison.
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 1 "$@"
 
 mode=table pattern=.
 case ${1:-} in
   --once | --docs) mode=${1#--} ;;
-  -*) echo "bench.sh: there is no option $1" >&2; exit 2 ;;
+  -*) wrong_usage "there is no option $1" ;;
   ?*) pattern=$1 ;;
 esac
-bench=build/bench/bench/kelodrcore_bench
-results=build/bench/results
+bench=$build/bench/bench/kelodrcore_bench
+results=$build/bench/results
 
 scripts/build.sh bench
 
@@ -35,7 +36,7 @@ compare() {
     growth*) repetitions=3 ;;
     InsertRecord/*) repetitions=41 ;;  # it stands at its bound
   esac
-  echo "bench.sh: $1" >&2
+  echo "$script: $1" >&2
   "$bench" "--benchmark_filter=^$1/" --benchmark_min_time=0.02 \
     --benchmark_repetitions=$repetitions --benchmark_enable_random_interleaving \
     "--benchmark_out=$results/${1//[^[:alnum:]]/_}.json" >"$results/log" 2>&1 ||
@@ -43,7 +44,7 @@ compare() {
 }
 
 comparisons=$("$bench" --benchmark_list_tests | cut -d/ -f1,2 | awk '!seen[$0]++' |
-  grep -E -- "$pattern") || { echo "bench.sh: no benchmark matches $pattern" >&2; exit 1; }
+  grep -E -- "$pattern") || fail "no benchmark matches $pattern"
 rm -rf "$results"
 mkdir -p "$results"
 while read -r comparison; do compare "$comparison" </dev/null; done <<<"$comparisons"

@@ -2,20 +2,34 @@
 # Installs what a preset needs, configures it and builds it in build/PRESET.
 #
 # usage: scripts/build.sh [PRESET]      the presets are in CMakePresets.json; "dev" without one
+#
+# KELODR_BUILD_DIR in the environment is used in place of build/, by all scripts.
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 1 "$@"
 preset=${1:-dev}
+presets=$(sed -n '/"buildPresets"/,/]/s/.*{"name": "\([^"]*\)".*/\1/p' CMakePresets.json)
+grep --quiet --line-regexp --fixed-strings -e "$preset" <<<"$presets" ||
+  wrong_usage "there is no preset '$preset'; there are: ${presets//$'\n'/ }"
 
 groups=(build test examples)
+options=()
+targets=()
 case $preset in
-  release) groups=(build examples) ;;
-  lint | package) groups=(build examples "$preset") ;;
+  release | release-i386) groups=(build examples) ;;
+  package*) groups=(build examples package) ;;
+  lint) groups=(build examples lint) ;;
   bench | fuzz) groups=(build "$preset") ;;
-  system-platform) groups=(build) ;;
-  storm) groups=(build test) ;;
+  system-platform) groups=(build) options=(-D "CMAKE_LIBRARY_PATH=$build/dev/platform") ;;
+  storm) groups=(build test) targets=(--target storm) ;;
+  tsan) targets=(--target threads_test) ;;
   coverage) groups+=(coverage) ;;
-  i386*) scripts/setup-i386.sh ;;
 esac
+if [[ $preset == *i386* ]]; then
+  groups+=(i386)
+  options+=(-D "KELODR_I386_SYSROOT=$build/i386-sysroot")
+fi
 scripts/setup.sh "${groups[@]}"
-cmake --preset "$preset"
-cmake --build --preset "$preset"
+if [[ $preset == *i386* ]]; then scripts/setup-i386.sh; fi
+cmake --preset "$preset" -B "$build/$preset" "${options[@]}"
+cmake --build "$build/$preset" "${targets[@]}"

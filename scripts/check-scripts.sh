@@ -1,8 +1,12 @@
 #!/bin/bash
 # Fails when shellcheck has something to say about a tracked shell script.
+#
+# usage: scripts/check-scripts.sh
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 0 "$@"
 
 scripts/setup.sh scripts
-git ls-files -z -- '*.sh' .ci/run | xargs -0 shellcheck
-echo "check-scripts.sh: all shell scripts are clean"
+git ls-files -z -- '*.sh' .ci/run |
+  xargs -0 shellcheck --external-sources --source-path=SCRIPTDIR
+echo "$script: all shell scripts are clean"

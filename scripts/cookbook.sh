@@ -4,8 +4,10 @@
 #
 # usage: scripts/cookbook.sh [OUTPUT]      docs/cookbook.md itself is changed without one
 set -euo pipefail
-cd "$(dirname "$0")/../docs"
-output=${1:-cookbook.md}
+output=$(realpath --canonicalize-missing -- "${1:-$(dirname "$0")/../docs/cookbook.md}")
+source "$(dirname "$0")/common.sh"
+takes_at_most 1 "$@"
+cd docs
 
 text=$(awk '
   match($0, /\(\.\.\/examples\/cookbook\/[^)]*\):$/) { file = substr($0, RSTART + 1, RLENGTH - 3) }

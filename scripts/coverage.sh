@@ -7,22 +7,24 @@
 #
 # What is not covered is printed; build/coverage/report/index.html shows it in the source.
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 1 "$@"
 minimum=${1:-0}
+takes_number MINIMUM "$minimum"
 
 scripts/build.sh coverage
-find build/coverage -name '*.gcda' -delete
+find "$build/coverage" -name '*.gcda' -delete
 # Children of other users write their counts into the same files.
-(umask 0 && find build/coverage/tests -type f -name '*_test' -exec {} --gtest_list_tests \;) >/dev/null
+(umask 0 && find "$build/coverage/tests" -type f -name '*_test' -exec {} --gtest_list_tests \;) >/dev/null
 # Left out: the tests of what is installed and of its imports, which are others in this build; the
 # second run under valgrind; kills, which leave no counts; and storms, which kill at random: counts
 # that are cut off while they are written spoil all others.
-ctest --preset coverage --parallel "$(nproc)" --exclude-regex '^(Package|valgrind|FaultCallsTest)\.|(^|/)Killed|^storm\.'
+ctest --preset coverage --test-dir "$build/coverage" --parallel "$(nproc)" --exclude-regex '^(Package|valgrind|FaultCallsTest)\.|(^|/)Killed|^storm\.'
 
-report=build/coverage/report
+report=$build/coverage/report
 mkdir -p "$report"
 gcovr --root . --filter src/ --filter platform/ --exclude-throw-branches \
-  --exclude-unreachable-branches --exclude-branches-by-pattern '^ *\} catch \(.*' --json "$report/counts.json" build/coverage
+  --exclude-unreachable-branches --exclude-branches-by-pattern '^ *\} catch \(.*' --json "$report/counts.json" "$build/coverage"
 gcovr --root . --add-tracefile "$report/counts.json" --html-details "$report/index.html"
 gcovr --root . --add-tracefile "$report/counts.json" --branches
 gcovr --root . --add-tracefile "$report/counts.json" --print-summary \

@@ -1,11 +1,14 @@
 #!/bin/bash
 # Installs what is missing, builds the release preset and shows the library at work.
+#
+# usage: scripts/demo.sh
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 0 "$@"
 
 scripts/build.sh release
 
-drctl=build/release/examples/drctl/drctl
+drctl=$build/release/examples/drctl/drctl
 scratch=$(mktemp -d)
 trap 'rm -rf "$scratch" "/tmp/.kelodr_lock$scratch"' EXIT
 

@@ -1,13 +1,18 @@
 #!/bin/bash
 # Draws the pictures of docs/ from their sources, and builds the API documentation into
-# build/docs/html; a warning of Doxygen is an error.
+# build/docs/html. A warning of Doxygen is an error.
+#
+# usage: scripts/docs.sh
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 0 "$@"
 
 scripts/setup.sh docs
+mkdir -p "$build/docs"
 for source in docs/*.dot; do
-  dot -Tsvg "$source" -o "${source%.dot}.svg"
+  name=$(basename "$source" .dot).svg
+  dot -Tsvg "$source" -o "$build/docs/$name"
+  cmp --silent "$build/docs/$name" "docs/$name" || cp "$build/docs/$name" docs/
 done
-mkdir -p build/docs
-doxygen docs/Doxyfile
-echo "The documentation is in build/docs/html/index.html"
+OUTPUT=$build/docs doxygen docs/Doxyfile
+echo "The documentation is in $build/docs/html/index.html"

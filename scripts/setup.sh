@@ -15,8 +15,9 @@
 #   bench     the benchmark library, the libraries it compares with, the plotter
 #   fuzz      the fuzzing compiler
 #   coverage  the coverage report
+#   systems   what makes the systems of scripts/test-on.sh
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
 
 packages_of() {
   case $1 in
@@ -24,15 +25,16 @@ packages_of() {
     test) echo libgtest-dev libgmock-dev locales pkgconf valgrind lighttpd curl ;;
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
-    package) echo abigail-tools dpkg-dev file ;;
+    package) echo abigail-tools dpkg-dev file lintian man-db ;;
     scripts) echo shellcheck ;;
     lint) echo clang clang-tidy ;;
     i386) echo g++-multilib googletest ;;
     docs) echo doxygen graphviz ;;
     bench) echo libbenchmark-dev libsqlitecpp-dev libsoci-dev libboost-dev gnuplot-nox python3 ;;
-    fuzz) echo clang libclang-rt-14-dev ;;
+    fuzz) echo clang libclang-rt-dev ;;
     coverage) echo gcovr ;;
-    *) echo "setup.sh: there is no group '$1'; scripts/setup.sh without one lists them" >&2; return 1 ;;
+    systems) echo debootstrap ;;
+    *) wrong_usage "there is no group '$1'" ;;
   esac
 }
 
@@ -48,25 +50,21 @@ apt_install() {
 # The package lists are fetched only when they are absent, or too old to be served any more.
 install_missing() {
   if [ "$(id -u)" -ne 0 ]; then
-    echo "setup.sh: missing: ${missing[*]}" >&2
-    echo "setup.sh: run this as root, or install them with apt-get first" >&2
-    exit 1
+    fail "packages are missing; install them with
+sudo apt-get install --no-install-recommends ${missing[*]}"
   fi
-  echo "setup.sh: installing ${missing[*]}"
+  echo "$script: installing ${missing[*]}"
   if apt_install --simulate >/dev/null 2>&1 && apt_install; then
     return
   fi
   apt-get update --quiet --quiet
-  apt_install
+  apt_install || fail "the packages could not be installed; is there a network? Missing: ${missing[*]}"
 }
 
-if [ $# -eq 0 ]; then
-  sed -n '/^# usage/,/^set/{/^#/s/^# \{0,1\}//p}' "$0" >&2
-  exit 2
-fi
-
+[ $# -gt 0 ] || wrong_usage "name at least one group"
+groups=("$@")
 missing=()
-for group in "$@"; do
+for group in "${groups[@]}"; do
   packages=$(packages_of "$group")
   for package in $packages; do
     is_installed "$package" || missing+=("$package")
@@ -76,5 +74,5 @@ done
 if [ ${#missing[@]} -gt 0 ]; then
   install_missing
 else
-  echo "setup.sh: nothing to install for: $*"
+  echo "$script: nothing to install for: $*"
 fi

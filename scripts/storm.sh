@@ -4,13 +4,15 @@
 #
 # usage: scripts/storm.sh [SEED]       1 without one
 set -euo pipefail
-cd "$(dirname "$0")/.."
+source "$(dirname "$0")/common.sh"
+takes_at_most 1 "$@"
 seed=${1:-1}
+takes_number SEED "$seed"
 
 scripts/build.sh storm
 # A kill loses nothing that was written, on a disk or not; in memory more happens in the time.
 if [[ -z ${TMPDIR:-} && -w /dev/shm ]]; then export TMPDIR=/dev/shm; fi
-storm() { nice build/storm/tests/storm "$@" "seed=$seed"; }
+storm() { nice "$build/storm/tests/storm" "$@" "seed=$seed"; }
 
 storm operations processes=16 seconds=60
 storm holders processes=8 count=10000
