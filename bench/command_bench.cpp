@@ -34,7 +34,7 @@ void MeasureLiteral(size_t size, const std::string& share, size_t every) {
   Register("ToFormatedValue", work, kLibrary, [=](benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(value.ToFormatedValue());
   });
-  Register("ToFormatedValue", work, "sqlite3_mprintf", [=](benchmark::State& state) {
+  Register("ToFormatedValue", work, Contestant{"sqlite3_mprintf", 1}, [=](benchmark::State& state) {
     for (auto _ : state) {
       char* const literal = sqlite3_mprintf("%Q", text.c_str());
       benchmark::DoNotOptimize(literal);
@@ -42,12 +42,12 @@ void MeasureLiteral(size_t size, const std::string& share, size_t every) {
     }
   });
   if (size > 4096) return;
-  Register("ToFormatedValue", work, "regex_replace", [=](benchmark::State& state) {
+  Register("ToFormatedValue", work, Contestant{"regex_replace"}, [=](benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(ReplaceByRegex(text));
   });
 }
 
-// The limit's statements are made of the same stored data: names and JSON values in order.
+// The baseline's statements are made of the same stored data: names and JSON values in order.
 struct Statement {
   std::string table = "nodes";
   Record fields;
@@ -108,7 +108,7 @@ void MeasureCommand(const std::string& work, std::shared_ptr<KeloDRCore::SqliteC
   Register("GetCommand", work, kLibrary, [=](benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(command->GetCommand());
   });
-  Register("GetCommand", work, kLimit, [=](benchmark::State& state) {
+  Register("GetCommand", work, Baseline(1.2), [=](benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(byHand());
   });
 }
@@ -155,9 +155,7 @@ void MeasureDelete() {
   MeasureCommand("delete", command, [=] { return DeleteText(statement); });
 }
 
-}  // namespace
-
-void RegisterCommand() {
+const Benchmarks registered([] {
   for (const size_t size :
        {size_t{16}, size_t{256}, size_t{4096}, size_t{65536}, size_t{1} << 20}) {
     MeasureLiteral(size, "0 %", 0);
@@ -167,6 +165,7 @@ void RegisterCommand() {
   MeasureCommands(5);
   MeasureCommands(50);
   MeasureDelete();
-}
+});
 
+}  // namespace
 }  // namespace bench

@@ -57,7 +57,7 @@ void RegisterDocumentRead() {
       Require(KeloDRCore::File::Read(path, value) && value.isArray(), "File::Read");
     }
   });
-  Register("File::Read", "JSON, 1 MiB", kLimit, [=](benchmark::State& state) {
+  Register("File::Read", "JSON, 1 MiB", Baseline(1.15), [=](benchmark::State& state) {
     for (auto _ : state) {
       Json::Value value;
       Require(access(path.c_str(), F_OK) == 0 && ParseWithJsonCpp(ReadRaw(path), value), "read");
@@ -73,7 +73,7 @@ void RegisterDocumentWrite() {
   Register("File::Write", "JSON, 1 MiB", kLibrary, [=](benchmark::State& state) {
     for (auto _ : state) Require(KeloDRCore::File::Write(path, value), "File::Write");
   })->UseRealTime();
-  Register("File::Write", "JSON, 1 MiB", kLimit, [=](benchmark::State& state) {
+  Register("File::Write", "JSON, 1 MiB", Baseline(1.15), [=](benchmark::State& state) {
     for (auto _ : state) Require(WriteRaw(path, WriteWithJsonCpp(value)), "write");
   })->UseRealTime();
 }
@@ -158,7 +158,7 @@ void ReadByHand(const std::string& path, std::map<std::string, V>& map) {
 }
 
 template <typename V, typename Read>
-void MeasureLines(const std::string& work, const char* contestant, const std::string& path,
+void MeasureLines(const std::string& work, const Contestant& contestant, const std::string& path,
                   const Read& read) {
   Register("File::Read<K, V>", work, contestant, [=](benchmark::State& state) {
     std::map<std::string, V> expected;
@@ -179,13 +179,11 @@ void RegisterLines(const std::string& type, bool inOrder) {
   const std::string path = ScratchPath(type + (inOrder ? ".conf" : ".unordered.conf"));
   WriteWhole(path, KeyValueLines(inOrder, std::is_arithmetic_v<V>));
   MeasureLines<V>(work, kLibrary, path, KeloDRCore::File::Read<std::string, V>);
-  MeasureLines<V>(work, kLimit, path, ReadByHand<V>);
-  MeasureLines<V>(work, "a stream a token", path, ReadWithStreams<V>);
+  MeasureLines<V>(work, Baseline(1.5), path, ReadByHand<V>);
+  MeasureLines<V>(work, {"a stream a token", 0.25}, path, ReadWithStreams<V>);
 }
 
-}  // namespace
-
-void RegisterFile() {
+const Benchmarks registered([] {
   RegisterDocumentRead();
   RegisterDocumentWrite();
   for (const bool inOrder : {true, false}) {
@@ -193,6 +191,7 @@ void RegisterFile() {
     RegisterLines<int>("int", inOrder);
     RegisterLines<double>("double", inOrder);
   }
-}
+});
 
+}  // namespace
 }  // namespace bench

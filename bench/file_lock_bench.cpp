@@ -9,8 +9,9 @@
 #include "support.h"
 
 namespace bench {
+namespace {
 
-void RegisterFileLock() {
+const Benchmarks registered([] {
   const char* const operation = "FileLock";
   const char* const work = "lock and unlock";
   Register(operation, work, kLibrary, [](benchmark::State& state) {
@@ -20,7 +21,7 @@ void RegisterFileLock() {
       lock.unlock();
     }
   });
-  Register(operation, work, kLimit, [](benchmark::State& state) {
+  Register(operation, work, Baseline(1.2), [](benchmark::State& state) {
     LockByHand lock(ScratchPath("locks"));
     for (auto _ : state) {
       Require(lock.Lock(LOCK_EX | LOCK_NB, 0), "lock");
@@ -28,7 +29,7 @@ void RegisterFileLock() {
     }
   });
   // A record lock on a file that is open: no look at the file, no other user's ids.
-  Register(operation, work, "Boost.Interprocess", [](benchmark::State& state) {
+  Register(operation, work, {"Boost.Interprocess"}, [](benchmark::State& state) {
     const std::string path = ScratchPath("boost.lock");
     WriteWhole(path, "");
     boost::interprocess::file_lock lock(path.c_str());
@@ -37,6 +38,7 @@ void RegisterFileLock() {
       lock.unlock();
     }
   });
-}
+});
 
+}  // namespace
 }  // namespace bench

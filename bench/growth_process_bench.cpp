@@ -19,7 +19,7 @@ constexpr int kLocks = 200;
 // More than any turn of 64 waiting processes takes.
 constexpr unsigned int kTimeout = 600;
 
-void Measure(const char* operation, int processes, const char* contestant, int times,
+void Measure(const char* operation, int processes, const Contestant& contestant, int times,
              const std::function<std::function<void()>()>& prepare) {
   Register(operation, std::to_string(processes), contestant,
            [=](benchmark::State& state) {
@@ -82,22 +82,21 @@ std::function<void()> LockByHandInTurn(int type) {
   };
 }
 
-}  // namespace
-
-void RegisterProcessGrowth() {
+const Benchmarks registered([] {
   WriteFiles();
   for (const int processes : {1, 2, 4, 8, 16, 32, 64}) {
     Measure("growth cache", processes, kLibrary, kReads, ReadWithLibrary);
-    Measure("growth cache", processes, kLimit, kReads, ReadByHand);
+    Measure("growth cache", processes, Baseline(), kReads, ReadByHand);
     Measure("growth lock waiting", processes, kLibrary, kLocks,
             [] { return LockWithLibrary(LOCK_EX); });
-    Measure("growth lock waiting", processes, kLimit, kLocks,
+    Measure("growth lock waiting", processes, Baseline(), kLocks,
             [] { return LockByHandInTurn(LOCK_EX); });
     Measure("growth lock polling", processes, kLibrary, kLocks,
             [] { return LockWithLibrary(LOCK_EX | LOCK_NB); });
-    Measure("growth lock polling", processes, kLimit, kLocks,
+    Measure("growth lock polling", processes, Baseline(), kLocks,
             [] { return LockByHandInTurn(LOCK_EX | LOCK_NB); });
   }
-}
+});
 
+}  // namespace
 }  // namespace bench

@@ -46,7 +46,7 @@ void MakeUntimed(benchmark::State& state, const std::string& path) {
   state.ResumeTiming();
 }
 
-void MeasureInsert(int rows, const char* contestant,
+void MeasureInsert(int rows, const Contestant& contestant,
                    void (*insertAll)(const std::string&, const std::vector<Node>&)) {
   Register("growth insert", std::to_string(rows), contestant, [=](benchmark::State& state) {
     const std::vector<Node> nodes = MakeNodes(rows);
@@ -58,7 +58,8 @@ void MeasureInsert(int rows, const char* contestant,
   });
 }
 
-void MeasureSelect(int rows, const char* contestant, size_t (*selectAll)(const std::string&)) {
+void MeasureSelect(int rows, const Contestant& contestant,
+                   size_t (*selectAll)(const std::string&)) {
   Register("growth select", std::to_string(rows), contestant, [=](benchmark::State& state) {
     const std::string path = DatabaseOf(rows);
     for (auto _ : state) Require(selectAll(path) == static_cast<size_t>(rows), "select");
@@ -80,7 +81,8 @@ size_t PeakMemory(bool reset) {
 }
 
 // In a child, so that no earlier work has left memory to use again.
-void MeasureMemory(int rows, const char* contestant, size_t (*selectAll)(const std::string&)) {
+void MeasureMemory(int rows, const Contestant& contestant,
+                   size_t (*selectAll)(const std::string&)) {
   Register("growth memory", std::to_string(rows), contestant, [=](benchmark::State& state) {
     const std::string path = DatabaseOf(rows);
     double bytes = 0;
@@ -95,37 +97,36 @@ void MeasureMemory(int rows, const char* contestant, size_t (*selectAll)(const s
   });
 }
 
-void MeasureValueInsert(size_t size, const char* contestant,
-                        void (*insertAll)(const std::string&, const std::vector<Node>&)) {
+void MeasureValueInsert(size_t size, const Contestant& contestant,
+                        void (*insertAll)(const std::string&, const std::vector<Node>&),
+                        size_t (*selectAll)(const std::string&)) {
   Register("growth value", std::to_string(size), contestant, [=](benchmark::State& state) {
     const std::vector<Node> nodes = {{"10.0.0.1", 1, std::string(size, 'x'), true, 5566}};
     const std::string path = ScratchPath("value.db");
     for (auto _ : state) {
       MakeUntimed(state, path);
       insertAll(path, nodes);
-      Require((contestant == std::string(kLibrary) ? SelectWithLibrary : SelectByHand)(path) == 1,
-              "select");
+      Require(selectAll(path) == 1, "select");
     }
   })->UseRealTime();
 }
 
-}  // namespace
-
-void RegisterSqlGrowth() {
+const Benchmarks registered([] {
   for (const int rows : {1000, 10000, 100000, 1000000}) {
     MeasureInsert(rows, kLibrary, InsertWithLibrary);
-    MeasureInsert(rows, kLimit, InsertByHand);
+    MeasureInsert(rows, Baseline(), InsertByHand);
     MeasureSelect(rows, kLibrary, SelectWithLibrary);
-    MeasureSelect(rows, kLimit, SelectByHand);
+    MeasureSelect(rows, Baseline(), SelectByHand);
     MeasureMemory(rows, kLibrary, SelectWithLibrary);
-    MeasureMemory(rows, kLimit, SelectByHand);
+    MeasureMemory(rows, Baseline(), SelectByHand);
   }
   for (size_t size = 16; size <= size_t{64} << 20; size *= 16) {
-    MeasureValueInsert(size, kLibrary, InsertWithLibrary);
-    MeasureValueInsert(size, kLimit, InsertByHand);
+    MeasureValueInsert(size, kLibrary, InsertWithLibrary, SelectWithLibrary);
+    MeasureValueInsert(size, Baseline(), InsertByHand, SelectByHand);
   }
-  MeasureValueInsert(size_t{64} << 20, kLibrary, InsertWithLibrary);
-  MeasureValueInsert(size_t{64} << 20, kLimit, InsertByHand);
-}
+  MeasureValueInsert(size_t{64} << 20, kLibrary, InsertWithLibrary, SelectWithLibrary);
+  MeasureValueInsert(size_t{64} << 20, Baseline(), InsertByHand, SelectByHand);
+});
 
+}  // namespace
 }  // namespace bench

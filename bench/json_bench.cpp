@@ -22,7 +22,7 @@ struct Document {
 };
 
 template <typename Run>
-void Measure(const char* operation, size_t size, const char* contestant, const Run& run) {
+void Measure(const char* operation, size_t size, const Contestant& contestant, const Run& run) {
   Register(operation, SizeName(size), contestant, [=](benchmark::State& state) {
     const Document document(size);
     for (auto _ : state) run(document);
@@ -31,28 +31,27 @@ void Measure(const char* operation, size_t size, const char* contestant, const R
   });
 }
 
-}  // namespace
-
-void RegisterJson() {
+const Benchmarks registered([] {
   for (const size_t size : {size_t{1} << 10, size_t{100} << 10, size_t{10} << 20}) {
     Measure("fromString", size, kLibrary, [](const Document& document) {
       Json::Value value;
       Require(KeloDRCore::JsonValue::fromString(value, document.text), "fromString");
     });
-    Measure("fromString", size, kLimit, [](const Document& document) {
+    Measure("fromString", size, Baseline(1.1), [](const Document& document) {
       Json::Value value;
       Require(ParseWithJsonCpp(document.text, value), "parse");
     });
     Measure("toString", size, kLibrary, [](const Document& document) {
       benchmark::DoNotOptimize(KeloDRCore::JsonValue::toString(document.value));
     });
-    Measure("toString", size, kLimit, [](const Document& document) {
+    Measure("toString", size, Baseline(1.1), [](const Document& document) {
       benchmark::DoNotOptimize(WriteWithJsonCpp(document.value));
     });
-    Measure("toString", size, "FastWriter", [](const Document& document) {
+    Measure("toString", size, {"FastWriter"}, [](const Document& document) {
       benchmark::DoNotOptimize(WriteFastWithJsonCpp(document.value));
     });
   }
-}
+});
 
+}  // namespace
 }  // namespace bench

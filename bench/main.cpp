@@ -54,19 +54,6 @@ void DescribeMachineAndVersions() {
   add("boost", BOOST_LIB_VERSION);
 }
 
-void RegisterAll() {
-  bench::RegisterInsert();
-  bench::RegisterSelect();
-  bench::RegisterCommand();
-  bench::RegisterJson();
-  bench::RegisterFile();
-  bench::RegisterCache();
-  bench::RegisterFileLock();
-  bench::RegisterMessages();
-  bench::RegisterSqlGrowth();
-  bench::RegisterProcessGrowth();
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -77,7 +64,7 @@ int main(int argc, char** argv) {
   benchmark::Initialize(&argc, argv);
   if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
   DescribeMachineAndVersions();
-  RegisterAll();
+  bench::RegisterAll();
   benchmark::RunSpecifiedBenchmarks();
   return 0;
 }

@@ -110,7 +110,7 @@ size_t AskByHand(const Call& call) {
 }
 
 template <typename Run>
-void Measure(const char* operation, const char* step, size_t size, const char* contestant,
+void Measure(const char* operation, const char* step, size_t size, const Contestant& contestant,
              const Run& run) {
   Register(operation, std::string(step) + ", " + SizeName(size), contestant,
            [=](benchmark::State& state) {
@@ -119,21 +119,20 @@ void Measure(const char* operation, const char* step, size_t size, const char* c
            });
 }
 
-}  // namespace
-
-void RegisterMessages() {
+const Benchmarks registered([] {
   for (const size_t size : {size_t{1} << 10, size_t{1} << 20}) {
     Measure("Request", "build to text", size, kLibrary, BuildWithLibrary);
-    Measure("Request", "build to text", size, kLimit, BuildByHand);
+    Measure("Request", "build to text", size, Baseline(1.1), BuildByHand);
     Measure("Request", "build to text and keep", size, kLibrary, BuildAndKeep);
-    Measure("Request", "build to text and keep", size, kLimit, BuildByHand);
+    Measure("Request", "build to text and keep", size, Baseline(1.1), BuildByHand);
     Measure("Request", "parse and query", size, kLibrary, ParseWithLibrary);
-    Measure("Request", "parse and query", size, kLimit, ParseByHand);
+    Measure("Request", "parse and query", size, Baseline(1.1), ParseByHand);
     Measure("Request", "parse, copy and query", size, kLibrary, ParseAndCopy);
-    Measure("Request", "parse, copy and query", size, kLimit, ParseByHand);
+    Measure("Request", "parse, copy and query", size, Baseline(1.1), ParseByHand);
     Measure("Response", "parse and query", size, kLibrary, AskWithLibrary);
-    Measure("Response", "parse and query", size, kLimit, AskByHand);
+    Measure("Response", "parse and query", size, Baseline(1.1), AskByHand);
   }
-}
+});
 
+}  // namespace
 }  // namespace bench

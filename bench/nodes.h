@@ -43,7 +43,7 @@ sqlite3* OpenRaw(const std::string& path);
 void ExecRaw(sqlite3* db, const char* sql);
 
 // Insert the nodes into the empty table inside one transaction: with the library, a command for
-// each row or one for all of them, and at its limit.
+// each row or one for all of them, and by hand.
 void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes);
 void InsertWithOneCommand(const std::string& path, const std::vector<Node>& nodes);
 void InsertByHand(const std::string& path, const std::vector<Node>& nodes);

@@ -1,4 +1,4 @@
-// The limit's side of the SQL work: what a programmer writes by hand on SQLite's own interface.
+// The baseline's side of the SQL work: what a programmer writes by hand on SQLite's own interface.
 
 #ifndef KELODRCORE_BENCH_RAW_CALLS_H_
 #define KELODRCORE_BENCH_RAW_CALLS_H_

@@ -12,31 +12,7 @@ import subprocess
 import sys
 
 LIBRARY = "kelodrcore"
-LIMIT = "limit"
-
-# The largest ratio to the limit that an operation may take.
-BOUNDS = {
-    "InsertRecord": 1.10,
-    "SelectRecords": 1.05,
-    "GetCommand": 1.2,
-    "fromString": 1.05,
-    "toString": 1.05,
-    "File::Read": 1.15,
-    "File::Write": 1.15,
-    "File::Read<K, V>": 1.5,
-    "Cache::Read": 1.2,
-    "FileLock": 1.2,
-    "Request": 1.1,
-    "Response": 1.1,
-}
-# The largest ratio to a peer: faster than it, or as many times faster.
-PEER_BOUNDS = {
-    ("SelectRecords", "SQLiteCpp"): 1,
-    ("SelectRecords", "SOCI"): 1,
-    ("ToFormatedValue", "sqlite3_mprintf"): 1,
-    ("ToFormatedValue", "regex_replace"): 1 / 50,
-    ("File::Read<K, V>", "a stream a token"): 1 / 4,
-}
+BASELINE = "baseline"
 NANOSECONDS = {"ns": 1, "us": 1e3, "ms": 1e6, "s": 1e9}
 
 
@@ -45,13 +21,15 @@ class Comparison:
 
     def __init__(self):
         self.times = collections.defaultdict(list)
-        self.counters = {}
+        self.bounds = {}  # the largest ratios that are accepted
+        self.bytes_per_row = {}
 
     def add(self, contestant, run):
         kind = "cpu_time" if run["name"].endswith(contestant) else "real_time"
         self.times[contestant].append(run[kind] * NANOSECONDS[run["time_unit"]])
-        if "bytes_per_row" in run:
-            self.counters[contestant] = run["bytes_per_row"]
+        for name, values in (("bound", self.bounds), ("bytes_per_row", self.bytes_per_row)):
+            if name in run:
+                values[contestant] = run[name]
 
     def median(self, contestant):
         return statistics.median(self.times[contestant])
@@ -96,11 +74,7 @@ def rows_of(operation, work, comparison):
     for contestant in comparison.times:
         if contestant == LIBRARY:
             continue
-        bound = PEER_BOUNDS.get((operation, contestant))
-        if contestant == LIMIT:
-            bound = BOUNDS[operation]
-        if contestant == "regex_replace" and not work.startswith("4 KiB"):
-            bound = None
+        bound = comparison.bounds.get(contestant)
         low, middle, high = comparison.ratios(contestant)
         missed = bound is not None and middle > bound
         yield [
@@ -153,7 +127,7 @@ def plot(path, title, x, y, curves, extra=""):
         f"$curve{i} << end\n" + "\n".join(f"{a} {b}" for a, b in points) + "\nend"
         for i, (_, points) in enumerate(curves)
     ]
-    lines = (f"$curve{i} with linespoints pt 7 ps 0.5 dt {1 + ('limit' in name)} title '{name}'"
+    lines = (f"$curve{i} with linespoints pt 7 ps 0.5 dt {1 + (BASELINE in name)} title '{name}'"
              for i, (name, _) in enumerate(curves))
     script.append("plot " + ", ".join(lines))
     subprocess.run(["gnuplot"], input="\n".join(script), text=True, check=True)
@@ -162,7 +136,7 @@ def plot(path, title, x, y, curves, extra=""):
 def draw(comparisons, docs):
     def both(operation, label, value):
         return [(f"{label}{name}", curve(comparisons, operation, name, value))
-                for name in (LIBRARY, LIMIT)]
+                for name in (LIBRARY, BASELINE)]
 
     def per_row(rows, comparison, name):
         return comparison.median(name) / rows / 1e3
@@ -171,7 +145,7 @@ def draw(comparisons, docs):
         return comparison.median(name) / 1e3
 
     def bytes_per_row(_, comparison, name):
-        return comparison.counters[name]
+        return comparison.bytes_per_row[name]
 
     plot(docs / "growth-rows.svg", "Inserts and selects", "rows", "µs a row",
          both("growth insert", "insert, ", per_row) + both("growth select", "select, ", per_row),

@@ -112,16 +112,15 @@ void SelectWithSoci(benchmark::State& state) {
               [&session](std::vector<Record>& records) { session.Select(kSelect, records); });
 }
 
-}  // namespace
-
-void RegisterSelect() {
-  const auto measure = [](const char* contestant, void (*run)(benchmark::State&)) {
+const Benchmarks registered([] {
+  const auto measure = [](const Contestant& contestant, void (*run)(benchmark::State&)) {
     Register("SelectRecords", "20,000 rows", contestant, run)->Unit(benchmark::kMillisecond);
   };
   measure(kLibrary, SelectWithLibrary);
-  measure(kLimit, SelectByHand);
-  measure("SQLiteCpp", SelectWithSqliteCpp);
-  measure("SOCI", SelectWithSoci);
-}
+  measure(Baseline(1.05), SelectByHand);
+  measure({"SQLiteCpp", 1}, SelectWithSqliteCpp);
+  measure({"SOCI", 1}, SelectWithSoci);
+});
 
+}  // namespace
 }  // namespace bench

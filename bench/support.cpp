@@ -6,6 +6,7 @@
 #include <fstream>
 #include <memory>
 #include <sstream>
+#include <vector>
 
 namespace bench {
 namespace {
@@ -22,13 +23,29 @@ class ScratchDir {
   std::filesystem::path path;
 };
 
+std::vector<void (*)()>& Registrations() {
+  static std::vector<void (*)()> registrations;
+  return registrations;
+}
+
 }  // namespace
 
+Benchmarks::Benchmarks(void (*registerAll)()) { Registrations().push_back(registerAll); }
+
+void RegisterAll() {
+  for (const auto registerAll : Registrations()) registerAll();
+}
+
 benchmark::internal::Benchmark* Register(const std::string& operation, const std::string& work,
-                                         const std::string& contestant,
+                                         const Contestant& contestant,
                                          const std::function<void(benchmark::State&)>& run) {
-  const std::string name = operation + "/" + work + "/" + contestant;
-  return benchmark::RegisterBenchmark(name.c_str(), run);
+  const std::string name = operation + "/" + work + "/" + contestant.name;
+  return benchmark::RegisterBenchmark(name.c_str(),
+                                      [run, bound = contestant.bound](benchmark::State& state) {
+                                        run(state);
+                                        if (bound > 0)
+                                          state.counters["bound"] = bound;  // for the table
+                                      });
 }
 
 void Require(bool condition, const std::string& what) {

@@ -12,15 +12,31 @@
 
 namespace bench {
 
-// The two contestants that every operation has; peers go by their own names. The limit makes the
-// system and library calls that the work itself needs, written by hand.
-inline constexpr char kLibrary[] = "kelodrcore";
-inline constexpr char kLimit[] = "limit";
+// Who does the work: the library, the baseline (the system and library calls that the work itself
+// needs, written by hand), or a peer by its own name. `bound` is the largest ratio of the library's
+// time to this contestant's time that is accepted; 0 means none.
+struct Contestant {
+  const char* name;
+  double bound = 0;
+};
+
+inline constexpr Contestant kLibrary = {"kelodrcore"};
+
+constexpr Contestant Baseline(double bound = 0) { return {"baseline", bound}; }
+
+// Each file with benchmarks has one object of this type. main() calls its function, which registers
+// the benchmarks of that file.
+struct Benchmarks {
+  explicit Benchmarks(void (*registerAll)());
+};
+
+// Calls the functions of all objects of type Benchmarks.
+void RegisterAll();
 
 // Registers "OPERATION/WORK/CONTESTANT". The table of ratios and the curves are made from these
 // names, so no part contains a slash.
 benchmark::internal::Benchmark* Register(const std::string& operation, const std::string& work,
-                                         const std::string& contestant,
+                                         const Contestant& contestant,
                                          const std::function<void(benchmark::State&)>& run);
 
 // Ends the program when contestants do not do the same work.
@@ -46,17 +62,6 @@ std::string WriteWithJsonCpp(const Json::Value& value);
 // The writer that JsonCpp calls fast: it builds the text without a stream. It is deprecated, and
 // escapes everything that is not ASCII, so that its text is another one.
 std::string WriteFastWithJsonCpp(const Json::Value& value);
-
-void RegisterCache();
-void RegisterCommand();
-void RegisterFile();
-void RegisterFileLock();
-void RegisterInsert();
-void RegisterJson();
-void RegisterMessages();
-void RegisterProcessGrowth();
-void RegisterSelect();
-void RegisterSqlGrowth();
 
 }  // namespace bench
 
