@@ -7,13 +7,15 @@ set(CMAKE_C_FLAGS_INIT -m32)
 set(CMAKE_CXX_FLAGS_INIT -m32)
 
 # Headers and libraries come from the sysroot alone; packages of headers only may be the host's.
-get_filename_component(sysroot ${CMAKE_CURRENT_LIST_DIR}/../build/i386-sysroot ABSOLUTE)
-set(CMAKE_FIND_ROOT_PATH ${sysroot})
+get_filename_component(sysroot "${CMAKE_CURRENT_LIST_DIR}/../build/i386-sysroot" ABSOLUTE)
+set(KELODR_I386_SYSROOT "${sysroot}" CACHE PATH "SQLite and JsonCpp for i386")
+list(APPEND CMAKE_TRY_COMPILE_PLATFORM_VARIABLES KELODR_I386_SYSROOT)
+set(CMAKE_FIND_ROOT_PATH "${KELODR_I386_SYSROOT}")
 set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
 set(CMAKE_FIND_ROOT_PATH_MODE_LIBRARY ONLY)
 set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
 
 # The loader looks in the sysroot too, also for what the library itself needs (hence the old tag).
-set(libraries ${sysroot}/usr/lib/i386-linux-gnu)
+set(libraries ${KELODR_I386_SYSROOT}/usr/lib/i386-linux-gnu)
 set(CMAKE_EXE_LINKER_FLAGS_INIT
-  "-L${libraries} -Wl,--disable-new-dtags,-rpath,${libraries}")
+  "-L\"${libraries}\" -Wl,--disable-new-dtags,-rpath,\"${libraries}\"")

@@ -36,4 +36,4 @@ case ${1:-} in
 esac
 build=$(realpath --canonicalize-missing "${KELODR_BUILD_DIR:-$(dirname "$0")/../build}")
 export KELODR_BUILD_DIR=$build
-cd "$(dirname "$0")/.."
+cd "$(dirname "$0")/.." || exit

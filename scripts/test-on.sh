@@ -32,6 +32,7 @@ cp /etc/resolv.conf "$system/etc/"
 
 # The mounts and the processes are gone when the script ends.
 export system
+# shellcheck disable=SC2016  # expanded by the inner shell
 unshare --mount --pid --fork --kill-child bash -euc '
   mount --bind "$PWD" "$system/the tree"
   mount -o remount,bind,ro "$system/the tree"

@@ -18,6 +18,10 @@
 
 namespace KeloDRCore {
 
+// No destructor is virtual: nothing is deleted through a base.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wnon-virtual-dtor"
+
 /// A condition as text, and the base of all others. A plain value; not deleted through this base.
 class KELODR_EXPORT SqliteCondition {
  public:
@@ -148,6 +152,8 @@ class KELODR_EXPORT SqliteNotIn : public SqliteInFamily {
   SqliteNotIn(const std::string& lvalue, const std::string& value);
   /// @}
 };
+
+#pragma GCC diagnostic pop
 
 }  // namespace KeloDRCore
 

@@ -18,6 +18,10 @@ struct sqlite3;
 
 namespace KeloDRCore {
 
+// No destructor is virtual: nothing is deleted through a base.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wnon-virtual-dtor"
+
 /// Holds the last error: a code of `ERR` (0 for none) and its details. Not deleted through this
 /// base.
 class KELODR_EXPORT ErrRecorder {
@@ -189,6 +193,8 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   unsigned int retryLimit;
   std::string logLabel;
 };
+
+#pragma GCC diagnostic pop
 
 }  // namespace KeloDRCore
 

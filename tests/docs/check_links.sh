@@ -14,7 +14,7 @@ for document in *.md docs/*.md; do
     grep --invert-match --extended-regexp '^(https?:|$)')
 done
 while IFS=: read -r document script; do
-  [ -x "$script" ] && continue
+  [ -f "$script" ] && continue
   echo "$document: there is no $script"
   result=1
 done < <(grep --only-matching 'scripts/[a-z0-9-]*\.sh' ./*.md docs/*.md)

@@ -17,6 +17,7 @@ fi
 
 program=$prefix/../consumer-$how
 # shellcheck disable=SC2086  # the flags are words
-$CXX -std=c++17 $CXXFLAGS "$source_dir/consumer/consumer.cpp" -o "$program" \
-  $LDFLAGS $flags "-Wl,-rpath,$prefix/$LIBDIR"
-"$program"
+$CXX -std=c++17 $CXXFLAGS -Weffc++ -Wnon-virtual-dtor "$source_dir/consumer/consumer.cpp" \
+  -o "$program" $LDFLAGS $flags "-Wl,-rpath,$prefix/$LIBDIR" 2> >(tee "$program.log" >&2)
+"$program" "$version"
+if grep 'kelodrcore/.*warning' "$program.log"; then exit 1; fi
