@@ -5,17 +5,29 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <cerrno>
 #include <cstdint>
+#include <mutex>
+#include <utility>
+#include <vector>
 
+#include "kelocore.h"
 #include "kelodrcore/file.h"
+#include "lock_fork.h"
 #include "log.h"
+#include "posix/directory_walk.h"
+#include "posix/file_io.h"
 #include "posix/retry.h"
 #include "privilege.h"
 
 namespace KeloDRCore {
 namespace {
 
+using Posix::Descriptor;
+
 constexpr char kLockDir[] = "/tmp/.kelodr_lock";
+constexpr char kStart[] = "/tmp";
 constexpr int kLockDirMode = 0755;
 
 // Decimal on purpose: lock files have always been made with these bits.
@@ -27,21 +39,79 @@ constexpr unsigned int kPollMs = 50;
 // as busy. Each time takes a removal between an open and a flock, so once is rare.
 constexpr int kReplacedLimit = 10;
 
-// Whether `fd` is still the file at `path`: a cleaner of /tmp removes or replaces files that are
-// open, and then newcomers lock another one.
-bool IsFileAt(const std::string& path, int fd) {
+// The open lock files of this process. They are opened, closed and forked under the mutex, so that
+// a child knows all that it has.
+struct OpenFiles {
+  std::mutex mutex;
+  std::vector<int> descriptors;
+};
+OpenFiles& openFiles = *new OpenFiles;  // outlives every user
+
+// Whether `fd` is still the lock file at `path`: a cleaner of /tmp removes or replaces files that
+// are open, and then newcomers lock another one.
+bool IsLockFile(int fd, const std::string& path) {
   struct stat open = {};
   struct stat named = {};
-  return fstat(fd, &open) == 0 && lstat(path.c_str(), &named) == 0 && open.st_dev == named.st_dev &&
-         open.st_ino == named.st_ino;
+  return Posix::Stat(fd, open) && S_ISREG(open.st_mode) &&
+         Posix::StatAt(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, named) &&
+         Posix::IsSameFile(open, named);
+}
+
+Descriptor OpenLockDir(const std::string& parent) {
+  Descriptor directory = Posix::OpenStepwise(
+      kStart, parent, [](const std::string& step) { return File::CreateDir(step, kLockDirMode); });
+  if (!directory.IsOpen()) {
+    KELODR_LOG(ERR, "checkLockDir", "Failed to create lock dir [%s] in local host", parent.c_str());
+  }
+  return directory;
+}
+
+// The mode denies the owner of a lock file to read it, and flock takes any descriptor.
+Descriptor OpenLockFile(int directory, const std::string& name) {
+  const int flags = O_CREAT | O_NOFOLLOW | Posix::kHarmless;
+  Descriptor file = Posix::OpenAt(directory, name, O_RDONLY | flags, kLockFileMode);
+  if (!file.IsOpen() && errno == EACCES) {
+    file = Posix::OpenAt(directory, name, O_WRONLY | flags, kLockFileMode);
+  }
+  if (file.IsOpen() && !File::IsRegularFile(file.Get())) {
+    file.Close();
+    errno = EINVAL;
+  }
+  return file;
+}
+
+int OpenRegistered(int directory, const std::string& name) {
+  const std::lock_guard<std::mutex> guard(openFiles.mutex);
+  Descriptor file = OpenLockFile(directory, name);
+  if (file.IsOpen()) openFiles.descriptors.push_back(file.Get());
+  return file.Release();
+}
+
+void CloseRegistered(int fd) {
+  const std::lock_guard<std::mutex> guard(openFiles.mutex);
+  auto& descriptors = openFiles.descriptors;
+  descriptors.erase(std::find(descriptors.begin(), descriptors.end(), fd));
+  close(fd);
 }
 
 }  // namespace
 
+int ForkWithoutLocks(int flags) {
+  const std::lock_guard<std::mutex> guard(openFiles.mutex);
+  const int pid = KLIBCProcForkEx(flags);
+  if (pid != 0) return pid;
+  for (const int fd : openFiles.descriptors) {
+    Posix::Retry([&] { return dup3(STDIN_FILENO, fd, O_CLOEXEC); });
+  }
+  return 0;
+}
+
 FileLock::FileLock(const std::string& name) : path(getLockFilePath(name)) {}
 
-FileLock::~FileLock() {
-  if (fd >= 0) close(fd);
+FileLock::~FileLock() { closeFile(); }
+
+void FileLock::closeFile() {
+  if (fd >= 0) CloseRegistered(std::exchange(fd, -1));
 }
 
 bool FileLock::setLockFile(const std::string& name) {
@@ -70,12 +140,7 @@ std::string FileLock::getLockFilePath(const std::string& name) {
 
 bool FileLock::checkLockDir() const {
   const std::string parent = File::GetParentDir(path);
-  if (parent.empty()) return false;
-  if (!File::CreateDir(parent, kLockDirMode)) {
-    KELODR_LOG(ERR, __func__, "Failed to create lock dir [%s] in local host", parent.c_str());
-    return false;
-  }
-  return true;
+  return !parent.empty() && OpenLockDir(parent).IsOpen();
 }
 
 bool FileLock::openLockedFile() {
@@ -83,43 +148,46 @@ bool FileLock::openLockedFile() {
     KELODR_LOG(ERR, __func__, "%s", "Bad Lock File");
     return false;
   }
-  if (!checkLockDir()) {
+  if (IsLockFile(fd, path)) return true;
+  const std::string parent = File::GetParentDir(path);
+  const Descriptor directory = OpenLockDir(parent);
+  if (!directory.IsOpen()) {
     KELODR_LOG(ERR, __func__, "Failed to check lock dir of lock file [%s].", path.c_str());
     return false;
   }
-  if (File::IsRegularFile(fd) && IsFileAt(path, fd)) return true;
-
-  if (fd >= 0) close(fd);
-  fd = Posix::Retry([&] {
-    return open(path.c_str(), O_RDONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, kLockFileMode);
-  });
-  if (fd < 0) {
-    KELODR_LOG(ERR, __func__, "Failed to open lock file[%s], errno=%m", path.c_str());
-    return false;
-  }
-  return true;
+  closeFile();
+  std::string name = path.substr(parent.size() + 1);
+  if (name.empty()) name = ".";  // the path of a directory, which is refused
+  fd = OpenRegistered(directory.Get(), name);
+  if (fd < 0) KELODR_LOG(ERR, __func__, "Failed to open lock file[%s], errno=%m", path.c_str());
+  return fd >= 0;
 }
 
 bool FileLock::lock(int type, unsigned int timeout) {
+  return attempt(type, timeout) == Outcome::kTaken;
+}
+
+FileLock::Outcome FileLock::attempt(int type, unsigned int timeout) {
   KELODR_PRIVILEGED();
   int replaced = 0;
   bool usable = openLockedFile();
   for (uint64_t elapsedMs = 0; usable;) {
-    if (flock(fd, type) == 0) {
-      if (IsFileAt(path, fd)) return true;
+    const bool isTaken = flock(fd, type) == 0;
+    const bool isBusy = isTaken || errno == EWOULDBLOCK;
+    if (isTaken) {
+      if (IsLockFile(fd, path)) return Outcome::kTaken;
       // Newcomers stand on another file: this lock excludes nobody. It is given up whatever comes
       // of the next file.
-      close(fd);
-      fd = -1;
+      closeFile();
       usable = openLockedFile();
       if (!usable || ++replaced <= kReplacedLimit) continue;
     }
-    if (elapsedMs / 1000 >= timeout) return false;
+    if (elapsedMs / 1000 >= timeout) return isBusy ? Outcome::kBusy : Outcome::kFailed;
     elapsedMs += kPollMs;
     usleep(kPollMs * 1000);
   }
-  KELODR_LOG(ERR, __func__, "Bad fd [%d] to lock [%s]", fd, path.c_str());
-  return false;
+  KELODR_LOG(ERR, "lock", "Bad fd [%d] to lock [%s]", fd, path.c_str());
+  return Outcome::kFailed;
 }
 
 bool FileLock::tryLock(int type) {

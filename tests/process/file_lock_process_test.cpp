@@ -13,6 +13,7 @@
 
 #include "kelodrcore/file_lock.h"
 #include "support/lock_test.h"
+#include "support/process.h"
 
 namespace {
 
@@ -276,6 +277,7 @@ void DropEffectiveIds() {
 }
 
 TEST_F(FileLockProcessTest, LockAndUnlockWorkAsRootUnderOtherEffectiveIdsAndRestoreThem) {
+  if (!IsRoot()) GTEST_SKIP() << "needs root";
   EXPECT_EQ(
       RunInChild([this] {
         DropEffectiveIds();
@@ -304,6 +306,7 @@ TEST_F(FileLockProcessTest, LockAndUnlockWorkAsRootUnderOtherEffectiveIdsAndRest
 }
 
 TEST_F(FileLockProcessTest, TheIdsAreRestoredWhenTheLockIsBusyAndWhenItCannotBeOpened) {
+  if (!IsRoot()) GTEST_SKIP() << "needs root";
   const Holder holder([this] { return Hold(LOCK_EX | LOCK_NB); });
   EXPECT_EQ(RunInChild([this] {
               DropEffectiveIds();
@@ -324,6 +327,7 @@ TEST_F(FileLockProcessTest, TheIdsAreRestoredWhenTheLockIsBusyAndWhenItCannotBeO
 }
 
 TEST_F(FileLockProcessTest, ALockThatOthersMayReadWorksWithoutAnyPrivileges) {
+  if (!IsRoot()) GTEST_SKIP() << "needs root";
   {
     const mode_t before = umask(0);
     FileLock lock(name);

@@ -31,7 +31,14 @@ int RunInChild(const std::function<void()>& body);
 // may not do that. What `body` mounts is seen by nobody else and gone with the child.
 bool RunWithOwnMounts(const std::function<void()>& body);
 
-// The same with `file` in the place of the program at `path`.
+// The same with an empty /tmp of `size`; skips the test when this process may not mount one.
+void RunWithOwnTmp(const std::string& size, const std::function<void()>& body);
+
+// Whether this process may make lock files; it gets a lock directory of its own where the one of
+// the machine is another user's.
+bool CanLock();
+
+// RunWithOwnMounts() with `file` in the place of the program at `path`.
 bool RunWithProgram(const std::string& path, const std::string& file,
                     const std::function<void()>& body);
 

@@ -29,7 +29,7 @@ void Forget();
 
 }  // namespace LockCalls
 
-// Each test has a lock name of its own. Skipped without root.
+// Each test has a lock name of its own. Skipped where no lock can be made.
 class LockTest : public CleanTest {
  protected:
   void SetUp() override;

@@ -35,7 +35,8 @@ LogLine Auth(int priority, const std::string& text);
 namespace LogCapture {
 
 // The lines since the last call of this process or Clear(), oldest first; a forked child inherits
-// what its parent had and sends nothing back.
+// what its parent had and sends nothing back. What the privilege bracket logs of an ordinary user
+// is left out.
 std::vector<LogLine> Take();
 
 void Clear();

@@ -47,7 +47,7 @@ class TestCache : public KeloDRCore::Cache {
 };
 
 // Each test has a directory for its caches. Teardown fails when anything but cache files is left in
-// it, and removes the lock files. Skipped without root.
+// it, and removes the lock files. Skipped where no lock can be made.
 class CacheFixture : public CleanTest {
  protected:
   void SetUp() override;
@@ -73,10 +73,6 @@ class CacheFixture : public CleanTest {
   // Expects that the sleeps skipped since the last look are kManySleeps, of each length of that
   // range, in milliseconds.
   static void ExpectManySleepsFrom(unsigned int low, unsigned int high);
-
-  // Runs `body` in a child that sees an empty /tmp of `size`; skips the test when this
-  // process may not mount one.
-  static void RunWithOwnTmp(const std::string& size, const std::function<void()>& body);
 
   // The lines of a cache's course, for the cache of MakeCache().
   LogLine NoData() const {

@@ -1,0 +1,96 @@
+#include "posix/directory_walk.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <utility>
+
+#include "posix/file_io.h"
+#include "posix/retry.h"
+
+namespace KeloDRCore::Posix {
+namespace {
+
+constexpr mode_t kMode = 0755;
+
+// How often a step is tried: whoever may write beside it can put something else there each time.
+constexpr int kMaxAttempts = 10;
+
+struct Step {
+  std::string name;
+  std::string path;  // from the root directory to `name`
+  bool isFirst;
+  bool isBelow;  // no ".." on the way
+};
+
+// By the descriptor: what the name means may change at any moment.
+bool Secure(int directory) {
+  struct stat found = {};
+  if (!Stat(directory, found)) return false;
+  const uid_t user = geteuid();
+  if (user != 0) return found.st_uid == 0 || found.st_uid == user || Fail(EACCES);
+  if (found.st_uid == 0 && (found.st_mode & (S_IWGRP | S_IWOTH)) == 0) return true;
+  return Retry([&] { return fchown(directory, 0, 0); }) == 0 &&
+         Retry([&] { return fchmod(directory, kMode); }) == 0;
+}
+
+// After a failure to open it: whether what is no directory could be taken away. A file of root's is
+// no stranger's work, but for a hard link to one in the place of the first step.
+bool RemovePlanted(int parent, const Step& step) {
+  struct stat found = {};
+  if ((errno != ENOTDIR && errno != ELOOP) || geteuid() != 0 || !step.isBelow) return false;
+  if (!StatAt(parent, step.name, AT_SYMLINK_NOFOLLOW, found)) return errno == ENOENT;
+  if (!step.isFirst && found.st_uid == 0) return false;
+  return Retry([&] { return unlinkat(parent, step.name.c_str(), 0); }) == 0;
+}
+
+// Its owner may have moved the directory away before it was secured.
+bool IsAt(int parent, const std::string& name, int directory) {
+  struct stat named = {};
+  struct stat open = {};
+  return StatAt(parent, name, AT_SYMLINK_NOFOLLOW, named) && Stat(directory, open) &&
+         IsSameFile(named, open);
+}
+
+Descriptor OpenStep(int parent, const Step& step, const std::string& path,
+                    const MakeDirectory& make) {
+  for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
+    Descriptor opened = OpenAt(parent, step.name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW);
+    if (opened.IsOpen()) {
+      if (!step.isBelow) return opened;
+      if (!Secure(opened.Get())) return {};
+      if (IsAt(parent, step.name, opened.Get())) return opened;
+    } else if (errno == ENOENT) {
+      if (!make(step.path)) return {};
+    } else if (!RemovePlanted(parent, step)) {
+      // Below the first step the way is safe, and the whole directory is what cannot be made.
+      make(step.isFirst ? step.path : path);
+      return {};
+    }
+  }
+  return {};
+}
+
+}  // namespace
+
+Descriptor OpenStepwise(const std::string& start, const std::string& path,
+                        const MakeDirectory& make) {
+  Descriptor directory = Open(start, O_RDONLY | O_DIRECTORY);
+  Step step{{}, {}, true, true};
+  size_t begin = path.find_first_not_of('/', start.size());
+  while (directory.IsOpen() && begin != std::string::npos) {
+    const size_t end = std::min(path.find('/', begin), path.size());
+    step.name = path.substr(begin, end - begin);
+    step.path = path.substr(0, end);
+    step.isBelow = step.isBelow && step.name != "..";
+    directory = OpenStep(directory.Get(), step, path, make);
+    step.isFirst = false;
+    begin = path.find_first_not_of('/', end);
+  }
+  return directory;
+}
+
+}  // namespace KeloDRCore::Posix

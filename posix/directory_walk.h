@@ -1,0 +1,31 @@
+// The way to a directory at a path where others may write, one step at a time.
+
+#ifndef KELODRCORE_POSIX_DIRECTORY_WALK_H_
+#define KELODRCORE_POSIX_DIRECTORY_WALK_H_
+
+#include <functional>
+#include <string>
+
+#include "posix/descriptor.h"
+
+namespace KeloDRCore::Posix {
+
+// Makes the directory at a path; false when that cannot be done.
+using MakeDirectory = std::function<bool(const std::string& path)>;
+
+// Opens the directory `path`, which begins with `start`. `start` itself may be a link, no step
+// below it may. `make` is called for a step that is missing, with its path.
+//
+// Nobody with fewer rights may decide what is found on the way. As root, a step is made root's and
+// writable by nobody else, and what a stranger put in the place of one is removed; the first step
+// is root's whoever put a file there. To an ordinary user a step must be root's or its own. Behind
+// a step "..", which leads away from `start`, only links are refused.
+//
+// A closed descriptor when the directory cannot be had. Where that is because something else stands
+// in the place of a step, `make` has been called for what is missing.
+Descriptor OpenStepwise(const std::string& start, const std::string& path,
+                        const MakeDirectory& make);
+
+}  // namespace KeloDRCore::Posix
+
+#endif  // KELODRCORE_POSIX_DIRECTORY_WALK_H_
