@@ -10,7 +10,7 @@ takes_at_most 1 "$@"
 cd docs
 
 text=$(awk '
-  match($0, /\(\.\.\/examples\/cookbook\/[^)]*\):$/) { file = substr($0, RSTART + 1, RLENGTH - 3) }
+  match($0, /\(\.\.\/examples\/(cookbook|common)\/[^)]*\):$/) { file = substr($0, RSTART + 1, RLENGTH - 3) }
   /^```/ && inside { inside = 0; skip = 0 }
   !skip { print }
   /^```[a-z]/ {

@@ -5,53 +5,42 @@
 
 #include <iostream>
 
+#include "common/reply.h"
+
 using namespace KeloDRCore;
 
 const SqliteTableHandler kNodes("node", "name TEXT PRIMARY KEY");
 
-Json::Value Succeed(const Json::Value& data) {
-  Json::Value reply;
-  reply["success"] = true;
-  reply["data"] = data;
-  return reply;
-}
-
-Json::Value Fail(int code, const Json::Value& errors) {
-  Json::Value reply;
-  reply["success"] = false;
-  reply["error"]["code"] = code;
-  reply["error"]["errors"] = errors;
-  return reply;
-}
-
 Json::Value CreateNode(SqliteDB& db, const Json::Value& params) {
   const Json::Value& name = params["name"];
-  if (!name.isString()) return Fail(ERR::BAD_PARAMETER, "name is missing");
+  if (!name.isString()) return reply::Failure(ERR::BAD_PARAMETER, "name is missing");
   InsertCommand insert;
   insert.SetTable(kNodes);
   insert.AddFieldValue("name", name.asString());
-  if (!db.InsertRecord(insert)) return Fail(ERR::ERR_NODE_CREATE, db.GetErr());
-  return Succeed(params);
+  if (!db.InsertRecord(insert)) return reply::Failure(ERR::ERR_NODE_CREATE, db.GetErr());
+  return reply::Success(params);
 }
 
 Json::Value CountNodes(SqliteDB& db) {
   Json::Value data;
   int count = 0;
   if (!db.CreateTable(kNodes) || !db.GetCount(kNodes, count)) {
-    return Fail(ERR::ERR_NODE_LIST, db.GetErr());
+    return reply::Failure(ERR::ERR_NODE_LIST, db.GetErr());
   }
   data["count"] = count;
-  return Succeed(data);
+  return reply::Success(data);
 }
 
 Json::Value Answer(SqliteDB& db, const std::string& text) {
   Json::Value call;
-  if (!JsonValue::fromString(call, text)) return Fail(ERR::BAD_PARAMETER, "not a JSON document");
+  if (!JsonValue::fromString(call, text))
+    return reply::Failure(ERR::BAD_PARAMETER, "not a JSON document");
   const Request request(call);
-  if (!request.isValid()) return Fail(ERR::BAD_PARAMETER, "api, method and version are needed");
+  if (!request.isValid())
+    return reply::Failure(ERR::BAD_PARAMETER, "api, method and version are needed");
   if (request.toStr() == "Node/create/1") return CreateNode(db, request.getParams());
   if (request.toStr() == "Node/count/1") return CountNodes(db);
-  return Fail(ERR::ERR_NO_SUCH_API, request.toStr());
+  return reply::Failure(ERR::ERR_NO_SUCH_API, request.toStr());
 }
 
 // Answers one call a line.

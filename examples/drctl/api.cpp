@@ -6,6 +6,7 @@
 
 #include <map>
 
+#include "common/reply.h"
 #include "mounts.h"
 #include "volume_cache.h"
 
@@ -97,21 +98,10 @@ Json::Value Api::Dispatch(const Request& request) {
   return Refuse(ERR::ERR_NO_SUCH_API, request.toStr());
 }
 
-Json::Value Api::Succeed(const Json::Value& data) const {
-  Json::Value reply;
-  reply["success"] = true;
-  reply["data"] = data;
-  return reply;
-}
-
 // The reply tells what the registry's recorder holds.
 Json::Value Api::Fail() const {
   const Json::Value err = registry.GetErr();
-  Json::Value reply;
-  reply["success"] = false;
-  reply["error"]["code"] = err["err_code"];
-  reply["error"]["errors"] = err;
-  return reply;
+  return reply::Failure(err["err_code"].asInt(), err);
 }
 
 Json::Value Api::Refuse(int code, const std::string& why) {
@@ -124,24 +114,22 @@ Json::Value Api::CreateNode(const Json::Value& params) {
   node.AddValue("state", "unknown");
   const std::string complaint = FromJson(params, NodeColumns(), node);
   if (!complaint.empty()) return Refuse(ERR::BAD_PARAMETER, complaint);
-  return registry.AddNode(node) ? Succeed(Json::objectValue) : Fail();
+  return registry.AddNode(node) ? reply::Success(Json::objectValue) : Fail();
 }
 
 Json::Value Api::GetNode(const Json::Value& params) {
   std::string name;
   if (!TakeName(params, name)) return Refuse(ERR::BAD_PARAMETER, "name must be a text");
   SqliteValueList node;
-  return registry.GetNode(name, node) ? Succeed(ToJson(node, NodeColumns())) : Fail();
+  return registry.GetNode(name, node) ? reply::Success(ToJson(node, NodeColumns())) : Fail();
 }
 
 Json::Value Api::ListNodes(const Json::Value& params) {
   Query query;
   if (!TakeQuery(params, query)) return Refuse(ERR::BAD_PARAMETER, "a parameter has a wrong type");
-  Rows nodes;
-  if (!registry.ListNodes(query, nodes)) return Fail();
   Json::Value data;
-  data["nodes"] = ToJson(nodes, NodeColumns());
-  return Succeed(data);
+  if (!registry.ReadNodes(query, data["nodes"])) return Fail();
+  return reply::Success(data);
 }
 
 Json::Value Api::SetNode(const Json::Value& params) {
@@ -152,13 +140,13 @@ Json::Value Api::SetNode(const Json::Value& params) {
   SqliteValueList changes;
   const std::string complaint = FromJson(changed, NodeColumns(), changes);
   if (!complaint.empty()) return Refuse(ERR::BAD_PARAMETER, complaint);
-  return registry.SetNode(name, changes) ? Succeed(Json::objectValue) : Fail();
+  return registry.SetNode(name, changes) ? reply::Success(Json::objectValue) : Fail();
 }
 
 Json::Value Api::DeleteNode(const Json::Value& params) {
   std::string name;
   if (!TakeName(params, name)) return Refuse(ERR::BAD_PARAMETER, "name must be a text");
-  return registry.RemoveNode(name) ? Succeed(Json::objectValue) : Fail();
+  return registry.RemoveNode(name) ? reply::Success(Json::objectValue) : Fail();
 }
 
 Json::Value Api::ListVolumes(const Json::Value& /*params*/) {
@@ -166,19 +154,19 @@ Json::Value Api::ListVolumes(const Json::Value& /*params*/) {
   Json::Value data;
   data["volumes"] = VolumeCache(volumeCacheDir, volumeMaxAge).ReadVolumes(source);
   data["additional"]["source"] = ToText(source);
-  return Succeed(data);
+  return reply::Success(data);
 }
 
 // The registry is opened by its first statement, so none of its connection crosses the fork.
 Json::Value Api::ScanVolumes(const Json::Value& /*params*/) {
-  const std::string id = tasks.Start([this] {
+  const Started task = tasks.Start([this] {
     const Rows volumes = ScanMounts();
     return !volumes.empty() && registry.ReplaceVolumes(volumes);
   });
-  if (id.empty()) return Refuse(ERR::ERR_FORK_FAILED, "the scan could not be started");
+  if (task.id.empty()) return Refuse(task.code, "the scan is not started: " + task.reason);
   Json::Value data;
-  data["task_id"] = id;
-  return Succeed(data);
+  data["task_id"] = task.id;
+  return reply::Success(data);
 }
 
 Json::Value Api::PollVolumes(const Json::Value& params) {
@@ -190,7 +178,7 @@ Json::Value Api::PollVolumes(const Json::Value& params) {
   data["task_id"] = id;
   data["finish"] = state != TaskState::kRunning;
   data["success"] = state == TaskState::kSucceeded;
-  return Succeed(data);
+  return reply::Success(data);
 }
 
 Json::Value Api::SystemInfo(const Json::Value& /*params*/) {
@@ -200,7 +188,7 @@ Json::Value Api::SystemInfo(const Json::Value& /*params*/) {
   }
   Json::Value data(Json::objectValue);
   for (const auto& [key, value] : settings) data[key] = value;
-  return Succeed(data);
+  return reply::Success(data);
 }
 
 }  // namespace drctl

@@ -33,7 +33,6 @@ class Api {
   static const Entry kEntries[];
 
   Json::Value Dispatch(const KeloDRCore::Request& request);
-  Json::Value Succeed(const Json::Value& data) const;
   Json::Value Fail() const;
 
   Json::Value CreateNode(const Json::Value& params);

@@ -43,17 +43,20 @@ std::optional<size_t> ContentLength() {
   return length;
 }
 
-void PrintCgi(const char* status, const Json::Value& reply) {
+// `header`: one more line of the head, with its end.
+void PrintCgi(const char* status, const Json::Value& reply, const char* header = "") {
   const std::string body = JsonValue::toString(reply) + "\n";
-  std::cout << "Status: " << status
-            << "\r\nContent-Type: application/json\r\nContent-Length: " << body.size() << "\r\n\r\n"
+  std::cout << "Status: " << status << "\r\n"
+            << header << "Content-Type: application/json\r\nContent-Length: " << body.size()
+            << "\r\n\r\n"
             << body << std::flush;
 }
 
 void RunCgi(Api& api) {
   const char* const method = std::getenv("REQUEST_METHOD");
   if (method == nullptr || std::string(method) != "POST") {
-    return PrintCgi("405 Method Not Allowed", api.Refuse(ERR::BAD_PARAMETER, "send a POST"));
+    return PrintCgi("405 Method Not Allowed", api.Refuse(ERR::BAD_PARAMETER, "send a POST"),
+                    "Allow: POST\r\n");
   }
   const std::optional<size_t> length = ContentLength();
   if (!length) {

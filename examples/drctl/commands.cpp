@@ -1,5 +1,6 @@
 #include "commands.h"
 
+#include <kelodrcore/err.h>
 #include <kelodrcore/file.h>
 
 #include <iostream>
@@ -7,12 +8,11 @@
 
 #include "mounts.h"
 #include "output.h"
-#include "transfer.h"
 #include "volume_cache.h"
 
 namespace drctl {
 
-using KeloDRCore::SqliteValueList;
+using namespace KeloDRCore;
 
 namespace {
 
@@ -25,19 +25,22 @@ SqliteValueList GivenFields(const Options& options) {
 }
 
 // The exit status; a failure is told with the registry's reason.
-int Finish(bool isDone, const std::string& what, const Registry& registry) {
-  return isDone ? 0 : Complain("cannot " + what, registry.GetErr());
+int Finish(bool isDone, const std::string& what, const Registry& registry, const Options& options) {
+  return isDone ? 0 : Complain("cannot " + what, registry.GetErr(), options.json);
 }
 
-using List = bool (Registry::*)(const Query& query, Rows& rows);
+using Each = bool (Registry::*)(const Query& query, const Take& take);
 
-int PrintList(const Options& options, List list, const std::vector<Column>& columns,
+int PrintList(const Options& options, Each each, const std::vector<Column>& columns,
               const std::string& what) {
   Registry registry(options.db);
-  Rows rows;
-  const bool isDone = (registry.*list)(options.query, rows);
-  if (isDone) Print(rows, columns, options.json);
-  return Finish(isDone, "list the " + what, registry);
+  RowPrinter printer(columns, options.json);
+  const bool isDone =
+      registry.CheckThere() && (registry.*each)(options.query, [&](const SqliteValueList& row) {
+        return printer.Print(row);
+      });
+  if (isDone) printer.End();
+  return Finish(isDone, "list the " + what, registry, options);
 }
 
 int ListCachedVolumes(const Options& options) {
@@ -48,13 +51,13 @@ int ListCachedVolumes(const Options& options) {
     volumes = cache.ReadVolumes(source);
     if (options.verbose) std::cerr << "drctl: answered from " << ToText(source) << '\n';
   }
-  Rows rows;
+  RowPrinter printer(VolumeColumns(), options.json);
   for (const Json::Value& volume : volumes) {
     SqliteValueList row;
     // A cache file that somebody edited may hold anything.
-    if (FromJson(volume, VolumeColumns(), row).empty()) rows.push_back(row);
+    if (FromJson(volume, VolumeColumns(), row).empty()) printer.Print(row);
   }
-  Print(rows, VolumeColumns(), options.json);
+  printer.End();
   return 0;
 }
 
@@ -65,55 +68,59 @@ int AddNode(const Options& options) {
   SqliteValueList node = GivenFields(options);
   node.AddValue("name", options.name);
   if (!options.state) node.AddValue("state", "unknown");
-  return Finish(registry.AddNode(node), "add node '" + options.name + "'", registry);
+  const bool isDone = registry.AddNode(node);
+  return Finish(isDone, "add node '" + options.name + "'", registry, options);
 }
 
 int SetNode(const Options& options) {
   Registry registry(options.db);
   const bool isDone = registry.SetNode(options.name, GivenFields(options));
-  return Finish(isDone, "change node '" + options.name + "'", registry);
+  return Finish(isDone, "change node '" + options.name + "'", registry, options);
 }
 
 int RemoveNode(const Options& options) {
   Registry registry(options.db);
   const bool isDone = registry.RemoveNode(options.name);
-  return Finish(isDone, "remove node '" + options.name + "'", registry);
+  return Finish(isDone, "remove node '" + options.name + "'", registry, options);
 }
 
 int ListNodes(const Options& options) {
-  return PrintList(options, &Registry::ListNodes, NodeColumns(), "nodes");
+  return PrintList(options, &Registry::EachNode, NodeColumns(), "nodes");
 }
 
 int CountNodes(const Options& options) {
   Registry registry(options.db);
   int count = 0;
-  const bool isDone = registry.CountNodes(count);
+  const bool isDone = registry.CheckThere() && registry.CountNodes(count);
   if (isDone) std::cout << count << '\n';
-  return Finish(isDone, "count the nodes", registry);
+  return Finish(isDone, "count the nodes", registry, options);
 }
 
 int ScanVolumes(const Options& options) {
   Registry registry(options.db);
   const Rows volumes = ScanMounts();
-  if (volumes.empty()) {
-    std::cerr << "drctl: cannot read the mounts from /proc/self/mountinfo\n";
-    return 1;
+  const bool isDone = volumes.empty()
+                          ? registry.Fail(ERR::ERR_UNKNOWN, "/proc/self/mountinfo cannot be read")
+                          : registry.ReplaceVolumes(volumes);
+  if (isDone) {
+    Json::Value counts;
+    counts["volumes"] = Json::UInt64{volumes.size()};
+    PrintDone(std::to_string(volumes.size()) + " mount points stored", counts, options.json);
   }
-  const bool isDone = registry.ReplaceVolumes(volumes);
-  if (isDone) std::cout << volumes.size() << " mount points stored\n";
-  return Finish(isDone, "store the volumes", registry);
+  return Finish(isDone, "store the volumes", registry, options);
 }
 
 int ListVolumes(const Options& options) {
   if (options.cached) return ListCachedVolumes(options);
-  return PrintList(options, &Registry::ListVolumes, VolumeColumns(), "volumes");
+  return PrintList(options, &Registry::EachVolume, VolumeColumns(), "volumes");
 }
 
 int ShowSystem(const Options& options) {
   std::map<std::string, std::string> settings;
-  if (KeloDRCore::File::Read(options.file, settings) <= 0) {
-    std::cerr << "drctl: cannot read any setting from '" << options.file << "'\n";
-    return 1;
+  if (File::Read(options.file, settings) <= 0) {
+    return Complain("cannot show the system",
+                    MakeErr(ERR::ERR_UNKNOWN, "there is no setting in '" + options.file + "'"),
+                    options.json);
   }
   Json::Value object(Json::objectValue);
   for (const auto& [key, value] : settings) {
@@ -122,16 +129,6 @@ int ShowSystem(const Options& options) {
   }
   if (options.json) PrintJson(object);
   return 0;
-}
-
-int ExportRegistry(const Options& options) {
-  Registry registry(options.db);
-  return Export(registry, options.file);
-}
-
-int ImportRegistry(const Options& options) {
-  Registry registry(options.db);
-  return Import(registry, options.file);
 }
 
 }  // namespace drctl

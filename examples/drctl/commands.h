@@ -15,6 +15,7 @@ struct Options {
   std::string db;
   bool verbose = false;
   bool json = false;
+  std::vector<std::string> words;  // of help
   std::string name;
   std::optional<std::string> address;
   std::optional<std::string> state;
@@ -40,8 +41,6 @@ int CountNodes(const Options& options);
 int ScanVolumes(const Options& options);
 int ListVolumes(const Options& options);
 int ShowSystem(const Options& options);
-int ExportRegistry(const Options& options);
-int ImportRegistry(const Options& options);
 
 }  // namespace drctl
 

@@ -1,14 +1,21 @@
 // drctl: a registry of the replication nodes and of this machine's volumes.
 
+#include <kelodrcore/err.h>
+#include <kelodrcore/version.h>
 #include <syslog.h>
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <iostream>
 #include <limits>
 #include <string>
 
 #include "call.h"
 #include "commands.h"
+#include "output.h"
+#include "paths.h"
+#include "transfer.h"
+#include "usage.h"
 
 namespace drctl {
 namespace {
@@ -16,38 +23,74 @@ namespace {
 constexpr int kFailure = 1;
 constexpr int kUsageError = 2;
 
+const CLI::Validator kNotEmpty([](std::string& text) { return text.empty() ? "it is empty" : ""; },
+                               "");
+
 // The command line: a tree of subcommands, of which the leaf that was named runs.
 class CommandLine {
  public:
   CommandLine() {
     app.require_subcommand(1);
-    app.footer("Exit status: 0 done, 1 failed, 2 wrong usage.");
-    app.add_option("--db", options.db,
-                   "The registry's SQLite file; only system and volume list --cached go without");
+    app.fallthrough();
+    app.set_version_flag("--version", "drctl " KELODRCORE_VERSION, "Show the version and end");
+    app.footer(
+        "Every command takes --db, --json and --verbose.\n"
+        "Exit status: 0 done, 1 failed, 2 wrong usage.");
+    options.db = DefaultDb();
+    app.add_option("--db", options.db, "The registry's SQLite file; DRCTL_DB sets the default")
+        ->capture_default_str()
+        ->check(kNotEmpty);
+    app.add_flag("--json", options.json, "Print one line of JSON, a failure's reason too");
     app.add_flag("--verbose", options.verbose, "Show the library's log lines on standard error");
     AddNodeCommands();
     AddVolumeCommands();
     AddSystemCommands();
     AddTransferCommands();
     AddCallCommand();
+    AddHelpCommand();
   }
 
   int Run(int argc, char** argv) {
     try {
       app.parse(argc, argv);
-      if (needsDb && !options.cached && options.db.empty()) throw CLI::RequiredError("--db");
+    } catch (const CLI::Success& wish) {  // --help or --version
+      return app.exit(wish);
     } catch (const CLI::ParseError& error) {
-      return app.exit(error) == 0 ? 0 : kUsageError;
+      options.json = std::find(argv, argv + argc, std::string("--json")) != argv + argc;
+      return Refuse(Complaint(app, error));
+    }
+    if (help->parsed()) return PrintHelp();
+    if (needsDb && !options.cached && options.db.empty()) {
+      return Refuse("HOME tells no place for the registry: give --db or set DRCTL_DB");
     }
     openlog("drctl", LOG_PID | (options.verbose ? LOG_PERROR : 0), LOG_USER);
-    const int status = run(options);
-    if (std::cout.flush()) return status;
-    std::cerr << "drctl: cannot write to standard output\n";
-    return kFailure;
+    return FlushOutput(run(options));
   }
 
  private:
   using Action = int (*)(const Options&);
+
+  int Refuse(const std::string& complaint) const {
+    if (options.json) {
+      Complain("", MakeErr(KeloDRCore::ERR::BAD_PARAMETER, complaint), true);
+    } else {
+      std::cerr << "drctl: " << Printable(complaint) << "\nRun 'drctl help' for the commands.\n";
+    }
+    return kUsageError;
+  }
+
+  int PrintHelp() const {
+    std::string text;
+    if (!FindHelp(app, options.words, text)) return Refuse(text);
+    std::cout << text;
+    return FlushOutput(0);
+  }
+
+  static int FlushOutput(int status) {
+    if (std::cout.flush()) return status;
+    std::cerr << "drctl: cannot write to standard output\n";
+    return kFailure;
+  }
 
   CLI::App* AddCommand(CLI::App* parent, const std::string& name, const std::string& description,
                        Action action, bool isOnDb = true) {
@@ -71,10 +114,11 @@ class CommandLine {
     command->add_option("--state", options.state, "State, \"unknown\" for a new node");
   }
 
-  void AddListOptions(CLI::App* command) {
-    command->add_flag("--json", options.json, "Print one line of JSON instead of a table");
+  void AddListOptions(CLI::App* command, const std::vector<Column>& columns) {
     command->add_option("--filter", options.query.filters,
-                        "Only rows with FIELD=VALUE or FIELD!=VALUE; may be repeated");
+                        "Only rows with FIELD=VALUE or FIELD!=VALUE; may be repeated. FIELD is "
+                        "one of " +
+                            Names(columns));
     command->add_option("--order", options.query.order, "Sort by FIELD; may be repeated");
     command->add_flag("!--desc", options.query.ascending, "Sort descending");
     command->add_option("--limit", options.query.limit, "At most that many rows")
@@ -114,7 +158,7 @@ class CommandLine {
     AddName(set);
     AddNodeFields(set, false);
     AddName(AddCommand(node, "remove", "Removes a node", RemoveNode));
-    AddListOptions(AddCommand(node, "list", "Lists the nodes", ListNodes));
+    AddListOptions(AddCommand(node, "list", "Lists the nodes", ListNodes), NodeColumns());
     AddCommand(node, "count", "Counts the nodes", CountNodes);
   }
 
@@ -123,7 +167,7 @@ class CommandLine {
     volume->require_subcommand(1);
     AddCommand(volume, "scan", "Stores the mounted volumes", ScanVolumes);
     CLI::App* const list = AddCommand(volume, "list", "Lists the stored volumes", ListVolumes);
-    AddListOptions(list);
+    AddListOptions(list, VolumeColumns());
     AddCacheOptions(list);
   }
 
@@ -134,17 +178,15 @@ class CommandLine {
         AddCommand(system, "info", "Shows a file of key=value lines", ShowSystem, false);
     options.file = "/etc/os-release";
     info->add_option("--file", options.file, "The file")->capture_default_str();
-    info->add_flag("--json", options.json, "Print one line of JSON");
   }
 
   void AddTransferCommands() {
-    CLI::App* const to =
-        AddCommand(&app, "export", "Writes the registry to a JSON file", ExportRegistry);
-    CLI::App* const from =
-        AddCommand(&app, "import", "Replaces the registry by that of a JSON file", ImportRegistry);
-    for (CLI::App* const command : {to, from}) {
-      command->add_option("file", options.file, "The JSON file")->required();
-    }
+    AddCommand(&app, "export", "Writes the registry to a JSON file", ExportRegistry)
+        ->add_option("file", options.file, "The JSON file, or - for standard output")
+        ->required();
+    AddCommand(&app, "import", "Replaces the registry by that of a JSON file", ImportRegistry)
+        ->add_option("file", options.file, "The JSON file, or - for standard input")
+        ->required();
   }
 
   void AddCallCommand() {
@@ -158,7 +200,13 @@ class CommandLine {
     AddMaxAge(call);
   }
 
+  void AddHelpCommand() {
+    help = app.add_subcommand("help", "Shows the help of a command");
+    help->add_option("command", options.words, "The command's words; none: all commands");
+  }
+
   CLI::App app{"A registry of replication nodes and of this machine's volumes", "drctl"};
+  CLI::App* help = nullptr;
   Options options;
   Action run = nullptr;
   bool needsDb = true;

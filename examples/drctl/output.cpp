@@ -1,18 +1,58 @@
 #include "output.h"
 
+#include <kelodrcore/err.h>
 #include <kelodrcore/json_value.h>
 
 #include <algorithm>
+#include <array>
+#include <ctime>
 #include <iostream>
 
 namespace drctl {
 
-using KeloDRCore::SqliteValueList;
-namespace JsonValue = KeloDRCore::JsonValue;
+using namespace KeloDRCore;
 
 namespace {
 
-// Control characters in a name must not reach the terminal as such.
+// ISO 8601 in UTC.
+std::string TimeText(unsigned int seconds) {
+  const std::time_t time = seconds;
+  std::tm parts = {};
+  std::array<char, 32> text{};
+  gmtime_r(&time, &parts);
+  return {text.data(), std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%SZ", &parts)};
+}
+
+std::string Cell(const Json::Value& value, const Column& column) {
+  if (column.kind == Kind::kTime && value.isUInt()) return TimeText(value.asUInt());
+  return Printable(value.asString());
+}
+
+// The characters of a text in UTF-8: every byte but those that continue one.
+size_t Length(const std::string& text) {
+  return static_cast<size_t>(
+      std::count_if(text.begin(), text.end(), [](char c) { return (c & 0xc0) != 0x80; }));
+}
+
+void PrintLine(const std::vector<std::string>& cells, const std::vector<Column>& columns) {
+  std::string line;
+  for (size_t i = 0; i < cells.size(); ++i) {
+    const size_t length = Length(cells[i]);
+    const std::string padding(columns[i].width - std::min(columns[i].width, length), ' ');
+    if (i > 0) line += "  ";
+    line += columns[i].IsNumber() ? padding + cells[i] : cells[i] + padding;
+  }
+  line.erase(line.find_last_not_of(' ') + 1);
+  std::cout << line << '\n';
+}
+
+// The reason as a sentence: the program's own, or SQLite's.
+std::string Reason(const Json::Value& message) {
+  return message.isObject() ? message["sqlite_errmsg"].asString() : message.asString();
+}
+
+}  // namespace
+
 std::string Printable(std::string text) {
   std::replace_if(
       text.begin(), text.end(),
@@ -20,45 +60,59 @@ std::string Printable(std::string text) {
   return text;
 }
 
-std::vector<std::string> Cells(const SqliteValueList& row, const std::vector<Column>& columns) {
+void RowPrinter::Begin() {
+  if (isBegun) return;
+  isBegun = true;
+  if (asJson) {
+    std::cout << '[';
+    return;
+  }
+  std::vector<std::string> headings;
+  for (const Column& column : columns) headings.push_back(column.name);
+  PrintLine(headings, columns);
+}
+
+bool RowPrinter::Print(const SqliteValueList& row) {
+  if (asJson && isBegun) std::cout << ',';
+  Begin();
   const Json::Value json = ToJson(row, columns);
+  if (asJson) {
+    std::cout << JsonValue::toString(json);
+    return std::cout.good();
+  }
   std::vector<std::string> cells;
-  for (const Column& column : columns) cells.push_back(Printable(json[column.name].asString()));
-  return cells;
+  for (const Column& column : columns) cells.push_back(Cell(json[column.name], column));
+  PrintLine(cells, columns);
+  return std::cout.good();
 }
 
-void PrintTable(const std::vector<std::vector<std::string>>& lines,
-                const std::vector<Column>& columns) {
-  std::vector<size_t> widths(columns.size());
-  for (const auto& line : lines) {
-    for (size_t i = 0; i < widths.size(); ++i) widths[i] = std::max(widths[i], line[i].size());
-  }
-  for (const auto& line : lines) {
-    std::string text;
-    for (size_t i = 0; i < widths.size(); ++i) {
-      const std::string padding(widths[i] - line[i].size(), ' ');
-      if (i > 0) text += "  ";
-      text += columns[i].isNumber ? padding + line[i] : line[i] + padding;
-    }
-    text.erase(text.find_last_not_of(' ') + 1);
-    std::cout << text << '\n';
-  }
-}
-
-}  // namespace
-
-void Print(const Rows& rows, const std::vector<Column>& columns, bool asJson) {
-  if (asJson) return PrintJson(ToJson(rows, columns));
-  std::vector<std::vector<std::string>> lines(1);
-  for (const Column& column : columns) lines.front().push_back(column.name);
-  for (const SqliteValueList& row : rows) lines.push_back(Cells(row, columns));
-  PrintTable(lines, columns);
+void RowPrinter::End() {
+  Begin();
+  if (asJson) std::cout << "]\n";
 }
 
 void PrintJson(const Json::Value& value) { std::cout << JsonValue::toString(value) << '\n'; }
 
-int Complain(const std::string& what, const Json::Value& err) {
-  std::cerr << "drctl: " << what << ": " << JsonValue::toString(err) << '\n';
+void PrintDone(const std::string& sentence, const Json::Value& counts, bool asJson) {
+  if (asJson) return PrintJson(counts);
+  std::cout << sentence << '\n';
+}
+
+Json::Value MakeErr(int code, const Json::Value& message) {
+  Json::Value err;
+  err["err_code"] = code;
+  err["err_code_str"] = ERR::ToString(code);
+  err["err_msg"] = message;
+  return err;
+}
+
+int Complain(const std::string& what, const Json::Value& err, bool asJson) {
+  if (asJson) {
+    std::cerr << JsonValue::toString(err) << '\n';
+  } else {
+    std::cerr << "drctl: " << Printable(what) << ": " << Printable(Reason(err["err_msg"])) << " ("
+              << err["err_code_str"].asString() << ")\n";
+  }
   return 1;
 }
 

@@ -12,12 +12,41 @@
 
 namespace drctl {
 
-// One line of JSON, or a table with a line of headings; to standard output.
-void Print(const Rows& rows, const std::vector<Column>& columns, bool asJson);
+// Writes rows to standard output one by one: as a table with a line of headings, or as one line of
+// JSON. Nothing is written before the first row or the end.
+class RowPrinter {
+ public:
+  RowPrinter(const std::vector<Column>& printedColumns, bool isJson)
+      : columns(printedColumns), asJson(isJson) {}
+
+  // False when nothing more can be written.
+  bool Print(const KeloDRCore::SqliteValueList& row);
+
+  // What stands after the last row.
+  void End();
+
+ private:
+  void Begin();
+
+  const std::vector<Column>& columns;
+  bool asJson;
+  bool isBegun = false;
+};
+
+// The text without control characters, which must not reach a terminal as such.
+std::string Printable(std::string text);
+
 void PrintJson(const Json::Value& value);
 
-// "drctl: what: error document", to standard error. Returns the exit status of a failure.
-int Complain(const std::string& what, const Json::Value& err);
+// What a change has done: as a sentence for people, or as JSON.
+void PrintDone(const std::string& sentence, const Json::Value& counts, bool asJson);
+
+// A failure as a document of the form that `SqliteDB::GetErr` gives.
+Json::Value MakeErr(int code, const Json::Value& message);
+
+// Writes a failure to standard error: "drctl: WHAT: reason (NAME OF THE CODE)" for people, or the
+// document as one line of JSON. Returns the exit status of a failure.
+int Complain(const std::string& what, const Json::Value& err, bool asJson);
 
 }  // namespace drctl
 

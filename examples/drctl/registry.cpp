@@ -3,8 +3,9 @@
 #include <kelodrcore/err.h>
 #include <kelodrcore/sqlite_condition.h>
 
-#include <algorithm>
 #include <charconv>
+
+#include "paths.h"
 
 namespace drctl {
 
@@ -14,6 +15,7 @@ namespace {
 
 constexpr unsigned int kRetries = 10;
 constexpr int kSqliteConstraint = 19;
+constexpr char kBadName[] = "the name cannot be looked for";
 
 const SqliteTableHandler kNodes("node",
                                 "name TEXT PRIMARY KEY NOT NULL, address TEXT NOT NULL, "
@@ -27,7 +29,7 @@ const SqliteTableHandler kVolumes("volume",
 
 // The value of a filter in the type of its column; invalid when it does not fit.
 SqliteValue FilterValue(const Column& column, const std::string& text) {
-  if (!column.isNumber) return text;
+  if (!column.IsNumber()) return text;
   unsigned int number = 0;
   const char* const end = text.data() + text.size();
   const auto result = std::from_chars(text.data(), end, number);
@@ -50,7 +52,16 @@ SqliteCondition ParseFilter(const std::vector<Column>& columns, const std::strin
 
 }  // namespace
 
-Registry::Registry(const std::string& path) : SqliteDB(path, kRetries, "[drctl]") {}
+Registry::Registry(const std::string& db) : SqliteDB(db, kRetries, "[drctl]"), path(db) {}
+
+// SQLite has no message for a file that it could not open.
+Json::Value Registry::GetErr() const {
+  Json::Value err = SqliteDB::GetErr();
+  if (err["err_code"] == ERR::ERR_DATABASE_OPERATION && !err.isMember("err_msg")) {
+    err["err_msg"] = "'" + path + "' cannot be opened";
+  }
+  return err;
+}
 
 std::string Registry::GetErrCodeStr(int code) const { return code != 0 ? ERR::ToString(code) : ""; }
 
@@ -58,6 +69,10 @@ bool Registry::Fail(int code, const std::string& message) {
   errCode = code;
   errMsg = message;
   return false;
+}
+
+bool Registry::CheckThere() {
+  return IsExisted() || Fail(ERR::ERR_DATABASE_OPERATION, "there is no registry at '" + path + "'");
 }
 
 // BEGIN IMMEDIATE takes the write lock at once, so that what the steps read stays true. Closing
@@ -71,12 +86,13 @@ bool Registry::InTransaction(const std::function<bool()>& steps) {
 bool Registry::AddNode(const SqliteValueList& node) {
   const std::string complaint = CheckNode(node, true);
   if (!complaint.empty()) return Fail(ERR::BAD_PARAMETER, complaint);
+  MakeDefaultDir(path);
   InsertCommand command;
   command.SetTable(kNodes);
   command.SetFieldValues(node);
   if (InsertRecord(command)) return true;
   // The primary key decides, so that two processes cannot add the same name.
-  if (GetErr()["err_msg"].get("sqlite_errcode", 0) == kSqliteConstraint) {
+  if (errMsg.isObject() && errMsg["sqlite_errcode"] == kSqliteConstraint) {
     return Fail(ERR::ERR_NODE_EXIST, "there is a node of that name");
   }
   return false;
@@ -95,7 +111,8 @@ bool Registry::SetNode(const std::string& name, const SqliteValueList& changes) 
   UpdateCommand command;
   command.SetTable(kNodes);
   command.SetFieldValues(changes);
-  command.SetCondition(SqliteEqual("name", name));
+  // Without a condition every node would be changed.
+  if (!command.SetCondition(SqliteEqual("name", name))) return Fail(ERR::BAD_PARAMETER, kBadName);
   return ChangeNode(name, [&] { return UpdateRecord(command); });
 }
 
@@ -108,7 +125,7 @@ bool Registry::GetNode(const std::string& name, SqliteValueList& node) {
   SelectCommand command;
   command.SetTable(kNodes);
   command.SelectAll();
-  command.SetCondition(SqliteEqual("name", name));
+  if (!command.SetCondition(SqliteEqual("name", name))) return Fail(ERR::BAD_PARAMETER, kBadName);
   Rows rows;
   if (IsExisted() && !SelectRecords(command, rows)) return false;
   if (rows.empty()) return Fail(ERR::ERR_NODE_NOT_EXIST, "there is no node of that name");
@@ -116,38 +133,58 @@ bool Registry::GetNode(const std::string& name, SqliteValueList& node) {
   return true;
 }
 
-bool Registry::ListNodes(const Query& query, Rows& rows) {
-  return List(kNodes, NodeColumns(), query, rows);
-}
-
 bool Registry::CountNodes(int& count) {
   count = 0;
   return !IsExisted() || (CreateTable(kNodes) && GetCount(kNodes, count));
 }
 
-bool Registry::InsertAll(const SqliteTableHandler& table, const Rows& rows) {
-  return std::all_of(rows.begin(), rows.end(), [&](const SqliteValueList& row) {
+bool Registry::EachNode(const Query& query, const Take& take) {
+  return Each(kNodes, NodeColumns(), query, take);
+}
+
+bool Registry::EachVolume(const Query& query, const Take& take) {
+  return Each(kVolumes, VolumeColumns(), query, take);
+}
+
+bool Registry::ReadNodes(const Query& query, Json::Value& nodes) {
+  nodes = Json::arrayValue;
+  return EachNode(query, [&](const SqliteValueList& row) {
+    nodes.append(ToJson(row, NodeColumns()));
+    return true;
+  });
+}
+
+bool Registry::ReadVolumes(const Query& query, Json::Value& volumes) {
+  volumes = Json::arrayValue;
+  return EachVolume(query, [&](const SqliteValueList& row) {
+    volumes.append(ToJson(row, VolumeColumns()));
+    return true;
+  });
+}
+
+bool Registry::Replace(const SqliteTableHandler& table, const Rows& rows,
+                       const std::function<void(size_t done)>& tell) {
+  if (!DeleteAllRecords(table)) return false;
+  for (const SqliteValueList& row : rows) {
     InsertCommand command;
     command.SetTable(table);
-    command.SetReplacable(true);
     command.SetFieldValues(row);
-    return InsertRecord(command);
-  });
+    if (!InsertRecord(command)) return false;
+    tell(1);
+  }
+  return true;
 }
 
 bool Registry::ReplaceVolumes(const Rows& volumes) {
-  return InTransaction([&] { return DeleteAllRecords(kVolumes) && InsertAll(kVolumes, volumes); });
+  MakeDefaultDir(path);
+  return InTransaction([&] { return Replace(kVolumes, volumes, [](size_t) {}); });
 }
 
-bool Registry::ListVolumes(const Query& query, Rows& rows) {
-  return List(kVolumes, VolumeColumns(), query, rows);
-}
-
-bool Registry::ReplaceAll(const Rows& nodes, const Rows& volumes) {
-  return InTransaction([&] {
-    return DeleteAllRecords(kNodes) && InsertAll(kNodes, nodes) && DeleteAllRecords(kVolumes) &&
-           InsertAll(kVolumes, volumes);
-  });
+bool Registry::ReplaceAll(const Rows& nodes, const Rows& volumes,
+                          const std::function<void(size_t done)>& tell) {
+  MakeDefaultDir(path);
+  return InTransaction(
+      [&] { return Replace(kNodes, nodes, tell) && Replace(kVolumes, volumes, tell); });
 }
 
 bool Registry::SetFilters(SelectCommand& command, const std::vector<Column>& columns,
@@ -155,7 +192,11 @@ bool Registry::SetFilters(SelectCommand& command, const std::vector<Column>& col
   SqliteCondition all;
   for (const std::string& filter : filters) {
     const SqliteCondition condition = ParseFilter(columns, filter);
-    if (!condition.IsValid()) return Fail(ERR::BAD_PARAMETER, "bad filter: " + filter);
+    if (!condition.IsValid()) {
+      return Fail(ERR::BAD_PARAMETER, "the filter '" + filter +
+                                          "' is not FIELD=VALUE or FIELD!=VALUE with a FIELD of " +
+                                          Names(columns) + " (numbers in digits)");
+    }
     all = all.IsValid() ? SqliteCondition(SqliteAnd(all, condition)) : condition;
   }
   return !all.IsValid() || command.SetCondition(all);
@@ -165,16 +206,16 @@ bool Registry::SetOrder(SelectCommand& command, const std::vector<Column>& colum
                         const std::vector<std::string>& order) {
   for (const std::string& field : order) {
     if (FindColumn(columns, field) == nullptr) {
-      return Fail(ERR::BAD_PARAMETER, "no such field: " + field);
+      return Fail(ERR::BAD_PARAMETER,
+                  "there is no field '" + field + "' to sort by, only " + Names(columns));
     }
     command.AddOrderField(field);
   }
   return true;
 }
 
-// A missing file is an empty registry.
-bool Registry::List(const SqliteTableHandler& table, const std::vector<Column>& columns,
-                    const Query& query, Rows& rows) {
+bool Registry::Each(const SqliteTableHandler& table, const std::vector<Column>& columns,
+                    const Query& query, const Take& take) {
   SelectCommand command;
   command.SetTable(table);
   command.SelectAll();
@@ -183,7 +224,13 @@ bool Registry::List(const SqliteTableHandler& table, const std::vector<Column>& 
   if (!SetOrder(command, columns, query.order)) return false;
   // A count of rows that no table reaches stands for all of them.
   command.SetLimit(query.offset, query.limit > 0 ? query.limit : INT32_MAX);
-  return !IsExisted() || SelectRecords(command, rows);
+  if (!IsExisted()) return true;
+  Rows rows;
+  if (!SelectRecords(command, rows)) return false;
+  for (const SqliteValueList& row : rows) {
+    if (!take(row)) break;
+  }
+  return true;
 }
 
 }  // namespace drctl

@@ -11,7 +11,7 @@ namespace {
 
 // The value of a member in the type of its column; invalid when it does not fit.
 SqliteValue ToValue(const Column& column, const Json::Value& member) {
-  if (column.isNumber) return member.isUInt() ? SqliteValue(member.asUInt()) : SqliteValue();
+  if (column.IsNumber()) return member.isUInt() ? SqliteValue(member.asUInt()) : SqliteValue();
   return member.isString() ? SqliteValue(member.asString()) : SqliteValue();
 }
 
@@ -33,7 +33,7 @@ std::string CheckPort(const SqliteValueList& row) {
 
 std::string CheckColumn(const SqliteValueList& row, const Column& column) {
   if (column.name == "port") return CheckPort(row);
-  if (!column.isNumber) return CheckText(row, column.name);
+  if (!column.IsNumber()) return CheckText(row, column.name);
   return row.HasField(column.name) ? "" : column.name + " is missing";
 }
 
@@ -49,16 +49,25 @@ std::string CheckRow(const SqliteValueList& row, const std::vector<Column>& colu
 }  // namespace
 
 const std::vector<Column>& NodeColumns() {
-  static const std::vector<Column> columns = {
-      {"name", false}, {"address", false}, {"port", true}, {"state", false}};
+  static const std::vector<Column> columns = {{"name", Kind::kText, 20},
+                                              {"address", Kind::kText, 20},
+                                              {"port", Kind::kNumber, 5},
+                                              {"state", Kind::kText, 10}};
   return columns;
 }
 
 const std::vector<Column>& VolumeColumns() {
-  static const std::vector<Column> columns = {{"mount_point", false}, {"device", false},
-                                              {"fs_type", false},     {"size_mib", true},
-                                              {"free_mib", true},     {"scanned_at", true}};
+  static const std::vector<Column> columns = {
+      {"mount_point", Kind::kText, 24}, {"device", Kind::kText, 16},
+      {"fs_type", Kind::kText, 8},      {"size_mib", Kind::kNumber, 10},
+      {"free_mib", Kind::kNumber, 10},  {"scanned_at", Kind::kTime, 20}};
   return columns;
+}
+
+std::string Names(const std::vector<Column>& columns) {
+  std::string names;
+  for (const Column& column : columns) names += (names.empty() ? "" : ", ") + column.name;
+  return names;
 }
 
 const Column* FindColumn(const std::vector<Column>& columns, const std::string& name) {
@@ -73,9 +82,9 @@ Json::Value ToJson(const SqliteValueList& row, const std::vector<Column>& column
     if (!row.HasField(column.name)) continue;
     unsigned int number = 0;
     std::string text;
-    if (column.isNumber && row.GetValue(column.name, number)) {
+    if (column.IsNumber() && row.GetValue(column.name, number)) {
       object[column.name] = number;
-    } else if (!column.isNumber && row.GetValue(column.name, text)) {
+    } else if (!column.IsNumber() && row.GetValue(column.name, text)) {
       object[column.name] = text;
     }
   }
@@ -96,7 +105,7 @@ std::string FromJson(const Json::Value& object, const std::vector<Column>& colum
     if (column == nullptr) return "unknown member '" + member + "'";
     const SqliteValue value = ToValue(*column, object[member]);
     if (!value.IsValid()) {
-      return member + (column->isNumber ? " must be a number" : " must be a text");
+      return member + (column->IsNumber() ? " must be a number" : " must be a text");
     }
     row.AddValue(member, value);
   }

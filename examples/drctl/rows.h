@@ -13,14 +13,23 @@ namespace drctl {
 
 using Rows = std::vector<KeloDRCore::SqliteValueList>;
 
-// A column, as commands and output name it. Numbers are unsigned and have 32 bits.
+// Numbers are unsigned and have 32 bits; a time is the number of seconds since the epoch.
+enum class Kind { kText, kNumber, kTime };
+
+// A column, as commands and output name it.
 struct Column {
   std::string name;
-  bool isNumber;
+  Kind kind;
+  size_t width;  // in a table; what is longer moves the rest of its line
+
+  bool IsNumber() const { return kind != Kind::kText; }
 };
 
 const std::vector<Column>& NodeColumns();
 const std::vector<Column>& VolumeColumns();
+
+// The names of the columns, for messages: "name, address, port, state".
+std::string Names(const std::vector<Column>& columns);
 
 // Null when there is no such column.
 const Column* FindColumn(const std::vector<Column>& columns, const std::string& name);

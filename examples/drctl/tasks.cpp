@@ -1,6 +1,7 @@
 #include "tasks.h"
 
 #include <fcntl.h>
+#include <kelodrcore/err.h>
 #include <kelodrcore/file.h>
 #include <kelodrcore/file_lock.h>
 #include <kelodrcore/json_value.h>
@@ -90,19 +91,27 @@ void Tasks::ForgetOld() const {
 
 // The task's process holds a lock for as long as it lives. This process takes it, so that it is
 // held from the first poll on, and passes it on through the fork.
-std::string Tasks::Start(const std::function<bool()>& work) {
+Started Tasks::Start(const std::function<bool()>& work) {
   const std::string id = GenerateUUID();
-  if (!IsUuid(id) || !File::CreateDir(dir, 0700)) return "";
+  if (!IsUuid(id)) return {"", ERR::ERR_UNKNOWN, "/usr/bin/uuidgen gives no id"};
+  if (!File::CreateDir(dir, 0700)) {
+    return {"", ERR::ERR_UNKNOWN, "the directory " + dir + " cannot be made"};
+  }
   ForgetOld();
   FileLock life(StateFile(id));
-  if (!life.lock(LOCK_EX | LOCK_NB, 5) || !WriteState(id, TaskState::kRunning)) return "";
+  if (!life.lock(LOCK_EX | LOCK_NB, 5)) {
+    return {"", ERR::ERR_UNKNOWN, "the lock of the task cannot be taken"};
+  }
+  if (!WriteState(id, TaskState::kRunning)) {
+    return {"", ERR::ERR_UNKNOWN, "the file " + StateFile(id) + " cannot be written"};
+  }
   const bool isStarted = RunDetached([&] {
     WriteState(id, work() ? TaskState::kSucceeded : TaskState::kFailed);
     RemoveLock(StateFile(id));
   });
-  if (isStarted) return id;
+  if (isStarted) return {id, 0, ""};
   unlink(StateFile(id).c_str());
-  return "";
+  return {"", ERR::ERR_FORK_FAILED, "no process can be started"};
 }
 
 TaskState Tasks::Poll(const std::string& id) const {

@@ -10,14 +10,21 @@ namespace drctl {
 
 enum class TaskState { kUnknown, kRunning, kSucceeded, kFailed };
 
+// What became of the start of a task: its id, or an empty one with a code of `ERR` and the reason.
+struct Started {
+  std::string id;
+  int code = 0;
+  std::string reason;
+};
+
 class Tasks {
  public:
   // `stateDir` is where the files are; created with the first task.
   explicit Tasks(const std::string& stateDir);
 
   // Runs `work` in a process of its own, which outlives this one and shares none of its streams.
-  // The task's id, or the empty text when it could not be started. Forgets tasks of yesterday.
-  std::string Start(const std::function<bool()>& work);
+  // Forgets tasks of yesterday.
+  Started Start(const std::function<bool()>& work);
 
   // A task whose process died before its end has failed. Unknown for an id that Start never gave.
   TaskState Poll(const std::string& id) const;

@@ -7,9 +7,11 @@
 #include <cerrno>
 #include <cstring>
 #include <iostream>
+#include <iterator>
 #include <set>
 
 #include "output.h"
+#include "progress.h"
 
 namespace drctl {
 
@@ -19,6 +21,7 @@ namespace {
 
 constexpr char kFormat[] = "drctl registry";
 constexpr int kVersion = 1;
+constexpr char kStream[] = "-";
 
 // What an import expects of one of the two lists.
 struct Section {
@@ -42,74 +45,101 @@ std::string ReadEntry(const Json::Value& entry, const Section& section, std::set
   return keys.insert(key).second ? "" : "there is another " + std::string(section.key) + " " + key;
 }
 
-// The rows of one list of the document; false when an entry was refused.
-bool ReadSection(const Json::Value& document, const Section& section, Rows& rows) {
+// The rows of one list of the document; what is wrong with its entries is added to `refused`.
+Rows ReadSection(const Json::Value& document, const Section& section, Json::Value& refused) {
+  Rows rows;
   const Json::Value& entries = document[section.member];
   if (!entries.isArray()) {
-    std::cerr << "drctl: refused: " << section.member << " is not an array\n";
-    return false;
+    refused.append(std::string(section.member) + " is not an array");
+    return rows;
   }
-  bool isGood = true;
   std::set<std::string> keys;
   for (Json::ArrayIndex i = 0; i < entries.size(); ++i) {
     SqliteValueList row;
     const std::string complaint = ReadEntry(entries[i], section, keys, row);
     if (complaint.empty()) {
       rows.push_back(row);
-      continue;
+    } else {
+      refused.append(std::string(section.member) + "[" + std::to_string(i) + "]: " + complaint);
     }
-    std::cerr << "drctl: refused: " << section.member << "[" << i << "]: " << complaint << '\n';
-    isGood = false;
   }
-  return isGood;
+  return rows;
+}
+
+bool ReadDocument(const std::string& file, Json::Value& document) {
+  if (file != kStream) return File::Read(file, document);
+  const std::string text{std::istreambuf_iterator<char>(std::cin), {}};
+  return JsonValue::fromString(document, text);
 }
 
 // Empty when the document is of the right kind.
 std::string CheckDocument(const Json::Value& document) {
-  if (document.isNull()) return "no such file";
-  if (!document.isObject() || document["format"] != kFormat) return "not a registry's export";
-  return document["version"] == kVersion ? "" : "unknown version";
+  if (document.isNull()) return "there is no such file";
+  if (!document.isObject() || document["format"] != kFormat) return "it is not a registry's export";
+  return document["version"] == kVersion ? "" : "its version is unknown";
 }
 
-int Refuse(const std::string& file, const std::string& why) {
-  std::cerr << "drctl: cannot import '" << file << "': " << why << '\n';
-  return 1;
+// What is wrong with single entries is said line by line, or all in one document.
+int RefuseEntries(const std::string& what, const Json::Value& refused, bool asJson) {
+  if (asJson) return Complain(what, MakeErr(ERR::BAD_PARAMETER, refused), asJson);
+  for (const Json::Value& entry : refused) {
+    std::cerr << "drctl: refused: " << Printable(entry.asString()) << '\n';
+  }
+  return Complain(what, MakeErr(ERR::BAD_PARAMETER, "nothing was changed"), asJson);
+}
+
+int TellDone(size_t nodes, size_t volumes, const std::string& done, bool asJson) {
+  Json::Value counts;
+  counts[kNodeSection.member] = Json::UInt64{nodes};
+  counts[kVolumeSection.member] = Json::UInt64{volumes};
+  PrintDone(std::to_string(nodes) + " nodes and " + std::to_string(volumes) + " volumes " + done,
+            counts, asJson);
+  return 0;
 }
 
 }  // namespace
 
-int Export(Registry& registry, const std::string& file) {
-  Rows nodes;
-  Rows volumes;
-  if (!registry.ListNodes({}, nodes) || !registry.ListVolumes({}, volumes)) {
-    return Complain("cannot read the registry", registry.GetErr());
-  }
+int ExportRegistry(const Options& options) {
+  Registry registry(options.db);
   Json::Value document;
   document["format"] = kFormat;
   document["version"] = kVersion;
-  document[kNodeSection.member] = ToJson(nodes, NodeColumns());
-  document[kVolumeSection.member] = ToJson(volumes, VolumeColumns());
-  if (!JsonValue::toFile(document, file)) {
-    std::cerr << "drctl: cannot write '" << file << "': " << std::strerror(errno) << '\n';
-    return 1;
+  Json::Value& nodes = document[kNodeSection.member];
+  Json::Value& volumes = document[kVolumeSection.member];
+  if (!registry.CheckThere() || !registry.ReadNodes({}, nodes) ||
+      !registry.ReadVolumes({}, volumes)) {
+    return Complain("cannot export", registry.GetErr(), options.json);
   }
-  std::cout << nodes.size() << " nodes and " << volumes.size() << " volumes exported\n";
-  return 0;
+  if (options.file == kStream) {
+    PrintJson(document);
+    return 0;
+  }
+  if (!JsonValue::toFile(document, options.file)) {
+    return Complain("cannot write '" + options.file + "'",
+                    MakeErr(ERR::ERR_UNKNOWN, std::strerror(errno)), options.json);
+  }
+  return TellDone(nodes.size(), volumes.size(), "exported", options.json);
 }
 
-int Import(Registry& registry, const std::string& file) {
+int ImportRegistry(const Options& options) {
+  const std::string what = "cannot import '" + options.file + "'";
   Json::Value document;
-  if (!File::Read(file, document)) return Refuse(file, "not a JSON document");
-  const std::string complaint = CheckDocument(document);
-  if (!complaint.empty()) return Refuse(file, complaint);
-  Rows nodes;
-  Rows volumes;
-  const bool nodesAreGood = ReadSection(document, kNodeSection, nodes);
-  const bool volumesAreGood = ReadSection(document, kVolumeSection, volumes);
-  if (!nodesAreGood || !volumesAreGood) return Refuse(file, "nothing was changed");
-  if (!registry.ReplaceAll(nodes, volumes)) return Complain("cannot import", registry.GetErr());
-  std::cout << nodes.size() << " nodes and " << volumes.size() << " volumes imported\n";
-  return 0;
+  std::string complaint = "it is not a JSON document";
+  if (ReadDocument(options.file, document)) complaint = CheckDocument(document);
+  if (!complaint.empty()) {
+    return Complain(what, MakeErr(ERR::BAD_PARAMETER, complaint), options.json);
+  }
+  Json::Value refused(Json::arrayValue);
+  const Rows nodes = ReadSection(document, kNodeSection, refused);
+  const Rows volumes = ReadSection(document, kVolumeSection, refused);
+  if (!refused.empty()) return RefuseEntries(what, refused, options.json);
+  Registry registry(options.db);
+  Progress progress(nodes.size() + volumes.size());
+  const auto tell = [&](size_t rows) { progress.Add(rows); };
+  if (!registry.ReplaceAll(nodes, volumes, tell)) {
+    return Complain(what, registry.GetErr(), options.json);
+  }
+  return TellDone(nodes.size(), volumes.size(), "imported", options.json);
 }
 
 }  // namespace drctl

@@ -7,15 +7,14 @@
 #include <kelodrcore/response.h>
 #include <sys/stat.h>
 
-#include "support/clean_test.h"
-#include "support/process.h"
+#include "drctl/locks.h"
 #include "support/program.h"
 
 namespace {
 
 using namespace KeloDRCore;
 
-class DrctlCallTest : public CleanTest {
+class DrctlCallTest : public LocksTest {
  protected:
   std::vector<std::string> Program() { return {DRCTL, "--db", Path("registry.db"), "call"}; }
 
@@ -47,11 +46,6 @@ class DrctlCallTest : public CleanTest {
   void CreateNode(const std::string& name) {
     ASSERT_TRUE(Call("Node", "create", "{\"name\":\"" + name + "\",\"address\":\"a\",\"port\":80}")
                     .isSuccess());
-  }
-
-  void TearDown() override {
-    RunProgram(dir, {"/bin/rm", "-rf", "/tmp/.kelodr_lock/" + dir});
-    CleanTest::TearDown();
   }
 };
 
@@ -146,9 +140,9 @@ TEST_F(DrctlCallTest, SqlInEveryTextIsOnlyText) {
 }
 
 TEST_F(DrctlCallTest, VolumesComeThroughTheCache) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+  if (!CanMakeLocks()) GTEST_SKIP() << kNeedsLocks;
   const Response first = Call("Volume", "list");
-  EXPECT_EQ(first.getDataField("volumes").size() > 1, true);
+  EXPECT_GT(first.getDataField("volumes").size(), 0U);
   EXPECT_EQ(first.getAdditional()["source"], "a fresh scan");
   const Response second = Call("Volume", "list");
   EXPECT_EQ(second.getAdditional()["source"], "the cache file");
@@ -156,7 +150,7 @@ TEST_F(DrctlCallTest, VolumesComeThroughTheCache) {
 }
 
 TEST_F(DrctlCallTest, AScanIsPolledUntilItHasSucceeded) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+  if (!CanMakeLocks()) GTEST_SKIP() << kNeedsLocks;
   const std::string id = Call("Volume", "scan").getTaskId();
   ASSERT_EQ(id.size(), 36U);
   Response reply;
@@ -168,11 +162,11 @@ TEST_F(DrctlCallTest, AScanIsPolledUntilItHasSucceeded) {
   EXPECT_TRUE(reply.isPollSuccess());
   const Outcome listed =
       RunProgram(dir, {DRCTL, "--db", Path("registry.db"), "volume", "list", "--json"});
-  EXPECT_NE(listed.out.find("\"mount_point\":\"/proc\""), std::string::npos);
+  EXPECT_NE(listed.out.find("\"mount_point\":"), std::string::npos);
 }
 
 TEST_F(DrctlCallTest, ATaskWhoseProcessDiedHasFailed) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+  if (!CanMakeLocks()) GTEST_SKIP() << kNeedsLocks;
   const std::string id = "00000000-0000-4000-8000-000000000000";
   ASSERT_EQ(mkdir(Path("registry.db.tasks").c_str(), 0700), 0);
   WriteText(Path("registry.db.tasks/" + id + ".json"), R"({"finish":false,"success":false})");
@@ -182,7 +176,7 @@ TEST_F(DrctlCallTest, ATaskWhoseProcessDiedHasFailed) {
 }
 
 TEST_F(DrctlCallTest, TasksOfYesterdayAreForgotten) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+  if (!CanMakeLocks()) GTEST_SKIP() << kNeedsLocks;
   const std::string old = Call("Volume", "scan").getTaskId();
   const std::string file = Path("registry.db.tasks/" + old + ".json");
   while (!Call("Volume", "poll", "{\"task_id\":\"" + old + "\"}").isPollFinish()) {
@@ -195,6 +189,14 @@ TEST_F(DrctlCallTest, TasksOfYesterdayAreForgotten) {
   }
 }
 
+TEST_F(DrctlCallTest, AScanThatCannotStartTellsTheReason) {
+  WriteText(Path("registry.db.tasks"), "a file where the directory should be");
+  const Response reply = Call("Volume", "scan");
+  ExpectError(reply, ERR::ERR_UNKNOWN);
+  EXPECT_EQ(reply.getErrMsg()["err_msg"], "the scan is not started: the directory " +
+                                              Path("registry.db.tasks") + " cannot be made");
+}
+
 TEST_F(DrctlCallTest, UnknownTasksAreBadParameters) {
   for (const char* const id :
        {R"("")", R"("../registry")", R"("00000000-0000-4000-8000-000000000001")", "7", "null"}) {
@@ -204,7 +206,7 @@ TEST_F(DrctlCallTest, UnknownTasksAreBadParameters) {
 }
 
 TEST_F(DrctlCallTest, SystemInfoTellsTheSystem) {
-  EXPECT_EQ(Call("System", "info").getDataFieldtoStr("ID"), "debian");
+  EXPECT_NE(Call("System", "info").getDataFieldtoStr("NAME"), "");
 }
 
 TEST_F(DrctlCallTest, ACallCanComeFromAFile) {
@@ -226,7 +228,7 @@ class DrctlCgiTest : public DrctlCallTest {
     EXPECT_EQ(outcome.status, 0);
     const size_t end = outcome.out.find("\r\n\r\n");
     EXPECT_NE(end, std::string::npos) << outcome.out;
-    const std::string head = outcome.out.substr(0, end);
+    head = outcome.out.substr(0, end);
     const std::string text = outcome.out.substr(end + 4);
     EXPECT_NE(head.find("Content-Type: application/json"), std::string::npos) << head;
     EXPECT_NE(head.find("Content-Length: " + std::to_string(text.size())), std::string::npos);
@@ -235,6 +237,7 @@ class DrctlCgiTest : public DrctlCallTest {
     return head.substr(0, head.find("\r\n"));
   }
 
+  std::string head;
   Response reply;
 };
 
@@ -250,6 +253,7 @@ TEST_F(DrctlCgiTest, APostIsAnswered) {
 
 TEST_F(DrctlCgiTest, AnythingButAPostIsRefused) {
   EXPECT_EQ(RunCgi("", {"REQUEST_METHOD=GET"}), "Status: 405 Method Not Allowed");
+  EXPECT_NE(head.find("\r\nAllow: POST\r\n"), std::string::npos) << head;
   ExpectError(reply, ERR::BAD_PARAMETER);
 }
 

@@ -2,21 +2,22 @@
 
 #include <fcntl.h>
 #include <kelodrcore/json_value.h>
+#include <kelodrcore/version.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <set>
+#include <sstream>
 
-#include "support/clean_test.h"
-#include "support/process.h"
+#include "drctl/locks.h"
 #include "support/program.h"
 
 namespace {
 
 namespace JsonValue = KeloDRCore::JsonValue;
 
-class DrctlTest : public CleanTest {
+class DrctlTest : public LocksTest {
  protected:
   // Runs "drctl --db FILE ARGUMENT..." on this test's own registry.
   Outcome Run(std::vector<std::string> arguments, const std::string& input = "") {
@@ -52,7 +53,9 @@ TEST_F(DrctlTest, WithoutASubcommandItIsAUsageError) {
   const Outcome outcome = Run({});
   EXPECT_EQ(outcome.status, 2);
   EXPECT_EQ(outcome.out, "");
-  EXPECT_NE(outcome.err.find("subcommand is required"), std::string::npos) << outcome.err;
+  EXPECT_EQ(outcome.err,
+            "drctl: a command is missing; there are node, volume, system, export, import, call, "
+            "help\nRun 'drctl help' for the commands.\n");
 }
 
 TEST_F(DrctlTest, HelpGoesToStandardOutputAndSucceeds) {
@@ -65,9 +68,79 @@ TEST_F(DrctlTest, HelpGoesToStandardOutputAndSucceeds) {
   }
 }
 
-TEST_F(DrctlTest, AMissingDbIsAUsageErrorWhereOneIsNeeded) {
-  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list"}).status, 2);
-  EXPECT_EQ(RunProgram(dir, {DRCTL, "system", "info"}).status, 0);
+TEST_F(DrctlTest, VersionIsThatOfTheProject) {
+  EXPECT_EQ(Run({"--version"}).out, "drctl " KELODRCORE_VERSION "\n");
+  EXPECT_EQ(Run({"node", "list", "--version"}).status, 0);
+}
+
+TEST_F(DrctlTest, HelpShowsACommandAsItsOptionDoes) {
+  EXPECT_EQ(Run({"help"}).out, Run({"--help"}).out);
+  EXPECT_EQ(Run({"help", "node"}).out, Run({"node", "--help"}).out);
+  EXPECT_EQ(Run({"help", "node", "add"}).out, Run({"node", "add", "--help"}).out);
+  const Outcome unknown = Run({"help", "node", "ad"});
+  EXPECT_EQ(unknown.status, 2);
+  EXPECT_EQ(unknown.err,
+            "drctl: there is no command 'ad'; did you mean 'add'?\n"
+            "Run 'drctl help' for the commands.\n");
+}
+
+TEST_F(DrctlTest, AnUnknownWordIsNamedWithTheNearestKnownOne) {
+  const std::pair<std::vector<std::string>, std::string> cases[] = {
+      {{"nod", "list"}, "there is no command 'nod'; did you mean 'node'?"},
+      {{"node", "lst"}, "there is no command 'lst'; did you mean 'list'?"},
+      {{"node", "list", "--filtr=x"}, "there is no option '--filtr'; did you mean '--filter'?"},
+      {{"node", "add", "a", "--prot", "1"}, "there is no option '--prot'; did you mean '--port'?"},
+      {{"node", "list", "--jsno"}, "there is no option '--jsno'; did you mean '--json'?"},
+      {{"node", "zzzzzzzz"},
+       "there is no command 'zzzzzzzz'; there are add, set, remove, list, count"},
+      {{"node", "list", "a"}, "the word 'a' is one too many"}};
+  for (const auto& [arguments, complaint] : cases) {
+    const Outcome outcome = Run(arguments);
+    EXPECT_EQ(outcome.status, 2);
+    EXPECT_EQ(outcome.out, "");
+    EXPECT_EQ(outcome.err, "drctl: " + complaint + "\nRun 'drctl help' for the commands.\n");
+  }
+}
+
+TEST_F(DrctlTest, AUsageErrorIsJsonWhereJsonIsWanted) {
+  const Outcome outcome = Run({"nod", "--json"});
+  EXPECT_EQ(outcome.status, 2);
+  EXPECT_EQ(outcome.err,
+            "{\"err_code\":401,\"err_code_str\":\"BAD_PARAMETER\","
+            "\"err_msg\":\"there is no command 'nod'; did you mean 'node'?\"}\n");
+}
+
+TEST_F(DrctlTest, TheRegistryCanBeNamedAnywhereOnTheLine) {
+  AddNode("a");
+  const std::string db = Path("registry.db");
+  const std::string listed = Run({"node", "list"}).out;
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "--db", db, "list"}).out, listed);
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list", "--db", db}).out, listed);
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list"}, "", {"DRCTL_DB=" + db}).out, listed);
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list", "--db", db}, "", {"DRCTL_DB=/none"}).out,
+            listed);
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list", "--db", ""}).status, 2);
+}
+
+TEST_F(DrctlTest, RootHasItsRegistryInVarLib) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root";
+  const Outcome help = RunProgram(dir, {DRCTL, "--help"}, "", {"DRCTL_DB=", "HOME=" + dir});
+  EXPECT_NE(help.out.find("/var/lib/drctl/registry.db"), std::string::npos) << help.out;
+}
+
+TEST_F(DrctlTest, AnOrdinaryUserHasItsRegistryInItsOwnDirectory) {
+  if (geteuid() == 0) GTEST_SKIP() << "needs an ordinary user";
+  const std::vector<std::string> add = {DRCTL, "node", "add", "a", "--address", "b", "--port", "1"};
+  ASSERT_EQ(RunProgram(dir, add, "", {"DRCTL_DB=", "XDG_STATE_HOME=", "HOME=" + dir}).status, 0);
+  struct stat made = {};
+  ASSERT_EQ(stat(Path(".local/state/drctl").c_str(), &made), 0);
+  EXPECT_EQ(made.st_mode & 07777, 0700U);
+  EXPECT_EQ(NamesIn(Path(".local/state/drctl")), std::vector<std::string>{"registry.db"});
+  ASSERT_EQ(RunProgram(dir, add, "", {"DRCTL_DB=", "XDG_STATE_HOME=" + Path("state")}).status, 0);
+  EXPECT_EQ(NamesIn(Path("state/drctl")), std::vector<std::string>{"registry.db"});
+  const std::vector<std::string> nowhere = {"DRCTL_DB=", "XDG_STATE_HOME=relative", "HOME="};
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "node", "list"}, "", nowhere).status, 2);
+  EXPECT_EQ(RunProgram(dir, {DRCTL, "system", "info"}, "", nowhere).status, 0);
 }
 
 TEST_F(DrctlTest, BadPortsAreUsageErrors) {
@@ -88,13 +161,19 @@ TEST_F(DrctlTest, AnAddedNodeIsListed) {
   EXPECT_EQ(nodes[0]["state"], "unknown");
 }
 
-TEST_F(DrctlTest, ATakenNameFailsWithTheErrorDocument) {
+TEST_F(DrctlTest, AFailureIsASentenceOrTheErrorDocument) {
   AddNode("a");
-  const Outcome outcome = Run({"node", "add", "a", "--address", "x", "--port", "1"});
+  const std::vector<std::string> again = {"node", "add", "a", "--address", "x", "--port", "1"};
+  const Outcome outcome = Run(again);
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.out, "");
   EXPECT_EQ(outcome.err,
-            "drctl: cannot add node 'a': {\"err_code\":508,\"err_code_str\":\"ERR_NODE_EXIST\","
+            "drctl: cannot add node 'a': there is a node of that name (ERR_NODE_EXIST)\n");
+  std::vector<std::string> asJson = again;
+  asJson.emplace_back("--json");
+  EXPECT_EQ(Run(asJson).status, 1);
+  EXPECT_EQ(Run(asJson).err,
+            "{\"err_code\":508,\"err_code_str\":\"ERR_NODE_EXIST\","
             "\"err_msg\":\"there is a node of that name\"}\n");
   EXPECT_EQ(List("node")[0]["address"], "a.example");
 }
@@ -127,9 +206,16 @@ TEST_F(DrctlTest, UnknownNodesCannotBeChangedOrRemoved) {
   EXPECT_EQ(Names(), "a ");
 }
 
-TEST_F(DrctlTest, ReadingAMissingRegistryCreatesNothing) {
-  EXPECT_EQ(Run({"node", "count"}).out, "0\n");
-  EXPECT_EQ(List("node").size(), 0U);
+TEST_F(DrctlTest, AMissingRegistryIsNamedAndNotMade) {
+  const std::string reason =
+      "there is no registry at '" + Path("registry.db") + "' (ERR_DATABASE_OPERATION)\n";
+  const Outcome listed = Run({"node", "list"});
+  EXPECT_EQ(listed.status, 1);
+  EXPECT_EQ(listed.out, "");
+  EXPECT_EQ(listed.err, "drctl: cannot list the nodes: " + reason);
+  EXPECT_EQ(Run({"volume", "list"}).err, "drctl: cannot list the volumes: " + reason);
+  EXPECT_EQ(Run({"node", "count"}).err, "drctl: cannot count the nodes: " + reason);
+  EXPECT_EQ(Run({"export", "-"}).err, "drctl: cannot export: " + reason);
   EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
 }
 
@@ -166,6 +252,7 @@ TEST_F(DrctlTest, BadFiltersAndOrdersAreRefused) {
     arguments.insert(arguments.end(), option.begin(), option.end());
     const Outcome outcome = Run(arguments);
     EXPECT_EQ(outcome.status, 1) << option[1];
+    EXPECT_NE(outcome.err.find("name, address, port, state"), std::string::npos) << outcome.err;
     EXPECT_NE(outcome.err.find("BAD_PARAMETER"), std::string::npos) << outcome.err;
   }
 }
@@ -174,18 +261,17 @@ TEST_F(DrctlTest, TheTableHasHeadingsAndAlignedColumns) {
   AddNode("a", "80");
   AddNode("longer", "5566");
   EXPECT_EQ(Run({"node", "list", "--order", "name"}).out,
-            "name    address         port  state\n"
-            "a       a.example         80  online\n"
-            "longer  longer.example  5566  online\n");
+            "name                  address                port  state\n"
+            "a                     a.example                80  online\n"
+            "longer                longer.example         5566  online\n");
 }
 
-TEST_F(DrctlTest, AnUnusableRegistryFailsWithTheErrorDocument) {
+TEST_F(DrctlTest, AnUnusableRegistryIsNamed) {
   const Outcome outcome = RunProgram(dir, {DRCTL, "--db", Path("no/such/dir.db"), "node", "add",
                                            "a", "--address", "b", "--port", "1"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.err,
-            "drctl: cannot add node 'a': "
-            "{\"err_code\":404,\"err_code_str\":\"ERR_DATABASE_OPERATION\"}\n");
+  EXPECT_EQ(outcome.err, "drctl: cannot add node 'a': '" + Path("no/such/dir.db") +
+                             "' cannot be opened (ERR_DATABASE_OPERATION)\n");
 }
 
 TEST_F(DrctlTest, VerboseShowsTheLogLines) {
@@ -194,17 +280,42 @@ TEST_F(DrctlTest, VerboseShowsTheLogLines) {
   EXPECT_EQ(Run({"node", "count"}).err, "");
 }
 
+// The mount points of this machine, but for those with a character that the kernel escapes.
+std::set<std::string> MountPoints() {
+  std::set<std::string> points;
+  std::istringstream lines(ReadText("/proc/self/mountinfo"));
+  for (std::string line; std::getline(lines, line);) {
+    std::istringstream words(line);
+    std::string word;
+    for (int i = 0; i < 5; ++i) words >> word;
+    if (word.find('\\') == std::string::npos) points.insert(word);
+  }
+  return points;
+}
+
 TEST_F(DrctlTest, ScannedVolumesAreTheMachinesMounts) {
+  const std::set<std::string> points = MountPoints();
+  if (points.empty()) GTEST_SKIP() << "needs a mounted /proc";
   ASSERT_EQ(Run({"volume", "scan"}).status, 0);
   const Json::Value volumes = List("volume");
   std::set<std::string> listed;
-  for (const Json::Value& volume : volumes) listed.insert(volume["mount_point"].asString());
-  EXPECT_EQ(listed.size(), volumes.size()) << "one row a mount point";
-  EXPECT_EQ(listed.count("/"), 1U);
-  EXPECT_EQ(listed.count("/proc"), 1U);
+  for (const Json::Value& volume : volumes) {
+    const std::string point = volume["mount_point"].asString();
+    if (point.find_first_of("\\ \t\n") == std::string::npos) listed.insert(point);
+  }
+  EXPECT_EQ(listed, points);
   // A second scan replaces, it does not add.
   ASSERT_EQ(Run({"volume", "scan"}).status, 0);
   EXPECT_EQ(List("volume").size(), volumes.size());
+}
+
+TEST_F(DrctlTest, ATimeIsForPeopleInATableAndANumberInJson) {
+  WriteText(Path("one.json"), R"({"format":"drctl registry","version":1,"nodes":[],"volumes":[
+      {"mount_point":"/v","device":"d","fs_type":"f","size_mib":2,"free_mib":1,
+       "scanned_at":1700000000}]})");
+  ASSERT_EQ(Run({"import", Path("one.json")}).status, 0);
+  EXPECT_NE(Run({"volume", "list"}).out.find(" 2023-11-14T22:13:20Z\n"), std::string::npos);
+  EXPECT_EQ(List("volume")[0]["scanned_at"], 1700000000);
 }
 
 TEST_F(DrctlTest, SystemInfoReadsKeysAndValues) {
@@ -231,6 +342,29 @@ TEST_F(DrctlTest, AnExportedRegistryComesBack) {
   EXPECT_EQ(List("volume", {"--order", "mount_point"}), volumes);
 }
 
+TEST_F(DrctlTest, ExportAndImportTakeTheStandardStreams) {
+  AddNode("a");
+  const Outcome exported = Run({"export", "-"});
+  EXPECT_EQ(exported.err, "");
+  ASSERT_EQ(Run({"node", "remove", "a"}).status, 0);
+  const Outcome imported = Run({"import", "-", "--json"}, exported.out);
+  EXPECT_EQ(imported.out, "{\"nodes\":1,\"volumes\":0}\n");
+  EXPECT_EQ(imported.err, "");
+  EXPECT_EQ(Names(), "a ");
+  EXPECT_EQ(Run({"import", "-"}, "{").err,
+            "drctl: cannot import '-': it is not a JSON document (BAD_PARAMETER)\n");
+}
+
+TEST_F(DrctlTest, AHundredThousandRowsAreImportedAndListed) {
+  std::string text = R"({"format":"drctl registry","version":1,"volumes":[],"nodes":[)";
+  for (int i = 0; i < 100000; ++i) {
+    text += (i > 0 ? "," : "") + std::string(R"({"name":"n)") + std::to_string(i) +
+            R"(","address":"a","port":1,"state":"s"})";
+  }
+  EXPECT_EQ(Run({"import", "-"}, text + "]}").out, "100000 nodes and 0 volumes imported\n");
+  EXPECT_EQ(List("node").size(), 100000U);
+}
+
 TEST_F(DrctlTest, ABadImportTellsEveryReasonAndChangesNothing) {
   AddNode("a");
   WriteText(Path("bad.json"), R"({"format":"drctl registry","version":1,"volumes":[],"nodes":[
@@ -246,7 +380,12 @@ TEST_F(DrctlTest, ABadImportTellsEveryReasonAndChangesNothing) {
             "drctl: refused: nodes[3]: address must be a text\n"
             "drctl: refused: nodes[4]: not an object\n"
             "drctl: cannot import '" +
-                Path("bad.json") + "': nothing was changed\n");
+                Path("bad.json") + "': nothing was changed (BAD_PARAMETER)\n");
+  EXPECT_EQ(Run({"import", "--json", Path("bad.json")}).err,
+            "{\"err_code\":401,\"err_code_str\":\"BAD_PARAMETER\",\"err_msg\":["
+            "\"nodes[1]: there is another name b\","
+            "\"nodes[2]: port must be a number from 1 to 65535\","
+            "\"nodes[3]: address must be a text\",\"nodes[4]: not an object\"]}\n");
   EXPECT_EQ(Names(), "a ");
 }
 
@@ -265,7 +404,7 @@ class DrctlCacheTest : public DrctlTest {
  protected:
   void SetUp() override {
     DrctlTest::SetUp();
-    if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+    if (!CanMakeLocks()) GTEST_SKIP() << kNeedsLocks;
   }
 
   Outcome ListCached(const std::vector<std::string>& options = {}) {
@@ -280,11 +419,6 @@ class DrctlCacheTest : public DrctlTest {
     for (size_t at = text.find(part); at != std::string::npos; at = text.find(part, at + 1))
       ++count;
     return count;
-  }
-
-  void TearDown() override {
-    RunProgram(dir, {"/bin/rm", "-rf", "/tmp/.kelodr_lock/" + dir});
-    DrctlTest::TearDown();
   }
 };
 

@@ -11,8 +11,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "support/clean_test.h"
-#include "support/process.h"
+#include "drctl/locks.h"
 #include "support/program.h"
 
 namespace {
@@ -50,10 +49,10 @@ bool IsListening(int port) {
   return isOpen;
 }
 
-class DrctlWebTest : public CleanTest {
+class DrctlWebTest : public LocksTest {
  protected:
   void SetUp() override {
-    CleanTest::SetUp();
+    LocksTest::SetUp();
     for (const char* const program : {kServer, kClient}) {
       if (access(program, X_OK) != 0) GTEST_SKIP() << program << " is not installed";
     }
@@ -75,8 +74,7 @@ class DrctlWebTest : public CleanTest {
       kill(server, SIGTERM);
       EXPECT_EQ(waitpid(server, nullptr, 0), server);
     }
-    RunProgram(dir, {"/bin/rm", "-rf", "/tmp/.kelodr_lock/" + dir});
-    CleanTest::TearDown();
+    LocksTest::TearDown();
   }
 
   void StartServer() {
@@ -128,7 +126,7 @@ TEST_F(DrctlWebTest, CallsAreAnswered) {
 
 // The server waits for the end of a handler's output; a task must not hold that up.
 TEST_F(DrctlWebTest, AScanIsStartedAndPolled) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root: lock files are made as root";
+  if (!CanMakeLocks()) GTEST_SKIP() << kNeedsLocks;
   const std::string id = Post(R"({"api":"Volume","method":"scan","version":1})").getTaskId();
   ASSERT_EQ(id.size(), 36U);
   Response reply;

@@ -1,0 +1,31 @@
+// A bar that shows how far a long operation is.
+
+#ifndef DRCTL_PROGRESS_H_
+#define DRCTL_PROGRESS_H_
+
+#include <cstddef>
+
+namespace drctl {
+
+// Draws on standard error, and only when that is a terminal.
+class Progress {
+ public:
+  explicit Progress(size_t steps);
+  ~Progress();  // takes the bar away
+
+  Progress(const Progress&) = delete;
+  Progress& operator=(const Progress&) = delete;
+
+  // So many more steps are done.
+  void Add(size_t steps);
+
+ private:
+  size_t total;
+  size_t done = 0;
+  size_t shown = 0;  // percent
+  bool isOnTerminal;
+};
+
+}  // namespace drctl
+
+#endif  // DRCTL_PROGRESS_H_
