@@ -4,7 +4,6 @@
 
 #include <memory>
 #include <new>
-#include <optional>
 #include <utility>
 
 #include "kelocore.h"
@@ -12,29 +11,13 @@
 #include "kelodrcore/json_value.h"
 #include "kelodrcore/utils.h"
 #include "log.h"
+#include "sqlite_bulk.h"
 #include "value_access.h"
 
 namespace KeloDRCore {
 namespace {
 
 constexpr int kBusyTimeoutInMSec = 1000;
-
-// Every command asks for its table: the query is built without growing.
-constexpr size_t kTableQueryRoom = 64;
-
-struct Finalizer {
-  void operator()(sqlite3_stmt* stmt) const { sqlite3_finalize(stmt); }
-};
-using Statement = std::unique_ptr<sqlite3_stmt, Finalizer>;
-
-Statement Prepare(sqlite3* db, const std::string& sql, int& code) {
-  sqlite3_stmt* stmt = nullptr;
-  code = sqlite3_prepare_v2(db, sql.c_str(), -1, &stmt, nullptr);
-  return Statement(stmt);
-}
-
-// A library in C throws nothing, which the compiler cannot know.
-int Step(const Statement& stmt) noexcept { return sqlite3_step(stmt.get()); }
 
 bool IsBusyOrLocked(int code) { return code == SQLITE_BUSY || code == SQLITE_LOCKED; }
 
@@ -63,56 +46,59 @@ const char* ColumnText(sqlite3_stmt* stmt, int column) {
   return "";
 }
 
-// Turns the rows of one statement into records. Made at a row: before the first one the statement
-// may still be prepared anew, with other columns.
-class RowReader {
- public:
-  RowReader(sqlite3_stmt* statement, const char* operation) : stmt(statement), function(operation) {
-    const int columns = sqlite3_column_count(stmt);
-    names.reserve(static_cast<size_t>(columns));
-    for (int column = 0; column < columns; ++column) {
-      names.emplace_back(ColumnName(stmt, column));
+template <typename Payload>
+void AddField(SqliteValueList& record, const std::string& name, const Payload& payload) {
+  if (name.empty()) {
+    record.AddValue(name, payload);  // refuses and logs
+  } else {
+    ValueAccess::SetField(record, name, payload);
+  }
+}
+
+SqliteValueList ParseRecord(sqlite3_stmt* stmt) {
+  SqliteValueList record;
+  const int columns = sqlite3_column_count(stmt);
+  for (int column = 0; column < columns; ++column) {
+    const std::string name = ColumnName(stmt, column);
+    const int type = sqlite3_column_type(stmt, column);
+    if (type == SQLITE_INTEGER) {
+      AddField(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
+    } else if (type == SQLITE_TEXT) {
+      AddField(record, name, ColumnText(stmt, column));
+    } else if (type == SQLITE_NULL) {
+      KELODR_LOG(WARN, __func__, "field [%s] has null value", name.c_str());
+    } else {
+      KELODR_LOG(WARN, __func__, "Not supported type [%d] with field [%s]", type, name.c_str());
     }
   }
+  return record;
+}
 
-  // Fills a record that is empty.
-  void Read(SqliteValueList& record) const {
-    ThrowOnlyBadAlloc([&] {
-      int column = 0;
-      for (const std::string& name : names) AddColumn(record, name, column++);
-    });
+// One attempt of a query.
+class Query {
+ public:
+  Query(sqlite3* db, const std::string& sql)
+      : code(sqlite3_prepare_v2(db, sql.c_str(), -1, &stmt, nullptr)) {}
+  Query(const Query&) = delete;
+  Query& operator=(const Query&) = delete;
+  ~Query() { sqlite3_finalize(stmt); }
+
+  // True when there is one more row.
+  bool Next() {
+    if (code == SQLITE_OK || code == SQLITE_ROW) code = sqlite3_step(stmt);
+    return code == SQLITE_ROW;
   }
+
+  SqliteValueList Row() const {
+    return ThrowOnlyBadAlloc([this] { return ParseRecord(stmt); });
+  }
+
+  // SQLite's result code of the last step.
+  int Code() const { return code; }
 
  private:
-  void AddColumn(SqliteValueList& record, const std::string& name, int column) const {
-    const int type = sqlite3_column_type(stmt, column);
-    switch (type) {
-      case SQLITE_INTEGER:
-        Add(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
-        break;
-      case SQLITE_TEXT:
-        Add(record, name, ColumnText(stmt, column));
-        break;
-      case SQLITE_NULL:
-        KELODR_LOG(WARN, function, "field [%s] has null value", name.c_str());
-        break;
-      default:
-        KELODR_LOG(WARN, function, "Not supported type [%d] with field [%s]", type, name.c_str());
-    }
-  }
-
-  template <typename Payload>
-  static void Add(SqliteValueList& record, const std::string& name, const Payload& payload) {
-    if (name.empty()) {
-      record.AddValue(name, payload);  // refuses and logs
-    } else {
-      ValueAccess::SetField(record, name, payload);
-    }
-  }
-
-  sqlite3_stmt* stmt;
-  const char* function;
-  std::vector<std::string> names;
+  sqlite3_stmt* stmt = nullptr;
+  int code;
 };
 
 // What Exec says when its attempts end. Each of the two queries shares one of these lines and has
@@ -130,15 +116,20 @@ void LogExecRetried(const char* function, unsigned int retries, const std::strin
              sql.c_str());
 }
 
+void LogSelectRetried(unsigned int retries) {
+  if (retries == 0) return;
+  KELODR_LOG(INFO, "SelectByCommand", "After retry [%u] times, success to select command", retries);
+}
+
 }  // namespace
 
 ErrRecorder::ErrRecorder() : errCode(0) {}
 
 Json::Value ErrRecorder::GetErr() const {
-  return ThrowOnlyBadAlloc([this] {
+  const std::string name = GetErrCodeStr(errCode);
+  return ThrowOnlyBadAlloc([&] {
     Json::Value err;
     err["err_code"] = errCode;
-    const std::string name = GetErrCodeStr(errCode);
     if (!name.empty()) err["err_code_str"] = name;
     if (!errMsg.isNull()) err["err_msg"] = errMsg;
     return err;
@@ -196,79 +187,135 @@ void SqliteDB::SetDBErr(const ErrRecorder& raw) const {
   errMsg = std::move(details);
 }
 
+bool SqliteDB::IsInTransaction() const {
+  return dbHandle != nullptr && sqlite3_get_autocommit(dbHandle) == 0;
+}
+
+// A transaction that cannot even be rolled back, for lack of memory, ends with the connection: what
+// comes after it must not become a part of it.
+void SqliteDB::RollBack() {
+  sqlite3_exec(dbHandle, "ROLLBACK", nullptr, nullptr, nullptr);
+  if (IsInTransaction()) Close();
+}
+
+// What is done while it lives. Unless it is kept, it leaves the handle in the transaction state in
+// which it was before.
+class SqliteDB::Attempt {
+ public:
+  explicit Attempt(SqliteDB& handle) : db(handle), isInner(handle.IsInTransaction()) {}
+  Attempt(const Attempt&) = delete;
+  Attempt& operator=(const Attempt&) = delete;
+
+  ~Attempt() {
+    if (isKept || !db.IsInTransaction()) return;
+    if (!isInner || (hasSavepoint && !UndoSavepoint())) db.RollBack();
+  }
+
+  void Keep() { isKept = true; }
+
+  // Makes all of it one change: a savepoint inside a transaction, else a transaction.
+  bool Begin() {
+    if (!isInner) return db.DoExecSqliteCommand("BEGIN IMMEDIATE");
+    hasSavepoint = db.DoExecSqliteCommand("SAVEPOINT records");
+    return hasSavepoint;
+  }
+  bool End() {
+    isKept = db.DoExecSqliteCommand(isInner ? "RELEASE records" : "COMMIT");
+    return isKept;
+  }
+
+ private:
+  bool UndoSavepoint() {
+    const char* const undo = "ROLLBACK TO records; RELEASE records";
+    return sqlite3_exec(db.dbHandle, undo, nullptr, nullptr, nullptr) == SQLITE_OK;
+  }
+
+  SqliteDB& db;
+  const bool isInner;
+  bool hasSavepoint = false;
+  bool isKept = false;
+};
+
+// SQLite would run the text up to the NUL byte.
+bool SqliteDB::IsRefused(const std::string& sql, const char* function) const {
+  if (sql.find('\0') == std::string::npos) return false;
+  SetErr(ERR::BAD_PARAMETER);
+  KELODR_LOG(ERR, function, "NUL byte in command [%s]", sql.c_str());
+  return true;
+}
+
 bool SqliteDB::DoExecSqliteCommand(const std::string& sql) {
+  if (IsRefused(sql, __func__)) return false;
+  Attempt attempt(*this);
   char* errText = nullptr;
   const int code = sqlite3_exec(dbHandle, sql.c_str(), nullptr, nullptr, &errText);
   const std::unique_ptr<char, void (*)(void*)> owner(errText, sqlite3_free);
   SetDBErr(code, errText);
+  if (code == SQLITE_OK) attempt.Keep();
   return code == SQLITE_OK;
 }
 
-// One attempt: hands each row to `takeRow` until that answers false or no row is left.
-template <typename TakeRow>
-bool SqliteDB::TrySelect(const std::string& sql, const TakeRow& takeRow) {
-  SetErr(ERR::ERR_DATABASE_OPERATION);
-  int code = SQLITE_OK;
-  const Statement stmt = Prepare(dbHandle, sql, code);
-  if (code == SQLITE_OK) code = Step(stmt);
-  while (code == SQLITE_ROW) {
-    // Each kind of `takeRow` always answers the same: each copy of this lacks one way on.
-    if (!takeRow(stmt.get())) break;  // GCOVR_EXCL_BR_LINE
-    code = Step(stmt);
-  }
-  if (code != SQLITE_ROW && code != SQLITE_DONE) {
-    SetDBErr(code, nullptr);
-    return false;
-  }
-  SetErr(0);
-  return true;
-}
-
-bool SqliteDB::TrySelectFirst(const std::string& sql, SqliteValueList& record,
-                              const char* function) {
-  return TrySelect(sql, [&](sqlite3_stmt* stmt) {
-    SqliteValueList row;
-    RowReader(stmt, function).Read(row);
-    record = std::move(row);
-    return false;
-  });
-}
-
-bool SqliteDB::TrySelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
-                            const char* function) {
-  std::optional<RowReader> reader;
-  return TrySelect(sql, [&](sqlite3_stmt* stmt) {
-    if (!reader) reader.emplace(stmt, function);
-    records.emplace_back();
-    try {
-      reader->Read(records.back());
-    } catch (...) {
-      records.pop_back();
-      throw;
-    }
-    return true;
-  });
-}
-
 bool SqliteDB::DoSelectSqliteRecord(const std::string& sql, SqliteValueList& record) {
-  return TrySelectFirst(sql, record, __func__);
+  if (IsRefused(sql, __func__)) return false;
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  Query query(dbHandle, sql);
+  if (query.Next()) record = query.Row();
+  return SetQueryEnd(query.Code());
 }
 
 bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
                                      std::vector<SqliteValueList>& records) {
-  return TrySelectAll(sql, records, __func__);
+  if (IsRefused(sql, __func__)) return false;
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  Query query(dbHandle, sql);
+  while (query.Next()) records.push_back(query.Row());
+  return SetQueryEnd(query.Code());
 }
 
-// Makes attempts until one succeeds, one fails otherwise than by a lock, or the limit is reached.
-// Leaves the classified error of the last one behind. `retries` counts one past the limit when the
-// limit ends the loop, and is what the callers' messages show; it comes in as 0.
-template <typename Attempt>
-bool SqliteDB::RetryWhileLocked(const Attempt& attempt, unsigned int& retries) {
-  while (!attempt()) {
-    const ErrRecorder raw = ThrowOnlyBadAlloc([this] { return ErrRecorder(*this); });
-    SetDBErr(raw);
-    if (!IsBusyOrLocked(raw.errCode) || ++retries > retryLimit) return false;
-    RandomSleepInMSec(1000, 2000);
+bool SqliteDB::TrySelectEach(const std::string& sql, const RecordTaker& take, bool& isHandedOver) {
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  Query query(dbHandle, sql);
+  while (query.Next()) {
+    isHandedOver = true;
+    if (!take(query.Row())) break;
+  }
+  return SetQueryEnd(query.Code());
+}
+
+// Records how a query ended that SQLite left with this code.
+bool SqliteDB::SetQueryEnd(int code) const {
+  if (code == SQLITE_ROW || code == SQLITE_DONE) {
+    SetErr(0);
+    return true;
+  }
+  SetDBErr(code, nullptr);
+  return false;
+}
+
+// Gives the failure of an attempt its place among the codes. True when it was another one's lock.
+bool SqliteDB::ClassifyErr() const {
+  const ErrRecorder raw = ThrowOnlyBadAlloc([this] { return ErrRecorder(*this); });
+  SetDBErr(raw);
+  return IsBusyOrLocked(raw.errCode);
+}
+
+// False when the limit is reached. `retries` counts one past it then, and is what the lines show.
+bool SqliteDB::PauseBeforeRetry(unsigned int& retries) const {
+  if (++retries > retryLimit) return false;
+  RandomSleepInMSec(1000, 2000);
+  return true;
+}
+
+bool SqliteDB::OpenForExec(const char* function) {
+  if (!Open()) {
+    SetErr(ERR::ERR_DATABASE_OPERATION);
+    KELODR_LOG(ERR, function, "Failed to open db [%s]", dbPath.c_str());
+    return false;
+  }
+  if (dbHandle == nullptr) {
+    SetErr(ERR::ERR_NULL_POINTER);
+    KELODR_LOG(ERR, function, "DB[%s] is not opened", dbPath.c_str());
+    return false;
   }
   return true;
 }
@@ -280,18 +327,10 @@ bool SqliteDB::Exec(const std::string& sql) {
     KELODR_LOG(ERR, __func__, "empty command to exec db[%s]", dbPath.c_str());
     return false;
   }
-  if (!Open()) {
-    SetErr(ERR::ERR_DATABASE_OPERATION);
-    KELODR_LOG(ERR, __func__, "Failed to open db [%s]", dbPath.c_str());
-    return false;
-  }
-  if (dbHandle == nullptr) {
-    SetErr(ERR::ERR_NULL_POINTER);
-    KELODR_LOG(ERR, __func__, "DB[%s] is not opened", dbPath.c_str());
-    return false;
-  }
+  if (IsRefused(sql, __func__) || !OpenForExec(__func__)) return false;
   unsigned int retries = 0;
-  if (!RetryWhileLocked([&] { return DoExecSqliteCommand(sql); }, retries)) {
+  while (!DoExecSqliteCommand(sql)) {
+    if (ClassifyErr() && PauseBeforeRetry(retries)) continue;
     LogExecFailed(__func__, retries, sql, GetErr());
     return false;
   }
@@ -300,7 +339,7 @@ bool SqliteDB::Exec(const std::string& sql) {
   return true;
 }
 
-// How both queries begin. Other than Exec, they leave the error of a failed Open as it was and do
+// How all queries begin. Other than Exec, they leave the error of a failed Open as it was and do
 // not look at the handle after it.
 bool SqliteDB::OpenForQuery(const std::string& sql, const char* emptyMessage) {
   const char* const function = "SelectByCommand";
@@ -309,6 +348,7 @@ bool SqliteDB::OpenForQuery(const std::string& sql, const char* emptyMessage) {
     KELODR_LOG(ERR, function, "%s", emptyMessage);
     return false;
   }
+  if (IsRefused(sql, function)) return false;
   if (Open()) return true;
   KELODR_LOG(ERR, function, "Failed to open db [%s]", dbPath.c_str());
   return false;
@@ -317,7 +357,8 @@ bool SqliteDB::OpenForQuery(const std::string& sql, const char* emptyMessage) {
 bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) {
   if (!OpenForQuery(sql, "Empty command to select record")) return false;
   unsigned int retries = 0;
-  if (!RetryWhileLocked([&] { return TrySelectFirst(sql, record, "SelectByCommand"); }, retries)) {
+  while (!DoSelectSqliteRecord(sql, record)) {
+    if (ClassifyErr() && PauseBeforeRetry(retries)) continue;
     KELODR_LOG(ERR, __func__, "Reach retry limit [%u], failed to select command[%s] with err [%s]",
                retries, sql.c_str(), JsonValue::toString(GetErr()).c_str());
     return false;
@@ -326,35 +367,23 @@ bool SqliteDB::SelectByCommand(const std::string& sql, SqliteValueList& record) 
   return true;
 }
 
-// All attempts of a query for many rows, in the name of SelectByCommand.
-template <typename Attempt>
-bool SqliteDB::SelectRows(const std::string& sql, const Attempt& attempt) {
-  const char* const function = "SelectByCommand";
+bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records) {
   if (!OpenForQuery(sql, "Empty command to select records")) return false;
   unsigned int retries = 0;
-  if (!RetryWhileLocked(attempt, retries)) {
-    LogExecFailed(function, retries, sql, GetErr());
+  while (!DoSelectSqliteRecords(sql, records)) {
+    if (ClassifyErr() && PauseBeforeRetry(retries)) continue;
+    LogExecFailed(__func__, retries, sql, GetErr());
     return false;
   }
-  if (retries > 0) {
-    KELODR_LOG(INFO, function, "After retry [%u] times, success to select command", retries);
-  }
+  LogSelectRetried(retries);
   return true;
 }
 
-bool SqliteDB::SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records) {
-  return SelectRows(sql, [&] { return TrySelectAll(sql, records, "SelectByCommand"); });
-}
-
 bool SqliteDB::IsTableExisted(const std::string& tableName) {
-  std::string sql;
-  sql.reserve(kTableQueryRoom + tableName.size());
-  sql.append("SELECT 1 FROM sqlite_master WHERE type='table' AND name='").append(tableName);
-  sql += "';";
-  bool isFound = false;
-  const auto takeRow = [&isFound](sqlite3_stmt* /*stmt*/) { return isFound = true; };
-  SelectRows(sql, [&] { return TrySelect(sql, takeRow); });
-  return isFound;
+  std::vector<SqliteValueList> rows;
+  SelectByCommand("SELECT 1 FROM sqlite_master WHERE type='table' AND name='" + tableName + "';",
+                  rows);
+  return !rows.empty();
 }
 
 bool SqliteDB::GetCount(const SqliteTableHandler& table, int& count) {
@@ -389,17 +418,19 @@ bool SqliteDB::CreateTable(const SqliteTableHandler& table) {
 
 bool SqliteDB::Exec(const SqliteCommand& cmd) {
   SetErr(ERR::ERR_UNKNOWN);
-  KELODR_LOG(INFO, __func__, "%s Exec cmd: %s", logLabel.c_str(), cmd.GetCommand().c_str());
+  std::string sql = cmd.GetCommand();
+  KELODR_LOG(INFO, __func__, "%s Exec cmd: %s", logLabel.c_str(), sql.c_str());
   if (!cmd.IsValid()) {
     SetErr(ERR::BAD_PARAMETER);
     return false;
   }
+  if (IsRefused(sql, __func__)) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   if (!CreateTable(cmd.GetTable())) {
     KELODR_LOG(ERR, __func__, "Failed to create table [%s]", cmd.GetTable().tableName.c_str());
     return false;
   }
-  const std::string sql = cmd.GetCommand();
+  sql = cmd.GetCommand();
   if (!Exec(sql)) {
     KELODR_LOG(ERR, __func__, "Failed to exec [%s] in db[%s]", sql.c_str(), dbPath.c_str());
     return false;
@@ -436,8 +467,8 @@ bool SqliteDB::DeleteAllRecords(const SqliteTableHandler& table) {
   return DeleteRecord(cmd);
 }
 
-template <typename Rows>
-bool SqliteDB::SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function) {
+// How the selects with a command begin, in the name of each.
+bool SqliteDB::PrepareSelect(const SelectCommand& cmd, const char* function) {
   if (!cmd.IsValid()) {
     SetErr(ERR::BAD_PARAMETER);
     KELODR_LOG(ERR, function, "invalid select command [%s]", cmd.ToStr().c_str());
@@ -449,15 +480,76 @@ bool SqliteDB::SelectWithCommand(const SelectCommand& cmd, Rows& rows, const cha
     KELODR_LOG(ERR, function, "%s", "Failed to create table");
     return false;
   }
-  return SelectByCommand(cmd.GetCommand(), rows);
+  return true;
 }
 
 bool SqliteDB::SelectRecord(const SelectCommand& cmd, SqliteValueList& record) {
-  return SelectWithCommand(cmd, record, __func__);
+  return PrepareSelect(cmd, __func__) && SelectByCommand(cmd.GetCommand(), record);
 }
 
 bool SqliteDB::SelectRecords(const SelectCommand& cmd, std::vector<SqliteValueList>& records) {
-  return SelectWithCommand(cmd, records, __func__);
+  return PrepareSelect(cmd, __func__) && SelectByCommand(cmd.GetCommand(), records);
+}
+
+bool SqliteDB::SelectEach(const SelectCommand& cmd, const RecordTaker& take) {
+  if (!PrepareSelect(cmd, __func__)) return false;
+  const std::string sql = cmd.GetCommand();
+  if (!OpenForQuery(sql, "Empty command to select records")) return false;
+  unsigned int retries = 0;
+  bool isHandedOver = false;
+  while (!TrySelectEach(sql, take, isHandedOver)) {
+    if (ClassifyErr() && !isHandedOver && PauseBeforeRetry(retries)) continue;
+    LogExecFailed("SelectByCommand", retries, sql, GetErr());
+    return false;
+  }
+  LogSelectRetried(retries);
+  return true;
+}
+
+bool SqliteDB::InsertRecords(const SqliteTableHandler& table,
+                             const std::vector<SqliteValueList>& records) {
+  return InsertAll(BulkInsert("INSERT", table.tableName, records), table, __func__);
+}
+
+bool SqliteDB::InsertOrReplaceRecords(const SqliteTableHandler& table,
+                                      const std::vector<SqliteValueList>& records) {
+  return InsertAll(BulkInsert("INSERT OR REPLACE", table.tableName, records), table, __func__);
+}
+
+bool SqliteDB::InsertAll(const BulkInsert& insert, const SqliteTableHandler& table,
+                         const char* function) {
+  if (insert.IsEmpty()) return true;
+  if (!insert.IsValid()) {
+    SetErr(ERR::BAD_PARAMETER);
+    KELODR_LOG(ERR, function, "invalid records for table [%s]", table.tableName.c_str());
+    return false;
+  }
+  const std::string sql = insert.GetCommand();
+  KELODR_LOG(INFO, function, "%s Exec cmd: %s", logLabel.c_str(), sql.c_str());
+  SetErr(ERR::ERR_DATABASE_OPERATION);
+  if (!CreateTable(table)) {
+    KELODR_LOG(ERR, function, "Failed to create table [%s]", table.tableName.c_str());
+    return false;
+  }
+  if (!OpenForExec(function)) return false;
+  unsigned int retries = 0;
+  while (!TryInsertAll(insert)) {
+    if (ClassifyErr() && PauseBeforeRetry(retries)) continue;
+    LogExecFailed(function, retries, sql, GetErr());
+    return false;
+  }
+  SetErr(0);
+  KELODR_LOG(INFO, function, "%s Exec cmd success", logLabel.c_str());
+  return true;
+}
+
+bool SqliteDB::TryInsertAll(const BulkInsert& insert) {
+  Attempt attempt(*this);
+  if (!attempt.Begin()) return false;
+  std::string message;
+  const int code = insert.Run(dbHandle, message);
+  SetDBErr(code, message.c_str());
+  return code == SQLITE_OK && attempt.End();
 }
 
 }  // namespace KeloDRCore

@@ -6,6 +6,7 @@
 
 #include <json/json.h>
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -17,6 +18,8 @@
 struct sqlite3;
 
 namespace KeloDRCore {
+
+class BulkInsert;
 
 // No destructor is virtual: nothing is deleted through a base.
 #pragma GCC diagnostic push
@@ -55,9 +58,21 @@ class KELODR_EXPORT ErrRecorder {
 /// argument, 403 when there is no connection although it was opened, 404 for a failed operation and
 /// 405 for a database that stayed busy or locked, the last two with "sqlite_errcode" and
 /// "sqlite_errmsg" in "err_msg" where SQLite refused. A statement, query or command that succeeds
-/// clears the error. Nothing is thrown but `std::bad_alloc`.
+/// clears the error. Throws `std::bad_alloc`, what a subclass's `GetErrCodeStr` throws, and what
+/// the function given to `SelectEach` throws; nothing else.
 ///
-/// One handle is used by one thread at a time; `const` operations write the error too.
+/// Texts given as SQL are statements, table names, column definitions and conditions. They are run
+/// as they are: build none of them from data of others, for which `SqliteCondition` and the records
+/// are there. A text with a NUL byte would be cut there and mean something else: it fails with 401
+/// and a line at ERR, and nothing of it runs.
+///
+/// A row that was acknowledged survives the end of the process. When the power fails, SQLite's
+/// default may roll the last acknowledged commit back; after `Exec("PRAGMA synchronous=EXTRA")` on
+/// this handle it is kept too, at the price of one more sync a commit.
+///
+/// One handle is used by one thread at a time; `const` operations write the error too. A handle
+/// that is open must not be used in the child after `fork`, not even closed or destroyed there: the
+/// child opens one of its own.
 class KELODR_EXPORT SqliteDB : public ErrRecorder {
  public:
   /// Stores the arguments; opens nothing. `label` stands in front of the lines that commands log.
@@ -74,19 +89,19 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// stays open, deliberately. The error in `GetErr()` is not touched.
   bool Open();
 
-  /// Closes the connection if it is open.
+  /// Closes the connection if it is open. A transaction that is open is rolled back.
   void Close();
 
   /// True when the database file exists.
   [[nodiscard]] bool IsExisted() const;
 
   /// @name One attempt on the open connection.
-  /// No check of the statement, no retry, no line. A failure is recorded raw: SQLite's own result
-  /// code and message.
+  /// No retry, and no line but for a NUL byte. A failure is recorded raw: SQLite's own result code
+  /// and message.
   /// @{
 
   /// Runs the statements and discards their rows. Success leaves the recorded error as it was,
-  /// deliberately.
+  /// deliberately. A transaction that a failed attempt began is rolled back.
   bool DoExecSqliteCommand(const std::string& sql);
 
   /// Puts the first row into `record`, in place of what it held; with no row it succeeds and leaves
@@ -99,6 +114,10 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
 
   /// Opens the database and runs the statements, discarding their rows. Fails with 401 for an empty
   /// text, without opening the file.
+  ///
+  /// Each attempt runs the whole text. A transaction that it began is rolled back when it fails;
+  /// statements that it ran outside of one before it found the database locked run once more with
+  /// the next attempt. For several statements that belong together use `SqliteTransaction`.
   bool Exec(const std::string& sql);
 
   /// @name Opens the database and reads the rows of a query.
@@ -167,26 +186,56 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
 
   /// Appends the rows, as `SelectByCommand` does.
   bool SelectRecords(const SelectCommand& cmd, std::vector<SqliteValueList>& records);
+
+  /// Hands the rows to `take` one by one, in memory that does not grow with their number. `take`
+  /// answers false to stop, which is a success. Once a row was handed over, the statement is not
+  /// tried again. What `take` throws passes, after the statement has been released.
+  ///
+  /// The rows are read while `take` runs: other connections cannot commit a change until it is done
+  /// (with `PRAGMA journal_mode=WAL` they can), and `take` must not close this handle.
+  bool SelectEach(const SelectCommand& cmd,
+                  const std::function<bool(const SqliteValueList& record)>& take);
+  /// @}
+
+  /// @name Creates the table if it is missing, then inserts all records or none.
+  /// They are one transaction, or inside an open one a savepoint, which is tried again as a whole
+  /// while the database is busy or locked. Values are bound, not rendered: an integer of 64 bits is
+  /// stored whole. Logs the first record's statement with "?" for the values, and the success, at
+  /// INFO; a failure at ERR.
+  ///
+  /// Fails with 401, storing nothing, for an empty table name, an empty record, and an unsigned
+  /// integer above 63 bits. No records are a success that touches nothing, the file and the
+  /// recorded error included.
+  /// @{
+
+  /// A row that breaks a constraint fails them all.
+  bool InsertRecords(const SqliteTableHandler& table, const std::vector<SqliteValueList>& records);
+
+  /// A row replaces those with the same unique values.
+  bool InsertOrReplaceRecords(const SqliteTableHandler& table,
+                              const std::vector<SqliteValueList>& records);
   /// @}
 
  private:
+  friend class SqliteTransaction;
+  class Attempt;
+  using RecordTaker = std::function<bool(const SqliteValueList& record)>;
+
   KELODR_LOCAL void SetErr(int code) const;  // a code without details
-
-  template <typename TakeRow>
-  KELODR_LOCAL bool TrySelect(const std::string& sql, const TakeRow& takeRow);
-  KELODR_LOCAL bool TrySelectFirst(const std::string& sql, SqliteValueList& record,
-                                   const char* function);
-  KELODR_LOCAL bool TrySelectAll(const std::string& sql, std::vector<SqliteValueList>& records,
-                                 const char* function);
-
-  template <typename Attempt>
-  KELODR_LOCAL bool RetryWhileLocked(const Attempt& attempt, unsigned int& retries);
-
+  KELODR_LOCAL bool IsRefused(const std::string& sql, const char* function) const;
+  KELODR_LOCAL bool OpenForExec(const char* function);
   KELODR_LOCAL bool OpenForQuery(const std::string& sql, const char* emptyMessage);
-  template <typename Attempt>
-  KELODR_LOCAL bool SelectRows(const std::string& sql, const Attempt& attempt);
-  template <typename Rows>
-  KELODR_LOCAL bool SelectWithCommand(const SelectCommand& cmd, Rows& rows, const char* function);
+  KELODR_LOCAL bool ClassifyErr() const;
+  KELODR_LOCAL bool PauseBeforeRetry(unsigned int& retries) const;
+  KELODR_LOCAL bool SetQueryEnd(int code) const;
+  KELODR_LOCAL bool PrepareSelect(const SelectCommand& cmd, const char* function);
+  KELODR_LOCAL bool TrySelectEach(const std::string& sql, const RecordTaker& take,
+                                  bool& isHandedOver);
+  KELODR_LOCAL bool InsertAll(const BulkInsert& insert, const SqliteTableHandler& table,
+                              const char* function);
+  KELODR_LOCAL bool TryInsertAll(const BulkInsert& insert);
+  KELODR_LOCAL bool IsInTransaction() const;
+  KELODR_LOCAL void RollBack();
 
   sqlite3* dbHandle;
   std::string dbPath;

@@ -35,31 +35,30 @@ TEST_F(SqliteDBRowTest, KeepsIntegersAndTextsAndLeavesOutTheRest) {
   const std::string sql = "SELECT 1 AS i, 'x' AS t, NULL AS n, 1.5 AS r, x'00ff' AS b";
   EXPECT_EQ(First(sql).ToStr(), "i:1, t:'x'");
   EXPECT_EQ(db->GetErr(), Error(0));
-  ExpectLog({Warn(kFile, "SelectByCommand", "field [n] has null value"),
-             Warn(kFile, "SelectByCommand", "Not supported type [2] with field [r]"),
-             Warn(kFile, "SelectByCommand", "Not supported type [4] with field [b]")});
+  ExpectLog({Warn(kFile, "ParseRecord", "field [n] has null value"),
+             Warn(kFile, "ParseRecord", "Not supported type [2] with field [r]"),
+             Warn(kFile, "ParseRecord", "Not supported type [4] with field [b]")});
 }
 
-TEST_F(SqliteDBRowTest, LinesNameTheOperationThatTheCallerCalled) {
+TEST_F(SqliteDBRowTest, LinesNameTheParserWhateverOperationWasCalled) {
   ASSERT_TRUE(db->Open());
   const std::string sql = "SELECT NULL AS n, 2.5 AS r";
-  const auto lines = [](const std::string& function) {
-    return std::vector<LogLine>{Warn(kFile, function, "field [n] has null value"),
-                                Warn(kFile, function, "Not supported type [2] with field [r]")};
-  };
+  const std::vector<LogLine> lines = {
+      Warn(kFile, "ParseRecord", "field [n] has null value"),
+      Warn(kFile, "ParseRecord", "Not supported type [2] with field [r]")};
   EXPECT_TRUE(db->DoSelectSqliteRecord(sql, record));
-  ExpectLog(lines("DoSelectSqliteRecord"));
+  ExpectLog(lines);
   EXPECT_TRUE(db->DoSelectSqliteRecords(sql, records));
-  ExpectLog(lines("DoSelectSqliteRecords"));
+  ExpectLog(lines);
   EXPECT_TRUE(db->SelectByCommand(sql, record));
-  ExpectLog(lines("SelectByCommand"));
+  ExpectLog(lines);
   EXPECT_TRUE(db->SelectByCommand(sql, records));
-  ExpectLog(lines("SelectByCommand"));
+  ExpectLog(lines);
 }
 
 TEST_F(SqliteDBRowTest, ARowWithoutAUsableColumnIsAnEmptyRecord) {
   EXPECT_THAT(Rows(*db, "SELECT NULL AS n UNION ALL SELECT NULL"), ElementsAre("", ""));
-  const LogLine line = Warn(kFile, "SelectByCommand", "field [n] has null value");
+  const LogLine line = Warn(kFile, "ParseRecord", "field [n] has null value");
   ExpectLog({line, line});
 }
 
@@ -84,7 +83,7 @@ TEST_F(SqliteDBRowTest, AnEmptyTextIsAFieldAndANullIsNone) {
   First("SELECT '' AS empty, NULL AS missing");
   EXPECT_TRUE(record.HasField("empty"));
   EXPECT_FALSE(record.HasField("missing"));
-  ExpectLog({Warn(kFile, "SelectByCommand", "field [missing] has null value")});
+  ExpectLog({Warn(kFile, "ParseRecord", "field [missing] has null value")});
 }
 
 TEST_F(SqliteDBRowTest, ATextEndsAtItsFirstNul) {
@@ -107,7 +106,7 @@ TEST_F(SqliteDBRowTest, TheLastOfTwoColumnsOfOneNameCounts) {
   EXPECT_EQ(First("SELECT 1 AS n, 'x' AS n").ToStr(), "n:'x'");
   EXPECT_EQ(First("SELECT 'x' AS n, 1 AS n").ToStr(), "n:1");
   EXPECT_EQ(First("SELECT 1 AS n, NULL AS n").ToStr(), "n:1");
-  ExpectLog({Warn(kFile, "SelectByCommand", "field [n] has null value")});
+  ExpectLog({Warn(kFile, "ParseRecord", "field [n] has null value")});
 }
 
 TEST_F(SqliteDBRowTest, AColumnWithoutANameIsRefusedByTheRecord) {

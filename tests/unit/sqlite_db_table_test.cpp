@@ -149,7 +149,7 @@ TEST_F(SqliteDBTableTest, GetCountRefusesARowWithoutAnIntegerCount) {
              Err(kFile, "GetCount", "Record error [count:'text']")});
   EXPECT_FALSE(get("sqlite_master' GROUP BY name UNION ALL SELECT NULL --"));
   EXPECT_EQ(db->GetErr(), Error(0));
-  ExpectLog({Warn(kFile, "SelectByCommand", "field [count] has null value"),
+  ExpectLog({Warn(kFile, "ParseRecord", "field [count] has null value"),
              Debug("sqlite_value.cpp", "GetValue", "field [count] is not existed"),
              Err(kFile, "GetCount", "Record error []")});
   EXPECT_EQ(count, -1);
@@ -454,13 +454,13 @@ TEST_F(SqliteDBTableTest, SelectsSet404BeforeTheTableStep) {
              Err(kFile, "SelectByCommand", "Failed to open db [" + dir + "]")});
 }
 
-TEST_F(SqliteDBTableTest, RowLinesOfASelectNameTheQuery) {
+TEST_F(SqliteDBTableTest, RowLinesOfASelectNameTheParser) {
   Fill();
   ASSERT_TRUE(db->Exec("DELETE FROM node WHERE id=2; UPDATE node SET name=NULL"));
   EXPECT_TRUE(db->SelectRecord(SelectAll(kTable), record));
   EXPECT_TRUE(db->SelectRecords(SelectAll(kTable), records));
-  ExpectLog({Warn(kFile, "SelectByCommand", "field [name] has null value"),
-             Warn(kFile, "SelectByCommand", "field [name] has null value")});
+  ExpectLog({Warn(kFile, "ParseRecord", "field [name] has null value"),
+             Warn(kFile, "ParseRecord", "field [name] has null value")});
   EXPECT_EQ(record.ToStr(), "id:1");
   EXPECT_THAT(Texts(records), ElementsAre("id:1"));
 }

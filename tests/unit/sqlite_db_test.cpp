@@ -453,10 +453,31 @@ TEST_F(SqliteDBTest, ANullNameIsOneThatThereIsNoMemoryFor) {
   EXPECT_EQ(record.ToStr(), "old:1");
 }
 
-TEST_F(SqliteDBTest, StatementEndsAtAnEmbeddedNul) {
+TEST_F(SqliteDBTest, ATextWithANulByteDoesNotRun) {
   using std::string_literals::operator""s;
-  EXPECT_TRUE(db->Exec("CREATE TABLE t (n)\0 nonsense"s));
-  EXPECT_THAT(Rows(*db, "SELECT 1 AS n\0 nonsense"s), ElementsAre("n:1"));
+  const auto refused = [](const std::string& function) {
+    return Err(kFile, function, "NUL byte in command [SELECT 1 AS n]");
+  };
+  const std::string sql = "SELECT 1 AS n\0;"s;
+  EXPECT_FALSE(db->Exec(sql));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(db->SelectByCommand(sql, record));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(db->SelectByCommand(sql, records));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(HasFile());
+  ExpectLog({refused("Exec"), refused("SelectByCommand"), refused("SelectByCommand")});
+  ASSERT_TRUE(db->Open());
+  EXPECT_FALSE(db->DoExecSqliteCommand(sql));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(db->DoSelectSqliteRecord(sql, record));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(db->DoSelectSqliteRecords(sql, records));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  ExpectLog({refused("DoExecSqliteCommand"), refused("DoSelectSqliteRecord"),
+             refused("DoSelectSqliteRecords")});
+  EXPECT_EQ(record.ToStr(), "");
+  EXPECT_THAT(records, IsEmpty());
 }
 
 TEST_F(SqliteDBTest, FailureNamesBytesThatAreNotUtf8) {
