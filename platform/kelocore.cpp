@@ -12,31 +12,29 @@
 #include <climits>
 #include <cstdint>
 #include <cstring>
+#include <new>
+#include <string>
 #include <string_view>
+#include <utility>
 
-#include "posix/descriptor.h"
+#include "posix/file_io.h"
 #include "posix/retry.h"
 
 namespace {
 
-using KeloDRCore::Posix::Descriptor;
-using KeloDRCore::Posix::Retry;
+namespace Posix = KeloDRCore::Posix;
+using Posix::Descriptor;
+using Posix::Retry;
 
 constexpr char kWhiteSpace[] = " \t\n\r\v\f";
 
-// The first `size` bytes of a file. A FIFO planted under the name does not hold the reader up.
-ssize_t ReadStart(const char* path, char* buffer, size_t size) {
-  const Descriptor file(
-      Retry([&] { return open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY); }));
-  if (!file.IsOpen()) return -1;
-  size_t length = 0;
-  while (length < size) {
-    const ssize_t count = Retry([&] { return read(file.Get(), buffer + length, size - length); });
-    if (count < 0) return -1;
-    if (count == 0) break;
-    length += static_cast<size_t>(count);
-  }
-  return static_cast<ssize_t>(length);
+// The first `limit` bytes of a file. A FIFO planted under the name does not hold the reader up. No
+// exception: the callers are C functions.
+bool ReadStart(const char* path, size_t limit, std::string& text) try {
+  const Descriptor file = Posix::Open(path, O_RDONLY | Posix::kHarmless);
+  return file.IsOpen() && Posix::ReadAll(file.Get(), text, limit);
+} catch (const std::bad_alloc&) {
+  return Posix::Fail(ENOMEM);
 }
 
 struct ProcStat {
@@ -50,18 +48,15 @@ struct ProcStat {
 bool ReadProcStat(int pid, ProcStat* stat) {
   char path[32];
   snprintf(path, sizeof path, "/proc/%d/stat", pid);
-  char text[1024];
-  const ssize_t length = ReadStart(path, text, sizeof text - 1);
-  if (length < 0) return false;
-  text[length] = '\0';
-  const char* nameEnd = strrchr(text, ')');
+  std::string text;
+  if (!ReadStart(path, 1024, text)) return false;
+  const size_t nameEnd = text.rfind(')');
   unsigned long long startTime = 0;
-  if (nameEnd == nullptr ||
-      sscanf(nameEnd + 1,
+  if (nameEnd == std::string::npos ||
+      sscanf(&text[nameEnd + 1],
              " %c %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %d %*s %llu",
              &stat->state, &stat->threads, &startTime) != 3) {
-    errno = ENOENT;  // not what proc(5) describes: no kernel of the tests
-    return false;
+    return Posix::Fail(ENOENT);  // not what proc(5) describes
   }
   stat->startTime = startTime;
   return true;
@@ -92,16 +87,10 @@ bool ParseNumber(std::string_view text, uint64_t* number) {
 
 // The first byte comes last and alone. Before it a reader finds no digit there and thus no pid,
 // however many writes the rest takes and wherever they break off.
-bool WritePidFile(int fd, const char* text) {
-  const size_t length = strlen(text);
-  if (fchmod(fd, 0644) != 0) return false;
-  for (size_t done = 1; done < length;) {
-    const ssize_t count =
-        Retry([&] { return pwrite(fd, text + done, length - done, static_cast<off_t>(done)); });
-    if (count <= 0) return false;
-    done += static_cast<size_t>(count);
-  }
-  return Retry([&] { return pwrite(fd, text, 1, 0); }) == 1;
+bool WritePidFile(int fd, std::string text) {
+  const char first = std::exchange(text.front(), '\0');
+  return fchmod(fd, 0644) == 0 && Posix::WriteAll(fd, text) &&
+         Retry([&] { return pwrite(fd, &first, 1, 0); }) == 1;
 }
 
 }  // namespace
@@ -129,10 +118,10 @@ int KLIBCFileCheckDir(const char* path) {
 }
 
 int KLIBCReadPidFile(const char* path) {
-  char buffer[128];
-  const ssize_t length = ReadStart(path, buffer, sizeof buffer);
-  if (length < 0 || length == sizeof buffer) return 0;
-  const std::string_view text = Trim({buffer, static_cast<size_t>(length)});
+  constexpr size_t kTooLong = 128;
+  std::string content;
+  if (!ReadStart(path, kTooLong, content) || content.size() == kTooLong) return 0;
+  const std::string_view text = Trim(content);
   const size_t newline = text.find('\n');
   uint64_t pid = 0;
   if (!ParseNumber(Trim(text.substr(0, newline)), &pid) || pid > INT_MAX) return 0;

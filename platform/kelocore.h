@@ -8,13 +8,15 @@
 
 extern "C" {
 
-// Runs `program` with up to four arguments (a null one ends the list), without a shell, and waits
-// for it, restarting after signals. 0 only when it exited with status 0. Works when the caller
-// ignores SIGCHLD, and leaks no descriptor into the child.
+// Programs are run without a shell, with a fixed environment of PATH and LC_ALL only.
+
+// Runs `program` with up to four arguments (a null one ends the list), its standard streams on
+// /dev/null, and waits for it, restarting after signals. 0 only when it exited with status 0. Works
+// when the caller ignores SIGCHLD, and leaks no descriptor into the child.
 int KLIBCExec(const char* program, const char* a1, const char* a2, const char* a3, const char* a4);
 
-// Starts `program` with the given arguments (a null pointer ends the list), without a shell, its
-// standard output ("r") or input ("w") on the stream. Null when the program cannot be started.
+// Starts `program` with the given arguments (a null pointer ends the list), its standard output
+// ("r") or input ("w") on the stream. Null when the program cannot be started.
 FILE* KLIBCPopen(const char* program, const char* mode, ... /* NULL */);
 
 // Closes a stream of KLIBCPopen and waits for its program; the wait status, or -1.

@@ -6,6 +6,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <cstdarg>
 #include <cstring>
@@ -30,6 +31,11 @@ constexpr int kFirstFreeDescriptor = STDERR_FILENO + 1;
 Descriptor AboveStandardStreams(Descriptor descriptor) {
   if (!descriptor.IsOpen() || descriptor.Get() >= kFirstFreeDescriptor) return descriptor;
   return Descriptor(fcntl(descriptor.Get(), F_DUPFD_CLOEXEC, kFirstFreeDescriptor));
+}
+
+Descriptor OpenNull() {
+  return AboveStandardStreams(
+      Descriptor(Retry([] { return open("/dev/null", O_RDWR | O_CLOEXEC); })));
 }
 
 struct Pipe {
@@ -89,11 +95,13 @@ struct Program {
   Descriptor report;
 };
 
-// Which standard stream of a program is one end of a pipe.
-struct Redirection {
-  int fd;
-  int target;
-};
+// What becomes the standard streams of a program; kKept for those that it shares with the caller.
+using Streams = std::array<int, kFirstFreeDescriptor>;
+constexpr int kKept = -1;
+
+// The caller's own environment could change what a program does: it may be that of an ordinary
+// user who has started a set-id program.
+constexpr const char* kEnvironment[] = {"PATH=/usr/sbin:/usr/bin:/sbin:/bin", "LC_ALL=C", nullptr};
 
 // Returns an errno, 0 for a running program. Ids stay as they are: a caller that is root only
 // effectively runs the program as such.
@@ -108,17 +116,18 @@ int Spawn(const char* program, char* const argv[], pid_t* pid) {
   posix_spawnattr_setsigdefault(&attributes, &all);
   posix_spawnattr_setsigmask(&attributes, &none);
   posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
-  error = posix_spawn(pid, program, nullptr, &attributes, argv, environ);
+  error =
+      posix_spawn(pid, program, nullptr, &attributes, argv, const_cast<char* const*>(kEnvironment));
   posix_spawnattr_destroy(&attributes);
   return error;
 }
 
 // Leaves the standard streams and, above them, only the report. After a failure nothing may be put
 // on the numbers meant: they are still files of the caller's.
-bool ArrangeDescriptors(const Redirection* redirection, int report) {
-  if (redirection != nullptr &&
-      Retry([&] { return dup2(redirection->fd, redirection->target); }) < 0) {
-    return false;
+bool ArrangeDescriptors(const Streams& streams, int report) {
+  for (int target = 0; target < kFirstFreeDescriptor; ++target) {
+    const int fd = streams[static_cast<size_t>(target)];
+    if (fd != kKept && Retry([&] { return dup2(fd, target); }) < 0) return false;
   }
   if (report != kFirstFreeDescriptor &&
       Retry([&] { return dup3(report, kFirstFreeDescriptor, O_CLOEXEC); }) < 0) {
@@ -130,10 +139,10 @@ bool ArrangeDescriptors(const Redirection* redirection, int report) {
 
 // The supervisor's whole life, with every signal blocked. It lets go of the standard streams once
 // the program has them: the end of the program's output must not wait for the supervisor's.
-[[noreturn]] void Supervise(const char* program, char* const argv[], const Redirection* redirection,
+[[noreturn]] void Supervise(const char* program, char* const argv[], const Streams& streams,
                             int report) {
   signal(SIGCHLD, SIG_DFL);
-  if (!ArrangeDescriptors(redirection, report)) {
+  if (!ArrangeDescriptors(streams, report)) {
     Send(report, errno);
     _exit(0);
   }
@@ -149,14 +158,13 @@ bool ArrangeDescriptors(const Redirection* redirection, int report) {
 }
 
 // False with errno when the program cannot be started; nothing is left of it then.
-bool Start(const char* program, char* const argv[], const Redirection* redirection,
-           Program* started) {
+bool Start(const char* program, char* const argv[], const Streams& streams, Program* started) {
   Pipe report;
   if (!report.Open()) return false;
   {
     const SignalBlock block;
     started->supervisor = fork();
-    if (started->supervisor == 0) Supervise(program, argv, redirection, report.writeEnd.Get());
+    if (started->supervisor == 0) Supervise(program, argv, streams, report.writeEnd.Get());
   }
   if (started->supervisor < 0) return false;
   report.writeEnd.Close();
@@ -213,8 +221,9 @@ FILE* OpenStream(const char* program, const char* mode, char* const argv[]) {
   entry->stream = fdopen(own.Get(), mode);
   if (entry->stream == nullptr) return nullptr;
   own.Release();
-  const Redirection redirection{other.Get(), reading ? STDOUT_FILENO : STDIN_FILENO};
-  if (!Start(program, argv, &redirection, &entry->program)) {
+  Streams streams{kKept, kKept, kKept};
+  streams[reading ? STDOUT_FILENO : STDIN_FILENO] = other.Get();
+  if (!Start(program, argv, streams, &entry->program)) {
     const int savedErrno = errno;
     fclose(entry->stream);
     errno = savedErrno;
@@ -257,8 +266,12 @@ extern "C" {
 
 int KLIBCExec(const char* program, const char* a1, const char* a2, const char* a3, const char* a4) {
   const char* argv[] = {program, a1, a2, a3, a4, nullptr};
+  const Descriptor null = OpenNull();
+  const Streams streams{null.Get(), null.Get(), null.Get()};
   Program started;
-  if (!Start(program, const_cast<char* const*>(argv), nullptr, &started)) return -1;
+  if (!null.IsOpen() || !Start(program, const_cast<char* const*>(argv), streams, &started)) {
+    return -1;
+  }
   return Finish(started) == 0 ? 0 : -1;
 }
 
@@ -290,8 +303,7 @@ int KLIBCPclose(FILE* stream) {
 int KLIBCProcForkEx(int flags) {
   Descriptor null;
   if ((flags & kForkSession) != 0) {
-    null = AboveStandardStreams(
-        Descriptor(Retry([] { return open("/dev/null", O_RDWR | O_CLOEXEC); })));
+    null = OpenNull();
     if (!null.IsOpen()) return -1;
   }
   const pid_t pid = (flags & kForkDetached) != 0 ? ForkDetached() : fork();

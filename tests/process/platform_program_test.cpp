@@ -208,16 +208,33 @@ TEST_F(ExecTest, LeaksNoDescriptor) {
   EXPECT_EQ(ReadText(file), "0\n1\n2\n3\n");  // 3 is the directory that ls reads
 }
 
-TEST_F(ExecTest, KeepsTheStandardStreams) {
+// A caller's data file may have the number of a standard stream.
+TEST_F(ExecTest, PutsTheStandardStreamsOnDevNull) {
   const std::string file = Path("text");
-  WriteText(file, "in");
+  WriteText(file, "data");
   EXPECT_EQ(RunInChild([&] {
               const int fd = open(file.c_str(), O_RDWR | O_APPEND);
               for (const int standard : {0, 1, 2}) dup2(fd, standard);
-              EXPECT_EQ(Shell("read x; echo \" $x out\"; echo err >&2"), 0);
+              EXPECT_EQ(Shell("read x && exit 1; echo out; echo err >&2"), 0);
             }),
             0);
-  EXPECT_EQ(ReadText(file), "in in out\nerr\n");
+  EXPECT_EQ(ReadText(file), "data");
+}
+
+// The shell adds three variables of its own.
+constexpr char kTellsEnvironment[] =
+    "test \"$(env | grep -v -e ^PWD= -e ^SHLVL= -e ^_= | sort | xargs)\" = "
+    "'LC_ALL=C PATH=/usr/sbin:/usr/bin:/sbin:/bin'";
+
+TEST_F(ExecTest, GivesTheProgramAFixedEnvironment) {
+  EXPECT_EQ(RunInChild([] {
+              setenv("POSIXLY_CORRECT", "1", 1);
+              setenv("PATH", "/nowhere", 1);
+              EXPECT_EQ(Shell(kTellsEnvironment), 0);
+              clearenv();
+              EXPECT_EQ(Shell(kTellsEnvironment), 0);
+            }),
+            0);
 }
 
 TEST_F(ExecTest, WorksWithoutStandardStreams) {
@@ -225,7 +242,6 @@ TEST_F(ExecTest, WorksWithoutStandardStreams) {
               for (const int standard : {0, 1, 2}) close(standard);
               EXPECT_EQ(Shell("exit 0"), 0);
               EXPECT_NE(Shell("exit 3"), 0);
-              EXPECT_EQ(Shell("test ! -e /proc/$$/fd/0 && test ! -e /proc/$$/fd/1"), 0);
             }),
             0);
 }
@@ -271,6 +287,16 @@ TEST_F(PopenTest, RunsAProgramWithoutArguments) {
   ASSERT_NE(stream, nullptr);
   EXPECT_EQ(ReadAll(stream).front(), '/');
   EXPECT_EQ(KLIBCPclose(stream), 0);
+}
+
+TEST_F(PopenTest, GivesTheProgramAFixedEnvironment) {
+  EXPECT_EQ(RunInChild([] {
+              setenv("POSIXLY_CORRECT", "1", 1);
+              FILE* stream = PopenShell("r", kTellsEnvironment);
+              ASSERT_NE(stream, nullptr);
+              EXPECT_EQ(KLIBCPclose(stream), 0);
+            }),
+            0);
 }
 
 TEST_F(PopenTest, WritesTheInput) {

@@ -367,30 +367,31 @@ TEST_F(ProcAliveTest, IsOneWhereTheProcessCannotBeLookedAt) {
 // What another kernel, or another file system at /proc, would tell of this process.
 class ProcStatTest : public CleanTest {
  protected:
-  void RunWithStat(const std::string& text, const std::function<void()>& body) {
-    if (!RunWithOwnMounts([&] {
-          const std::string own = "/proc/" + std::to_string(getpid());
-          ASSERT_EQ(mount("tmpfs", "/proc", "tmpfs", 0, "size=64k"), 0);
-          ASSERT_EQ(mkdir(own.c_str(), 0755), 0);
-          WriteText(own + "/stat", text);
-          body();
-        })) {
-      GTEST_SKIP() << "needs the right to mount a file system";
-    }
+  static bool RunWithStat(const std::string& text, const std::function<void()>& body) {
+    return RunWithOwnMounts([&] {
+      const std::string own = "/proc/" + std::to_string(getpid());
+      ASSERT_EQ(mount("tmpfs", "/proc", "tmpfs", 0, "size=64k"), 0);
+      ASSERT_EQ(mkdir(own.c_str(), 0755), 0);
+      WriteText(own + "/stat", text);
+      body();
+    });
   }
 };
 
+constexpr char kNoMount[] = "needs the right to mount a file system";
+
 TEST_F(ProcStatTest, AnotherFormTellsNothing) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root to mount a file system";
   for (const char* const text : {"", "1234", "1234 (x", "1234 (x) S", "1234 (x) S 1 2 3"}) {
-    RunWithStat(text, [this] {
-      EXPECT_EQ(KLIBCProcAlive(getpid()), 1);
-      WriteText(Path("pid"), std::to_string(getpid()) + "\n1\n");
-      EXPECT_EQ(KLIBCReadPidFile(Path("pid").c_str()), getpid());
-      errno = 0;
-      EXPECT_NE(KLIBCProcPidFileCreate(Path("mine").c_str()), 0);
-      EXPECT_EQ(errno, ENOENT);
-    });
+    if (!RunWithStat(text, [this] {
+          EXPECT_EQ(KLIBCProcAlive(getpid()), 1);
+          WriteText(Path("pid"), std::to_string(getpid()) + "\n1\n");
+          EXPECT_EQ(KLIBCReadPidFile(Path("pid").c_str()), getpid());
+          errno = 0;
+          EXPECT_NE(KLIBCProcPidFileCreate(Path("mine").c_str()), 0);
+          EXPECT_EQ(errno, ENOENT);
+        })) {
+      GTEST_SKIP() << kNoMount;
+    }
     EXPECT_EQ(NamesIn(dir), std::vector<std::string>{"pid"}) << text;
   }
 }
@@ -398,8 +399,10 @@ TEST_F(ProcStatTest, AnotherFormTellsNothing) {
 // Kernels have shown it for a moment between a process's end and its removal.
 TEST_F(ProcStatTest, ADeadProcessIsNotAlive) {
   const std::string rest = " 1 1 1 0 -1 4194304 1 0 0 0 0 0 0 0 20 0 1 0 77 0 0";
-  RunWithStat("1 (x) X" + rest, [] { EXPECT_EQ(KLIBCProcAlive(getpid()), 0); });
-  RunWithStat("1 (x) S" + rest, [] { EXPECT_EQ(KLIBCProcAlive(getpid()), 1); });
+  if (!RunWithStat("1 (x) X" + rest, [] { EXPECT_EQ(KLIBCProcAlive(getpid()), 0); }) ||
+      !RunWithStat("1 (x) S" + rest, [] { EXPECT_EQ(KLIBCProcAlive(getpid()), 1); })) {
+    GTEST_SKIP() << kNoMount;
+  }
 }
 
 // /proc calls a process a zombie as soon as its first thread ends.
