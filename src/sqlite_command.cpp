@@ -1,7 +1,5 @@
 #include "kelodrcore/sqlite_command.h"
 
-#include <utility>
-
 #include "kelodrcore/container.h"
 #include "log.h"
 #include "value_access.h"
@@ -9,21 +7,11 @@
 namespace KeloDRCore {
 namespace {
 
-template <typename T>
-constexpr bool IsNull(const T& /*value*/) {
+bool SetField(SqliteValueList& list, const std::string& field, const SqliteValue& value) {
+  if (!field.empty() && value.IsValid()) return list.AddValue(field, value);
+  KELODR_LOG(ERR, "AddFieldValue", "Bad Field [%s] /value[%s]", field.c_str(),
+             value.ToFormatedValue().c_str());
   return false;
-}
-bool IsNull(const char* value) { return value == nullptr; }
-
-template <typename T>
-bool AddField(SqliteValueList& list, const std::string& field, const T& value) {
-  if (field.empty() || IsNull(value)) {
-    KELODR_LOG(ERR, "AddFieldValue", "Bad Field [%s] /value[%s]", field.c_str(),
-               SqliteValue(value).ToFormatedValue().c_str());
-    return false;
-  }
-  ValueAccess::SetField(list, field, value);
-  return true;
 }
 
 // Checks the condition; what its text means to the command stays with the command.
@@ -37,62 +25,19 @@ bool SetConditionText(Command& command, const SqliteCondition& condition) {
 }
 
 // "name=literal" for each field, with "," between.
-void AppendAssignments(std::string& text, const SqliteValueList& list) {
-  bool isFirst = true;
+std::string Assignments(const SqliteValueList& list) {
+  std::string text;
   for (const auto& [field, value] : list.GetValues()) {
-    if (!isFirst) text += ',';
-    isFirst = false;
+    if (!text.empty()) text += ',';
     text += field;
     text += '=';
     ValueAccess::AppendLiteral(text, value);
   }
+  return text;
 }
 
-// None of the names is empty.
-void AppendNames(std::string& text, const std::vector<std::string>& names) {
-  bool isFirst = true;
-  for (const std::string& name : names) {
-    if (!isFirst) text += ',';
-    isFirst = false;
-    text += name;
-  }
-}
-
-// Room for a statement, so that most are built without growing.
-constexpr size_t kFixedRoom = 64;
-constexpr size_t kFieldRoom = 40;
-constexpr size_t kNameRoom = 16;
-
-void Reserve(std::string& text, const SqliteValueList& list) {
-  text.reserve(kFixedRoom + kFieldRoom * list.GetValues().size());
-}
-
-void AppendWhere(std::string& text, const std::string& condition) {
-  if (!condition.empty()) text.append(" WHERE ").append(condition);
-}
-
-void DumpValues(std::stringstream& stream, const SqliteValueList& list) {
-  std::string assignments;
-  AppendAssignments(assignments, list);
-  stream << "values:[" << assignments << "]";
-}
-
-// "(names) VALUES (literals)". The comma stands only behind text, as Container::ToString joins: a
-// literal may be the empty text.
-void AppendInsertValues(std::string& text, const SqliteValueList& list) {
-  text += '(';
-  size_t start = text.size();
-  for (const auto& entry : list.GetValues()) {
-    if (text.size() != start) text += ',';
-    text += entry.first;
-  }
-  text += ") VALUES (";
-  start = text.size();
-  for (const auto& entry : list.GetValues()) {
-    if (text.size() != start) text += ',';
-    ValueAccess::AppendLiteral(text, entry.second);
-  }
-  text += ')';
+std::string Where(const std::string& condition) {
+  return condition.empty() ? "" : " WHERE " + condition;
 }
 
 }  // namespace
@@ -129,34 +74,33 @@ std::string InsertCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad insert parameter");
     return "";
   }
-  std::string text;
-  Reserve(text, fieldValues);
-  text += replacable ? "INSERT OR REPLACE INTO " : "INSERT INTO ";
-  text.append(GetTable().tableName) += ' ';
-  AppendInsertValues(text, fieldValues);
-  text += ';';
-  return text;
+  return (replacable ? "INSERT OR REPLACE INTO " : "INSERT INTO ") + GetTable().tableName + " " +
+         ToFormatedInsertValues() + ";";
 }
 
 std::string InsertCommand::ToFormatedInsertValues() const {
-  std::string text;
-  AppendInsertValues(text, fieldValues);
-  return text;
+  std::string names;
+  std::string literals;
+  for (const auto& [field, value] : fieldValues.GetValues()) {
+    if (!names.empty()) names += ',';
+    names += field;
+    // Behind text only, as Container::ToString joins: a literal may be the empty text.
+    if (!literals.empty()) literals += ',';
+    ValueAccess::AppendLiteral(literals, value);
+  }
+  return "(" + names + ") VALUES (" + literals + ")";
 }
 
-void InsertCommand::DumpParam(std::stringstream& stream) const { DumpValues(stream, fieldValues); }
+void InsertCommand::DumpParam(std::stringstream& stream) const {
+  stream << "values:[" << Assignments(fieldValues) << "]";
+}
 
 void InsertCommand::SetFieldValues(const SqliteValueList& list) { fieldValues = list; }
 
 void InsertCommand::SetReplacable(bool isReplacable) { replacable = isReplacable; }
 
-template <typename T, typename>
-bool InsertCommand::AddFieldValue(const std::string& field, const T& value) {
-  return AddField(fieldValues, field, value);
-}
-
-bool InsertCommand::AddFieldValue(const std::string& field, const char* value) {
-  return AddField(fieldValues, field, value);
+bool InsertCommand::AddField(const std::string& field, const SqliteValue& value) {
+  return SetField(fieldValues, field, value);
 }
 
 UpdateCommand::UpdateCommand() = default;
@@ -170,29 +114,17 @@ std::string UpdateCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad update command");
     return "";
   }
-  std::string text;
-  Reserve(text, fieldValues);
-  text += "UPDATE ";
-  text.append(GetTable().tableName).append(" SET ");
-  AppendAssignments(text, fieldValues);
-  AppendWhere(text, condition);
-  return text;
+  return "UPDATE " + GetTable().tableName + " SET " + Assignments(fieldValues) + Where(condition);
 }
 
 void UpdateCommand::DumpParam(std::stringstream& stream) const {
-  stream << "condition:[" << condition << "]/";
-  DumpValues(stream, fieldValues);
+  stream << "condition:[" << condition << "]/values:[" << Assignments(fieldValues) << "]";
 }
 
 void UpdateCommand::SetFieldValues(const SqliteValueList& list) { fieldValues = list; }
 
-template <typename T, typename>
-bool UpdateCommand::AddFieldValue(const std::string& field, const T& value) {
-  return AddField(fieldValues, field, value);
-}
-
-bool UpdateCommand::AddFieldValue(const std::string& field, const char* value) {
-  return AddField(fieldValues, field, value);
+bool UpdateCommand::AddField(const std::string& field, const SqliteValue& value) {
+  return SetField(fieldValues, field, value);
 }
 
 bool UpdateCommand::SetCondition(const std::string& text) {
@@ -216,33 +148,23 @@ std::string SelectCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad select command");
     return "";
   }
-  std::string text;
-  text.reserve(kFixedRoom + kNameRoom * fields.size());
-  text += "SELECT ";
+  std::string text = "SELECT ";
   if (!fields.empty()) {
-    AppendNames(text, fields);
-    text += ' ';
+    text += Container::ToString(fields, ",") + " ";
   } else if (selectAll) {
-    text += " * ";  // two blanks in front of the asterisk, as readers of the statements expect it
+    text += " * ";
   }
-  text.append("FROM ").append(GetTable().tableName);
-  AppendWhere(text, condition);
+  text += "FROM " + GetTable().tableName + Where(condition);
   if (!orderFields.empty()) {
-    text += " ORDER BY ";
-    AppendNames(text, orderFields);
-    text += orderByASC ? " ASC" : " DESC";
+    text += " ORDER BY " + Container::ToString(orderFields, ",") + (orderByASC ? " ASC" : " DESC");
   }
-  if (limit >= 1) {
-    text.append(" LIMIT ").append(std::to_string(offset));
-    text.append(", ").append(std::to_string(limit));
-  }
+  if (limit >= 1) text += " LIMIT " + std::to_string(offset) + ", " + std::to_string(limit);
   return text;
 }
 
 void SelectCommand::DumpParam(std::stringstream& stream) const {
-  std::string names = "all";
-  if (!selectAll) names = Container::ToString(fields, ", ");
-  stream << "condition:[" << condition << "]/fields:[" << names << "]";
+  stream << "condition:[" << condition << "]/fields:["
+         << (selectAll ? "all" : Container::ToString(fields, ", ")) << "]";
 }
 
 bool SelectCommand::AddField(const std::string& field) {
@@ -304,17 +226,11 @@ std::string DeleteCommand::GetCommand() const {
     KELODR_LOG(ERR, __func__, "%s", "Bad delete command");
     return "";
   }
-  std::string text = "DELETE FROM ";
-  text += GetTable().tableName;
-  AppendWhere(text, condition);
-  text += ';';
-  return text;
+  return "DELETE FROM " + GetTable().tableName + Where(condition) + ";";
 }
 
 void DeleteCommand::DumpParam(std::stringstream& stream) const {
-  std::string rows = condition;
-  if (rows.empty() && deleteAll) rows = "all";
-  stream << "condition:[" << rows << "]";
+  stream << "condition:[" << (condition.empty() && deleteAll ? "all" : condition) << "]";
 }
 
 void DeleteCommand::DeleteAll() { deleteAll = true; }
@@ -329,27 +245,5 @@ bool DeleteCommand::SetCondition(const std::string& text) {
 bool DeleteCommand::SetCondition(const SqliteCondition& sqliteCondition) {
   return SetConditionText(*this, sqliteCondition);
 }
-
-template KELODR_EXPORT bool InsertCommand::AddFieldValue(const std::string& field,
-                                                         const std::string& value);
-template KELODR_EXPORT bool InsertCommand::AddFieldValue(const std::string& field,
-                                                         const bool& value);
-template KELODR_EXPORT bool InsertCommand::AddFieldValue(const std::string& field,
-                                                         const int& value);
-template KELODR_EXPORT bool InsertCommand::AddFieldValue(const std::string& field,
-                                                         const unsigned int& value);
-template KELODR_EXPORT bool InsertCommand::AddFieldValue(const std::string& field,
-                                                         const long& value);
-
-template KELODR_EXPORT bool UpdateCommand::AddFieldValue(const std::string& field,
-                                                         const std::string& value);
-template KELODR_EXPORT bool UpdateCommand::AddFieldValue(const std::string& field,
-                                                         const bool& value);
-template KELODR_EXPORT bool UpdateCommand::AddFieldValue(const std::string& field,
-                                                         const int& value);
-template KELODR_EXPORT bool UpdateCommand::AddFieldValue(const std::string& field,
-                                                         const unsigned int& value);
-template KELODR_EXPORT bool UpdateCommand::AddFieldValue(const std::string& field,
-                                                         const long& value);
 
 }  // namespace KeloDRCore

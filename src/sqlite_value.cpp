@@ -32,56 +32,39 @@ void AppendQuoted(std::string& text, const char* at, const char* end) {
   text += '\'';
 }
 
-// Convert: true and `out` written when the payload can be read as that type.
-
-bool Convert(const Json::Value& value, int& out) {
-  if (!value.isInt()) return false;
-  out = value.asInt();
+// Reads a payload that JsonCpp has as a `Stored`. What does not fit in `Kept` is cut off.
+template <typename Stored, typename Kept = Stored, typename T>
+bool ReadAs(const Json::Value& payload, T& out) {
+  if (!payload.is<Stored>()) return false;
+  out = static_cast<Kept>(payload.as<Stored>());
   return true;
 }
 
-bool Convert(const Json::Value& value, unsigned int& out) {
-  if (!value.isUInt()) return false;
-  out = value.asUInt();
-  return true;
+bool ReadPayload(const Json::Value& payload, int& out) { return ReadAs<Json::Int>(payload, out); }
+bool ReadPayload(const Json::Value& payload, unsigned int& out) {
+  return ReadAs<Json::UInt>(payload, out);
 }
-
-bool Convert(const Json::Value& value, long long& out) {
-  if (!value.isInt64()) return false;
-  out = value.asLargestInt();
-  return true;
+bool ReadPayload(const Json::Value& payload, long& out) {
+  return ReadAs<Json::Int64, int32_t>(payload, out);
 }
-
-bool Convert(const Json::Value& value, unsigned long long& out) {
-  if (!value.isUInt64()) return false;
-  out = value.asLargestUInt();
-  return true;
+bool ReadPayload(const Json::Value& payload, unsigned long& out) {
+  return ReadAs<Json::UInt64, uint32_t>(payload, out);
 }
-
-bool Convert(const Json::Value& value, long& out) {
-  if (!value.isInt64()) return false;
-  out = static_cast<int32_t>(value.asLargestInt());
-  return true;
+bool ReadPayload(const Json::Value& payload, long long& out) {
+  return ReadAs<Json::Int64>(payload, out);
 }
-
-bool Convert(const Json::Value& value, unsigned long& out) {
-  if (!value.isUInt64()) return false;
-  out = static_cast<uint32_t>(value.asLargestUInt());
-  return true;
+bool ReadPayload(const Json::Value& payload, unsigned long long& out) {
+  return ReadAs<Json::UInt64>(payload, out);
 }
-
-bool Convert(const Json::Value& value, bool& out) {
-  if (!value.isBool() && !(value.isInt() && (value.asInt() == 0 || value.asInt() == 1))) {
-    return false;
+bool ReadPayload(const Json::Value& payload, std::string& out) {
+  return ReadAs<Json::String>(payload, out);
+}
+bool ReadPayload(const Json::Value& payload, bool& out) {
+  if (payload.isInt() && (payload.asInt() == 0 || payload.asInt() == 1)) {
+    out = payload.asInt() == 1;
+    return true;
   }
-  out = value.asBool();
-  return true;
-}
-
-bool Convert(const Json::Value& value, std::string& out) {
-  if (!value.isString()) return false;
-  out = value.asString();
-  return true;
+  return ReadAs<bool>(payload, out);
 }
 
 template <typename T>
@@ -90,22 +73,8 @@ constexpr const char* TypeName() {
   return std::is_integral_v<T> ? "int" : "string";
 }
 
-template <typename Value>
-bool SetField(std::map<std::string, SqliteValue>& values, const std::string& field,
-              Value&& fieldValue) {
-  if (field.empty() || !fieldValue.IsValid()) {
-    KELODR_LOG(ERR, "AddValue", "Bad Field[%s] or value [%s]", field.c_str(),
-               fieldValue.ToFormatedValue().c_str());
-    return false;
-  }
-  const auto [place, isNew] = values.try_emplace(field, std::forward<Value>(fieldValue));
-  // A failed try_emplace has not moved from its argument.
-  if (!isNew) place->second = std::forward<Value>(fieldValue);
-  return true;
-}
-
-// Logs in the name of `function` when the text cannot name a field.
-bool IsName(const std::string& field, const char* function) {
+// Logs in the name of `function` when there is no name.
+bool RequireName(const std::string& field, const char* function) {
   if (!field.empty()) return true;
   KELODR_LOG(ERR, function, "Invalid field [%s]", field.c_str());
   return false;
@@ -128,16 +97,10 @@ SqliteValue::SqliteValue(const char* text)
     : valid(text != nullptr), value(valid ? Json::Value(text) : Json::Value()) {}
 
 SqliteValue::SqliteValue(const SqliteValue& other) = default;
-SqliteValue::SqliteValue(SqliteValue&& other) noexcept = default;
 SqliteValue::~SqliteValue() = default;
 
 SqliteValue& SqliteValue::operator=(const SqliteValue& other) {
   value = other.value;
-  return *this;
-}
-
-SqliteValue& SqliteValue::operator=(SqliteValue&& other) noexcept {
-  value = std::move(other.value);
   return *this;
 }
 
@@ -168,16 +131,16 @@ void ValueAccess::AppendLiteral(std::string& text, const SqliteValue& value) {
 }
 
 template <typename T>
-bool SqliteValue::GetValue(T& out) const {
-  if (Convert(value, out)) return true;
-  KELODR_LOG(WARN, __func__, "[%s] is not %s", JsonValue::toString(value).c_str(), TypeName<T>());
+bool SqliteValue::Read(T& out) const {
+  if (ReadPayload(value, out)) return true;
+  KELODR_LOG(WARN, "GetValue", "[%s] is not %s", JsonValue::toString(value).c_str(), TypeName<T>());
   return false;
 }
 
 SqliteValueList::SqliteValueList() = default;
 SqliteValueList::SqliteValueList(const SqliteValueList& other) = default;
 SqliteValueList::SqliteValueList(SqliteValueList&& other) noexcept
-    : values(std::move(other.values)) {}
+    : values(std::exchange(other.values, {})) {}
 SqliteValueList::~SqliteValueList() = default;
 
 SqliteValueList& SqliteValueList::operator=(const SqliteValueList& other) {
@@ -186,16 +149,18 @@ SqliteValueList& SqliteValueList::operator=(const SqliteValueList& other) {
 }
 
 SqliteValueList& SqliteValueList::operator=(SqliteValueList&& other) noexcept {
-  values.swap(other.values);  // other than a move, also right for a list given to itself
+  values = std::exchange(other.values, {});
   return *this;
 }
 
 bool SqliteValueList::AddValue(const std::string& field, const SqliteValue& fieldValue) {
-  return SetField(values, field, fieldValue);
-}
-
-bool SqliteValueList::AddValue(const std::string& field, SqliteValue&& fieldValue) {
-  return SetField(values, field, std::move(fieldValue));
+  if (field.empty() || !fieldValue.IsValid()) {
+    KELODR_LOG(ERR, __func__, "Bad Field[%s] or value [%s]", field.c_str(),
+               fieldValue.ToFormatedValue().c_str());
+    return false;
+  }
+  values.insert_or_assign(field, fieldValue);
+  return true;
 }
 
 SqliteValueList& SqliteValueList::operator+=(const SqliteValueList& other) {
@@ -204,28 +169,23 @@ SqliteValueList& SqliteValueList::operator+=(const SqliteValueList& other) {
 }
 
 const SqliteValue& SqliteValueList::GetValue(const std::string& field) const {
-  if (!IsName(field, __func__)) return nullValue;
+  if (!RequireName(field, __func__)) return nullValue;
   const auto found = values.find(field);
-  if (found == values.end()) {
-    KELODR_LOG(WARN, __func__, "Failed to find field [%s]", field.c_str());
-    return nullValue;
-  }
-  return found->second;
+  if (found != values.end()) return found->second;
+  KELODR_LOG(WARN, __func__, "Failed to find field [%s]", field.c_str());
+  return nullValue;
 }
 
-template <typename T>
-bool SqliteValueList::GetValue(const std::string& field, T& out) const {
-  if (!IsName(field, __func__)) return false;
+const SqliteValue* SqliteValueList::FindForReading(const std::string& field) const {
+  if (!RequireName(field, "GetValue")) return nullptr;
   const auto found = values.find(field);
-  if (found == values.end()) {
-    KELODR_LOG(DEBUG, __func__, "field [%s] is not existed", field.c_str());
-    return false;
-  }
-  return found->second.GetValue(out);
+  if (found != values.end()) return &found->second;
+  KELODR_LOG(DEBUG, "GetValue", "field [%s] is not existed", field.c_str());
+  return nullptr;
 }
 
 bool SqliteValueList::HasField(const std::string& field) const {
-  if (!IsName(field, __func__)) return false;
+  if (!RequireName(field, __func__)) return false;
   return values.count(field) != 0;
 }
 
@@ -242,27 +202,13 @@ std::string SqliteValueList::ToStr() const {
 
 SqliteValueList SqliteRecord::ToSqliteRecord() const { return ConvertColumns(GetColumns()); }
 
-template KELODR_EXPORT bool SqliteValue::GetValue(bool& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(int& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(unsigned int& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(long& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(unsigned long& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(long long& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(unsigned long long& out) const;
-template KELODR_EXPORT bool SqliteValue::GetValue(std::string& out) const;
-
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field, bool& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field, int& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
-                                                      unsigned int& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field, long& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
-                                                      unsigned long& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
-                                                      long long& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
-                                                      unsigned long long& out) const;
-template KELODR_EXPORT bool SqliteValueList::GetValue(const std::string& field,
-                                                      std::string& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(bool& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(int& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(unsigned int& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(long& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(unsigned long& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(long long& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(unsigned long long& out) const;
+template KELODR_EXPORT bool SqliteValue::Read(std::string& out) const;
 
 }  // namespace KeloDRCore

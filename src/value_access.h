@@ -21,11 +21,8 @@ class ValueAccess {
   // must not be empty, and the value must be valid.
   template <typename T>
   static void SetField(SqliteValueList& list, const std::string& field, const T& payload) {
-    auto& values = list.values;
-    const size_t size = values.size();
     // Fields mostly come in order: look at the end first.
-    const auto place = values.try_emplace(values.end(), field, payload);
-    if (values.size() == size) place->second = SqliteValue(payload);
+    list.values.insert_or_assign(list.values.end(), field, payload);
   }
 };
 

@@ -1,5 +1,9 @@
 /// @file
 /// Typed SQL values and the records made of them.
+///
+/// Deliberate, and frozen because callers and databases rely on it: assignment leaves a value's
+/// validity alone, integers outside 32 bits are rendered as the empty text, and names keep their
+/// spelling (`ToFormatedValue`).
 
 #ifndef KELODRCORE_SQLITE_VALUE_H_
 #define KELODRCORE_SQLITE_VALUE_H_
@@ -15,21 +19,18 @@
 
 namespace KeloDRCore {
 
-/// One typed SQL value that prints itself as an SQL literal. Its payload is a JSON value, whose
-/// JSON type is the value's type.
+/// One typed SQL value. Its payload is a JSON value, whose JSON type is the value's type.
 ///
-/// There is no value for a real number and none for an explicit NULL: a default-constructed value
-/// marks the absence of a value.
+/// There is no value for a real number and none for NULL: a default-constructed value marks the
+/// absence of a value. A value is copied and never moved from.
 class KELODR_EXPORT SqliteValue {
  public:
   /// No value: invalid, and rendered as the empty text.
   SqliteValue();
 
   // NOLINTBEGIN(google-explicit-constructor)
+  /// A value of the argument's type. Implicit: a literal can stand wherever a value is asked for.
   /// @{
-  /// A value of the argument's type.
-  /// Implicit, so that a literal can stand wherever a value is asked for. An integer outside 32
-  /// bits is stored whole, but rendered as the empty text (see `ToFormatedValue`).
   SqliteValue(int number);
   SqliteValue(bool truth);
   SqliteValue(unsigned int number);
@@ -40,7 +41,7 @@ class KELODR_EXPORT SqliteValue {
   SqliteValue(const std::string& text);
   /// @}
 
-  /// A text up to its terminating NUL; a null pointer gives no value, as the default constructor.
+  /// The text up to its terminating NUL. A null pointer gives no value, as the default constructor.
   SqliteValue(const char* text);
 
   /// Other pointers would turn into a bool.
@@ -51,45 +52,49 @@ class KELODR_EXPORT SqliteValue {
   SqliteValue(double number) = delete;
   // NOLINTEND(google-explicit-constructor)
 
-  /// @{
-  /// Copies or moves payload and validity.
+  /// Copies payload and validity.
   SqliteValue(const SqliteValue& other);
-  SqliteValue(SqliteValue&& other) noexcept;
-  /// @}
 
   ~SqliteValue();
 
-  /// @{
-  /// Takes over the other's payload only.
-  /// The validity stays as it was, deliberately: assigning into a default-constructed value keeps
-  /// it invalid.
+  /// Copies the payload only. The validity stays: a default-constructed value stays invalid.
   SqliteValue& operator=(const SqliteValue& other);
-  SqliteValue& operator=(SqliteValue&& other) noexcept;
-  /// @}
 
   /// True when the value was constructed from something and its payload is a text, a bool or an
   /// integer.
   [[nodiscard]] bool IsValid() const;
 
-  /// The SQL literal of the value, whether it is valid or not: a text in single quotes with every
-  /// single quote in it doubled and nothing else escaped, "1" or "0" for a bool, decimal digits for
-  /// an integer within 32 bits (signed or unsigned). The empty text, deliberately, for anything
-  /// else: no value, and integers outside 32 bits. (The name's spelling is the interface's own, as
-  /// in `ToFormatedInsertValues` and `SetReplacable`.)
+  /// The SQL literal of the payload; validity is not asked. A text stands in single quotes, with
+  /// every single quote in it doubled and nothing else escaped. A bool is "1" or "0". An integer
+  /// within 32 bits, signed or unsigned, is written in decimal. Everything else is the empty text.
   [[nodiscard]] std::string ToFormatedValue() const;
 
-  /// Reads the payload into `out`. T is one of `bool`, `int`, `unsigned int`, `long`, `unsigned
-  /// long`, `long long`, `unsigned long long` and `std::string`; other types do not link.
+  /// Reads the payload into `out`; validity is not asked. T is `bool`, `int`, `unsigned int`,
+  /// `long`, `unsigned long`, `long long`, `unsigned long long` or `std::string`.
   ///
   /// An integer type takes any integer that fits it; `long` and `unsigned long` take any 64-bit
-  /// integer of their sign and keep its low 32 bits, on 64-bit systems too. `bool` takes a bool and
-  /// the integers 0 and 1. Validity is not asked. On failure `out` is untouched, a line at WARN
-  /// ("[...] is not int", "... bool" or "... string") is logged, and the result is false.
+  /// integer of their sign and keep its low 32 bits. `bool` takes a bool and the integers 0 and 1.
+  /// On failure the result is false, `out` is untouched, and a line at WARN is logged ("[...] is
+  /// not int", "... bool" or "... string").
   template <typename T>
-  bool GetValue(T& out) const;
+  bool GetValue(T& out) const {
+    static_assert(kIsReadable<T>,
+                  "GetValue reads bool, int, unsigned int, long, unsigned long, long long, "
+                  "unsigned long long and std::string");
+    return Read(out);
+  }
 
  private:
-  friend class ValueAccess;  // binds payloads, and appends literals to a statement
+  friend class ValueAccess;  // reads payloads and appends literals for the library's sources
+
+  template <typename T>
+  static constexpr bool kIsReadable =
+      std::is_same_v<T, bool> || std::is_same_v<T, int> || std::is_same_v<T, unsigned int> ||
+      std::is_same_v<T, long> || std::is_same_v<T, unsigned long> || std::is_same_v<T, long long> ||
+      std::is_same_v<T, unsigned long long> || std::is_same_v<T, std::string>;
+
+  template <typename T>
+  bool Read(T& out) const;
 
   bool valid;
   Json::Value value;
@@ -102,8 +107,8 @@ class KELODR_EXPORT SqliteValueList {
   /// An empty record.
   SqliteValueList();
 
+  /// Copies the fields, or takes them: a record that was moved from is empty.
   /// @{
-  /// Copies or moves the fields.
   SqliteValueList(const SqliteValueList& other);
   SqliteValueList(SqliteValueList&& other) noexcept;
   SqliteValueList& operator=(const SqliteValueList& other);
@@ -112,27 +117,26 @@ class KELODR_EXPORT SqliteValueList {
 
   virtual ~SqliteValueList();
 
-  /// @{
-  /// Sets a field, over an earlier value of that name.
-  /// False for an empty name or an invalid value: a line at ERR ("Bad Field[...] or value [...]"),
-  /// and the record is unchanged.
+  /// Sets a field; an earlier value of that name is replaced. False for an empty name or an invalid
+  /// value, with a line at ERR; the record is then unchanged.
   bool AddValue(const std::string& field, const SqliteValue& fieldValue);
-  bool AddValue(const std::string& field, SqliteValue&& fieldValue);
-  /// @}
 
-  /// Sets every field of `other` here too; what cannot be set is only logged.
+  /// Adds every field of `other` with `AddValue`. Failures are only logged.
   SqliteValueList& operator+=(const SqliteValueList& other);
 
   /// The value of a field. For an empty name (a line at ERR) or a missing field (a line at WARN) a
   /// reference to an invalid value that lives as long as the record.
   const SqliteValue& GetValue(const std::string& field) const;
 
-  /// Reads a field into `out` as `SqliteValue::GetValue` does, for the same types. False with `out`
-  /// untouched also for an empty name (a line at ERR) or a missing field (a line at DEBUG).
+  /// Reads a field into `out` as `SqliteValue::GetValue` does, for the same types. An empty name (a
+  /// line at ERR) or a missing field (a line at DEBUG) gives false too, with `out` untouched.
   template <typename T>
-  bool GetValue(const std::string& field, T& out) const;
+  bool GetValue(const std::string& field, T& out) const {
+    const SqliteValue* const found = FindForReading(field);
+    return found != nullptr && found->GetValue(out);
+  }
 
-  /// True when the field is there; false for an empty name, with a line at ERR.
+  /// True when the field is there. False for an empty name, with a line at ERR.
   bool HasField(const std::string& field) const;
 
   /// All fields and their values.
@@ -144,12 +148,15 @@ class KELODR_EXPORT SqliteValueList {
  private:
   friend class ValueAccess;  // sets fields in place, which halves the cost of a selected row
 
+  const SqliteValue* FindForReading(const std::string& field) const;
+
   SqliteValue nullValue;
   std::map<std::string, SqliteValue> values;
 };
 
-/// Base of the record types that a program defines for itself: tells its columns, turns itself into
-/// a `SqliteValueList` and reads itself back from one. Not deleted through this base.
+/// Base of the record types that a program defines for itself. A record type names its columns,
+/// turns itself into a `SqliteValueList` and reads itself back from one. It is not deleted through
+/// this base.
 class KELODR_EXPORT SqliteRecord {
  public:
   /// The values of the named columns.

@@ -137,6 +137,37 @@ TEST_F(SqliteValueListTest, AListGivenToItselfKeepsItsFields) {
   EXPECT_EQ(list.ToStr(), "a:1");
 }
 
+TEST_F(SqliteValueListTest, AListThatWasMovedFromIsEmpty) {
+  SqliteValueList row = ListOf({{"a", 1}});
+  SqliteValueList target(std::move(row));
+  EXPECT_EQ(target.ToStr(), "a:1");
+  EXPECT_EQ(row.ToStr(), "");  // NOLINT(bugprone-use-after-move): told in the header
+  row = ListOf({{"b", 2}});
+  target = std::move(row);
+  EXPECT_EQ(target.ToStr(), "b:2");
+  EXPECT_EQ(row.ToStr(), "");  // NOLINT(bugprone-use-after-move): told in the header
+}
+
+TEST_F(SqliteValueListTest, AMovedListBringsNoFieldsOfItsTargetAlong) {
+  std::vector<SqliteValueList> out = {ListOf({{"old", 0}}), SqliteValueList()};
+  SqliteValueList row = ListOf({{"a", 1}});
+  out[0] = std::move(row);
+  row.AddValue("b", 2);  // NOLINT(bugprone-use-after-move): told in the header
+  out[1] = std::move(row);
+  EXPECT_EQ(out[0].ToStr(), "a:1");
+  EXPECT_EQ(out[1].ToStr(), "b:2");
+}
+
+TEST_F(SqliteValueListTest, AddValueHasOneForm) {
+  bool (SqliteValueList::*const add)(const std::string&, const SqliteValue&) =
+      &SqliteValueList::AddValue;
+  const auto same = &SqliteValueList::AddValue;
+  SqliteValueList list;
+  EXPECT_TRUE((list.*add)("a", 1));
+  EXPECT_TRUE((list.*same)("b", 2));
+  EXPECT_EQ(list.ToStr(), "a:1, b:2");
+}
+
 TEST_F(SqliteValueListTest, CopiesAreIndependent) {
   SqliteValueList list = ListOf({{"a", 1}});
   const SqliteValueList copy(list);

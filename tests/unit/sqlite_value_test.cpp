@@ -197,6 +197,18 @@ TEST_F(SqliteValueTest, CopyingCopiesPayloadAndValidity) {
   EXPECT_EQ(copyOfInvalid.ToFormatedValue(), "5");
 }
 
+TEST_F(SqliteValueTest, MovingCopies) {
+  SqliteValue source("a'b");
+  const SqliteValue constructed(std::move(source));
+  SqliteValue assigned;
+  assigned = std::move(source);   // NOLINT(bugprone-use-after-move): that it is whole is the test
+  EXPECT_TRUE(source.IsValid());  // NOLINT(bugprone-use-after-move)
+  for (const SqliteValue& value : {source, constructed, assigned}) {
+    EXPECT_EQ(value.ToFormatedValue(), "'a''b'");
+  }
+  EXPECT_FALSE(assigned.IsValid());
+}
+
 TEST_F(SqliteValueTest, AssigningCopiesThePayloadOnly) {
   SqliteValue none;
   EXPECT_EQ(&(none = SqliteValue("a")), &none);
