@@ -96,6 +96,7 @@ bool ParseWithJsonCpp(const std::string& text, Json::Value& value) {
 std::string WriteWithJsonCpp(const Json::Value& value) {
   static const std::unique_ptr<Json::StreamWriter> writer = [] {
     Json::StreamWriterBuilder builder;
+    builder["commentStyle"] = "None";
     builder["indentation"] = "";
     builder["emitUTF8"] = true;
     return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());

@@ -38,7 +38,7 @@ TESTS = {
     "err": ["err_test"],
     "file": ["file_test", "key_value_test", "intercepted_file_test", "fault_file_test"],
     "file_lock": ["file_lock_test", "fault_file_lock_test"],
-    "json_reader": ["json_value_test", "intercepted_locale_test", "response_test"],
+    "json_text": ["json_value_test", "intercepted_locale_test", "response_test"],
     "json_value": ["json_value_test", "fault_json_test"],
     "privilege": ["privilege_test", "file_test", "cache_test"],
     "request": ["request_test"],

@@ -27,7 +27,7 @@
 #include <optional>
 #include <utility>
 
-#include "kelodrcore/json_value.h"
+#include "json_text.h"
 #include "posix/descriptor.h"
 #include "posix/file_io.h"
 #include "posix/retry.h"
@@ -304,14 +304,14 @@ bool ReadDocument(Json::Value& value, const std::string& path, Whose whose) {
   if (!IsPath(path)) return Fail(EINVAL);
   const Descriptor file = OpenDocument(path, whose);
   std::string text;
-  return file.IsOpen() && Posix::ReadAll(file.Get(), text) && JsonValue::fromString(value, text);
+  return file.IsOpen() && Posix::ReadAll(file.Get(), text) && ParseJson(value, text, Origin::kFile);
 }
 
 bool ReplaceDocument(const Json::Value& value, const std::string& path, Whose whose) {
   if (!IsPath(path)) return Fail(EINVAL);
   if (whose == Whose::kAnybodys && !IsReplaceable(path)) return false;
   Place place;
-  return Locate(path, whose, place) && Replace(place, whose, JsonValue::toString(value));
+  return Locate(path, whose, place) && Replace(place, whose, WriteJson(value));
 }
 
 }  // namespace KeloDRCore

@@ -10,25 +10,30 @@
 
 #include "kelodrcore/export.h"
 
-/// The text and file forms of a `Json::Value`. No function of this namespace logs, keeps state or
-/// lets out an exception other than `std::bad_alloc`; none depends on the locale of the process.
+/// The text and file forms of a `Json::Value`. JsonCpp reads and writes the text. No function logs,
+/// keeps state, depends on the locale of the process or throws anything but `std::bad_alloc`. All
+/// may be called from any thread that has 1 MiB of stack, which is enough for 1,000 levels.
 namespace KeloDRCore::JsonValue {
 
 /// The document as compact JSON: one line, members in the order of their names, no comments, no
-/// newline at the end. Text is written as the bytes that it holds, UTF-8 or not; only the quote,
+/// newline at the end. Texts are written as the bytes that they hold, UTF-8 or not; only the quote,
 /// the backslash and bytes below 0x20 are escaped. Doubles have up to 17 significant digits and
-/// read back as the same number; NaN is written as `null` and the infinities as `1e+9999` and
-/// `-1e+9999`, as JsonCpp does, because JSON has no such numbers.
+/// read back as the same number. NaN is written as `null` and the infinities as `1e+9999` and
+/// `-1e+9999`, because JSON has no such numbers.
 [[nodiscard]] KELODR_EXPORT std::string toString(const Json::Value& value);
 
-/// Parses `text` into `value`. Comments are accepted and dropped. False, with `value` unchanged,
-/// for an empty text, a syntax error, anything but white space and comments after the document (a
-/// NUL byte too) and documents nested deeper than 1,000 levels. Inside the document it is as
-/// lenient as JsonCpp: `[1,]` is an array of one, and the last of equal member names counts.
+/// Parses `text` into `value`. Comments and one byte order mark at the start are accepted and
+/// dropped. False, with `value` unchanged, for an empty text, a syntax error, a NUL byte anywhere,
+/// anything but white space and comments after the document, and more than 1,000 nested levels. It
+/// is as lenient as JsonCpp inside the document: `[1,]` is an array of one, and the last of equal
+/// member names counts. A number beyond a double's range is refused or infinite, as the version of
+/// JsonCpp has it.
 KELODR_EXPORT bool fromString(Json::Value& value, const std::string& text);
 
-/// Parses the whole file at `path` into `value`, as `fromString` does. False, with `value`
-/// unchanged, when the file is missing, is not a regular file, cannot be read or does not parse.
+/// Parses the whole file at `path` into `value`, as `fromString` does, but up to 1,010 levels: a
+/// document that was parsed can be put into another one, written and read back. False, with `value`
+/// unchanged, when the file is missing, is not a regular file, cannot be read or does not parse. A
+/// FIFO is not waited for.
 KELODR_EXPORT bool fromFile(Json::Value& value, const std::string& path);
 
 /// Replaces the file at `path` by the text of `value` in one step: a reader sees the old document

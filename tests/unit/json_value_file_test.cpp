@@ -200,4 +200,24 @@ TEST_F(JsonValueFileTest, AnotherNameOfTheFileKeepsTheOldDocument) {
   EXPECT_EQ(ReadText(Path("b")), "1");
 }
 
+std::string Nested(size_t levels) { return std::string(levels, '[') + std::string(levels, ']'); }
+
+TEST_F(JsonValueFileTest, WhatParsesCanBeWrappedWrittenAndReadBack) {
+  Json::Value document;
+  ASSERT_TRUE(KeloDRCore::JsonValue::fromString(document["a"]["b"], Nested(1000)));
+  ASSERT_TRUE(toFile(document, Path("document")));
+  Json::Value back;
+  EXPECT_TRUE(fromFile(back, Path("document")));
+  EXPECT_EQ(back, document);
+}
+
+TEST_F(JsonValueFileTest, RefusesMoreThanATextsLevelsAndTen) {
+  Json::Value value("untouched");
+  WriteText(Path("deeper"), Nested(1011));
+  EXPECT_FALSE(fromFile(value, Path("deeper")));
+  EXPECT_EQ(value, Json::Value("untouched"));
+  WriteText(Path("deep"), Nested(1010));
+  EXPECT_TRUE(fromFile(value, Path("deep")));
+}
+
 }  // namespace
