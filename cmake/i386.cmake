@@ -15,7 +15,13 @@ set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
 set(CMAKE_FIND_ROOT_PATH_MODE_LIBRARY ONLY)
 set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
 
-# The loader looks in the sysroot too, also for what the library itself needs (hence the old tag).
+# The loader looks in the sysroot too, also for what the library itself needs (hence the old tag),
+# but not that of a system on which a package is installed.
+if(CMAKE_SKIP_INSTALL_RPATH)
+  set(search -rpath-link)
+else()
+  set(search -rpath)
+endif()
 set(libraries ${KELODR_I386_SYSROOT}/usr/lib/i386-linux-gnu)
 set(CMAKE_EXE_LINKER_FLAGS_INIT
-  "-L\"${libraries}\" -Wl,--disable-new-dtags,-rpath,\"${libraries}\"")
+  "-L\"${libraries}\" -Wl,--disable-new-dtags,${search},\"${libraries}\"")
