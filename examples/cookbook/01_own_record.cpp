@@ -46,17 +46,18 @@ bool StoreFreeSpace(SqliteDB& db, const Volume& volume) {
   UpdateCommand update;
   update.SetTable(kVolumes);
   update.SetFieldValues(volume.ConvertColumns({"free_mib"}));
-  update.SetCondition(SqliteEqual("mount_point", volume.mountPoint));
-  return db.UpdateRecord(update);
+  // Without a condition every row would be set: a failure of this call must not pass unnoticed.
+  return update.SetCondition(SqliteEqual("mount_point", volume.mountPoint)) &&
+         db.UpdateRecord(update);
 }
 
 bool Find(SqliteDB& db, const std::string& mountPoint, Volume& volume) {
   SelectCommand select;
   select.SetTable(kVolumes);
   for (const std::string& column : volume.GetColumns()) select.AddField(column);
-  select.SetCondition(SqliteEqual("mount_point", mountPoint));
   SqliteValueList row;
-  return db.SelectRecord(select, row) && !row.GetValues().empty() && volume.FromSqliteRecord(row);
+  return select.SetCondition(SqliteEqual("mount_point", mountPoint)) &&
+         db.SelectRecord(select, row) && !row.GetValues().empty() && volume.FromSqliteRecord(row);
 }
 
 int main() {

@@ -2,7 +2,9 @@
 
 #include <kelodrcore/err.h>
 #include <kelodrcore/sqlite_condition.h>
+#include <kelodrcore/sqlite_transaction.h>
 
+#include <algorithm>
 #include <charconv>
 
 #include "paths.h"
@@ -15,6 +17,8 @@ namespace {
 
 constexpr unsigned int kRetries = 10;
 constexpr int kSqliteConstraint = 19;
+// So many rows are inserted between two looks at how far it is.
+constexpr std::ptrdiff_t kPortion = 1000;
 constexpr char kBadName[] = "the name cannot be looked for";
 
 const SqliteTableHandler kNodes("node",
@@ -75,12 +79,10 @@ bool Registry::CheckThere() {
   return IsExisted() || Fail(ERR::ERR_DATABASE_OPERATION, "there is no registry at '" + path + "'");
 }
 
-// BEGIN IMMEDIATE takes the write lock at once, so that what the steps read stays true. Closing
-// rolls back and keeps the error of the step that failed; the next statement opens the file again.
+// The write lock is taken at the beginning, so that what the steps read stays true.
 bool Registry::InTransaction(const std::function<bool()>& steps) {
-  if (Exec("BEGIN IMMEDIATE") && steps() && Exec("COMMIT")) return true;
-  Close();
-  return false;
+  SqliteTransaction transaction(*this);
+  return transaction.IsOpen() && steps() && transaction.Commit();
 }
 
 bool Registry::AddNode(const SqliteValueList& node) {
@@ -165,12 +167,12 @@ bool Registry::ReadVolumes(const Query& query, Json::Value& volumes) {
 bool Registry::Replace(const SqliteTableHandler& table, const Rows& rows,
                        const std::function<void(size_t done)>& tell) {
   if (!DeleteAllRecords(table)) return false;
-  for (const SqliteValueList& row : rows) {
-    InsertCommand command;
-    command.SetTable(table);
-    command.SetFieldValues(row);
-    if (!InsertRecord(command)) return false;
-    tell(1);
+  auto first = rows.begin();
+  while (first != rows.end()) {
+    const auto last = first + std::min(kPortion, rows.end() - first);
+    if (!InsertRecords(table, Rows(first, last))) return false;
+    tell(static_cast<size_t>(last - first));
+    first = last;
   }
   return true;
 }
@@ -224,13 +226,7 @@ bool Registry::Each(const SqliteTableHandler& table, const std::vector<Column>& 
   if (!SetOrder(command, columns, query.order)) return false;
   // A count of rows that no table reaches stands for all of them.
   command.SetLimit(query.offset, query.limit > 0 ? query.limit : INT32_MAX);
-  if (!IsExisted()) return true;
-  Rows rows;
-  if (!SelectRecords(command, rows)) return false;
-  for (const SqliteValueList& row : rows) {
-    if (!take(row)) break;
-  }
-  return true;
+  return !IsExisted() || SelectEach(command, take);
 }
 
 }  // namespace drctl

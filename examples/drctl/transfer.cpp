@@ -88,6 +88,11 @@ int RefuseEntries(const std::string& what, const Json::Value& refused, bool asJs
   return Complain(what, MakeErr(ERR::BAD_PARAMETER, "nothing was changed"), asJson);
 }
 
+bool Store(Registry& registry, const Rows& nodes, const Rows& volumes) {
+  Progress progress(nodes.size() + volumes.size());
+  return registry.ReplaceAll(nodes, volumes, [&](size_t rows) { progress.Add(rows); });
+}
+
 int TellDone(size_t nodes, size_t volumes, const std::string& done, bool asJson) {
   Json::Value counts;
   counts[kNodeSection.member] = Json::UInt64{nodes};
@@ -134,9 +139,7 @@ int ImportRegistry(const Options& options) {
   const Rows volumes = ReadSection(document, kVolumeSection, refused);
   if (!refused.empty()) return RefuseEntries(what, refused, options.json);
   Registry registry(options.db);
-  Progress progress(nodes.size() + volumes.size());
-  const auto tell = [&](size_t rows) { progress.Add(rows); };
-  if (!registry.ReplaceAll(nodes, volumes, tell)) {
+  if (!Store(registry, nodes, volumes)) {
     return Complain(what, registry.GetErr(), options.json);
   }
   return TellDone(nodes.size(), volumes.size(), "imported", options.json);

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <kelodrcore/json_value.h>
 #include <kelodrcore/version.h>
+#include <pty.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -398,6 +399,40 @@ TEST_F(DrctlTest, WhatIsNoExportIsNotImported) {
   }
   EXPECT_EQ(Run({"import", Path("none.json")}).status, 1);
   EXPECT_EQ(Names(), "a ");
+}
+
+// What the program writes to a terminal.
+std::string RunOnTerminal(const std::vector<std::string>& arguments) {
+  int terminal = -1;
+  const pid_t child = forkpty(&terminal, nullptr, nullptr, nullptr);
+  if (child == 0) {
+    std::vector<char*> argv;
+    for (const std::string& argument : arguments) {
+      argv.push_back(const_cast<char*>(argument.c_str()));
+    }
+    argv.push_back(nullptr);
+    execv(argv[0], argv.data());
+    _exit(127);
+  }
+  std::string text;
+  char part[512];
+  ssize_t size = 0;
+  // The end is an error: the terminal is gone with the program.
+  while ((size = read(terminal, part, sizeof(part))) > 0)
+    text.append(part, static_cast<size_t>(size));
+  close(terminal);
+  EXPECT_EQ(waitpid(child, nullptr, 0), child);
+  return text;
+}
+
+TEST_F(DrctlTest, AnImportShowsItsProgressOnATerminalOnly) {
+  AddNode("a");
+  AddNode("b");
+  ASSERT_EQ(Run({"export", Path("two.json")}).status, 0);
+  EXPECT_EQ(
+      RunOnTerminal({DRCTL, "--db", Path("registry.db"), "import", Path("two.json")}),
+      "\r[" + std::string(50, '#') + "] 100 %\r\033[K" + "2 nodes and 0 volumes imported\r\n");
+  EXPECT_EQ(Run({"import", Path("two.json")}).err, "");
 }
 
 class DrctlCacheTest : public DrctlTest {
