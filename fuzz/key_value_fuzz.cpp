@@ -7,7 +7,7 @@
 #include <map>
 
 #include "fuzz.h"
-#include "support/key_value_reference.h"
+#include "unit/key_value_reference.h"
 
 namespace {
 

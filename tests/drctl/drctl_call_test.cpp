@@ -8,7 +8,7 @@
 #include <sys/stat.h>
 
 #include "drctl/locks.h"
-#include "support/program.h"
+#include "drctl/program.h"
 
 namespace {
 

@@ -12,7 +12,7 @@
 #include <unistd.h>
 
 #include "drctl/locks.h"
-#include "support/program.h"
+#include "drctl/program.h"
 
 namespace {
 

@@ -7,9 +7,9 @@
 #include <filesystem>
 #include <memory>
 
+#include "fault/fault.h"
 #include "kelodrcore/file_lock.h"
 #include "kelodrcore/json_value.h"
-#include "support/fault.h"
 #include "support/process.h"
 #include "support/test_cache.h"
 

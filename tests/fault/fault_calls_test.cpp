@@ -9,8 +9,8 @@
 #include <sstream>
 #include <string>
 
+#include "fault/fault.h"
 #include "kelodrcore/file.h"
-#include "support/fault.h"
 
 namespace {
 

@@ -6,8 +6,8 @@
 #include <functional>
 #include <memory>
 
+#include "fault/fault.h"
 #include "kelodrcore/file_lock.h"
-#include "support/fault.h"
 #include "support/process.h"
 
 using Fault::Outcome;

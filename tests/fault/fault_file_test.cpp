@@ -6,9 +6,9 @@
 #include <map>
 #include <memory>
 
+#include "fault/fault.h"
 #include "kelodrcore/file.h"
 #include "kelodrcore/json_value.h"
-#include "support/fault.h"
 #include "support/process.h"
 
 namespace File = KeloDRCore::File;

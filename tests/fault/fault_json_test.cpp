@@ -5,8 +5,8 @@
 #include <cerrno>
 #include <functional>
 
+#include "fault/fault.h"
 #include "kelodrcore/json_value.h"
-#include "support/fault.h"
 #include "support/process.h"
 
 namespace JsonValue = KeloDRCore::JsonValue;

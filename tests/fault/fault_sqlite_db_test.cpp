@@ -7,10 +7,10 @@
 #include <algorithm>
 #include <functional>
 
+#include "fault/failing_vfs.h"
+#include "fault/fault.h"
 #include "kelodrcore/err.h"
 #include "kelodrcore/sqlite_db.h"
-#include "support/failing_vfs.h"
-#include "support/fault.h"
 
 using Fault::Outcome;
 using KeloDRCore::DeleteCommand;

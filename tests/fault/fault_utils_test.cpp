@@ -1,5 +1,5 @@
+#include "fault/fault.h"
 #include "kelodrcore/utils.h"
-#include "support/fault.h"
 
 using Fault::Outcome;
 using UtilsFaultTest = FaultTest;

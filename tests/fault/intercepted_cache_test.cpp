@@ -6,8 +6,8 @@
 #include <memory>
 #include <vector>
 
+#include "fault/interception.h"
 #include "kelodrcore/file_lock.h"
-#include "support/interception.h"
 #include "support/process.h"
 #include "support/test_cache.h"
 

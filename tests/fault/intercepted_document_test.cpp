@@ -8,9 +8,9 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "fault/interception.h"
 #include "kelodrcore/json_value.h"
 #include "support/clean_test.h"
-#include "support/interception.h"
 
 namespace {
 

@@ -5,9 +5,9 @@
 #include <cerrno>
 #include <set>
 
+#include "fault/interception.h"
 #include "kelodrcore/file.h"
 #include "support/clean_test.h"
-#include "support/interception.h"
 
 namespace {
 

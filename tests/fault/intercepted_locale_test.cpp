@@ -9,9 +9,9 @@
 #include <new>
 #include <thread>
 
+#include "fault/interception.h"
 #include "kelodrcore/json_value.h"
 #include "support/clean_test.h"
-#include "support/interception.h"
 
 namespace {
 

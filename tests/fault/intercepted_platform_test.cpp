@@ -9,10 +9,10 @@
 #include <functional>
 #include <set>
 
+#include "fault/interception.h"
 #include "kelocore.h"
 #include "kelorandom.h"
 #include "support/clean_test.h"
-#include "support/interception.h"
 #include "support/process.h"
 
 namespace {

@@ -11,7 +11,7 @@
 
 #include "kelodrcore/file_lock.h"
 #include "kelodrcore/json_value.h"
-#include "support/recovery.h"
+#include "kill/recovery.h"
 #include "support/test_cache.h"
 #include "support/test_clock.h"
 #include "support/tracer.h"

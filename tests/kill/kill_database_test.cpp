@@ -9,8 +9,8 @@
 #include <vector>
 
 #include "kelodrcore/sqlite_db.h"
+#include "kill/recovery.h"
 #include "support/clean_test.h"
-#include "support/recovery.h"
 #include "support/tracer.h"
 
 namespace {

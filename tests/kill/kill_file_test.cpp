@@ -8,8 +8,8 @@
 #include <vector>
 
 #include "kelodrcore/json_value.h"
+#include "kill/recovery.h"
 #include "support/clean_test.h"
-#include "support/recovery.h"
 #include "support/tracer.h"
 
 namespace {

@@ -12,7 +12,7 @@
 #include <sstream>
 #include <stdexcept>
 
-#include "support/cache_process.h"
+#include "process/cache_process.h"
 
 namespace {
 

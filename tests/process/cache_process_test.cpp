@@ -1,6 +1,6 @@
 // What processes that share a cache file see of each other.
 
-#include "support/cache_process.h"
+#include "process/cache_process.h"
 
 #include <fcntl.h>
 #include <poll.h>

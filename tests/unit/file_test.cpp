@@ -13,8 +13,8 @@
 
 #include "kelodrcore/json_value.h"
 #include "support/clean_test.h"
-#include "support/json_text.h"
 #include "support/special_files.h"
+#include "unit/json_text.h"
 
 namespace {
 

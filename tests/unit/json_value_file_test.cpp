@@ -7,7 +7,7 @@
 
 #include <string>
 
-#include "support/json_file.h"
+#include "unit/json_file.h"
 
 namespace {
 

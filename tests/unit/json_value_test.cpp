@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "support/clean_test.h"
-#include "support/random_json.h"
+#include "unit/random_json.h"
 
 namespace {
 

@@ -20,7 +20,7 @@
 #include <string>
 #include <vector>
 
-#include "support/json_file.h"
+#include "unit/json_file.h"
 
 namespace {
 

@@ -10,8 +10,8 @@
 
 #include "kelodrcore/file.h"
 #include "support/clean_test.h"
-#include "support/key_value_reference.h"
 #include "support/special_files.h"
+#include "unit/key_value_reference.h"
 
 namespace {
 

@@ -6,9 +6,9 @@
 
 #include "kelodrcore/request.h"
 #include "support/clean_test.h"
-#include "support/json_text.h"
-#include "support/random_json.h"
-#include "support/request_samples.h"
+#include "unit/json_text.h"
+#include "unit/random_json.h"
+#include "unit/request_samples.h"
 
 namespace {
 

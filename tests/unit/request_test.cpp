@@ -8,8 +8,8 @@
 #include <vector>
 
 #include "support/clean_test.h"
-#include "support/json_text.h"
-#include "support/request_samples.h"
+#include "unit/json_text.h"
+#include "unit/request_samples.h"
 
 namespace {
 

@@ -7,7 +7,7 @@
 
 #include "kelodrcore/response.h"
 #include "support/clean_test.h"
-#include "support/json_text.h"
+#include "unit/json_text.h"
 
 namespace {
 

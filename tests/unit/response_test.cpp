@@ -11,7 +11,7 @@
 
 #include "kelodrcore/json_value.h"
 #include "support/clean_test.h"
-#include "support/json_text.h"
+#include "unit/json_text.h"
 
 namespace {
 

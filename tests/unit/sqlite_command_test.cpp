@@ -6,7 +6,7 @@
 #include <type_traits>
 #include <utility>
 
-#include "support/command.h"
+#include "unit/command.h"
 
 namespace {
 

@@ -7,8 +7,8 @@
 #include <vector>
 
 #include "kelodrcore/sqlite_command.h"
-#include "support/command.h"
-#include "support/grouping_locale.h"
+#include "unit/command.h"
+#include "unit/grouping_locale.h"
 
 namespace {
 

@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "support/clean_test.h"
-#include "support/grouping_locale.h"
+#include "unit/grouping_locale.h"
 
 namespace {
 

@@ -1,4 +1,4 @@
-#include "support/random_json.h"
+#include "unit/random_json.h"
 
 #include <cmath>
 #include <cstring>

@@ -7,8 +7,8 @@
 
 #include <cerrno>
 
-#include "support/fault.h"
-#include "support/interception.h"
+#include "fault/fault.h"
+#include "fault/interception.h"
 
 using Fault::Hits;
 using Fault::Intercepts;

@@ -1,4 +1,4 @@
-#include "support/interception.h"
+#include "fault/interception.h"
 
 #include <algorithm>
 #include <array>
@@ -6,7 +6,7 @@
 #include <cstdlib>
 #include <utility>
 
-#include "support/fault.h"
+#include "fault/fault.h"
 
 namespace Fault {
 namespace {

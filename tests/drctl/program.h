@@ -1,7 +1,7 @@
 // Runs a program as a user would, and tells what it said.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_PROGRAM_H_
-#define KELODRCORE_TESTS_SUPPORT_PROGRAM_H_
+#ifndef KELODRCORE_TESTS_DRCTL_PROGRAM_H_
+#define KELODRCORE_TESTS_DRCTL_PROGRAM_H_
 
 #include <string>
 #include <vector>
@@ -18,4 +18,4 @@ struct Outcome {
 Outcome RunProgram(const std::string& dir, const std::vector<std::string>& arguments,
                    const std::string& input = "", const std::vector<std::string>& environment = {});
 
-#endif  // KELODRCORE_TESTS_SUPPORT_PROGRAM_H_
+#endif  // KELODRCORE_TESTS_DRCTL_PROGRAM_H_

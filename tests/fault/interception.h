@@ -1,8 +1,8 @@
 // Steps in before one call that the library makes to the system: another process that comes between
 // two calls, or a call that fails where no other one does. For programs that link fault_calls.cpp.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_INTERCEPTION_H_
-#define KELODRCORE_TESTS_SUPPORT_INTERCEPTION_H_
+#ifndef KELODRCORE_TESTS_FAULT_INTERCEPTION_H_
+#define KELODRCORE_TESTS_FAULT_INTERCEPTION_H_
 
 #include <functional>
 #include <string>
@@ -45,4 +45,4 @@ bool Intercepts(std::string_view call);
 
 }  // namespace Fault
 
-#endif  // KELODRCORE_TESTS_SUPPORT_INTERCEPTION_H_
+#endif  // KELODRCORE_TESTS_FAULT_INTERCEPTION_H_

@@ -1,7 +1,7 @@
 // What a key=value file means, told with the standard library's extraction alone: a stream a token.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_KEY_VALUE_REFERENCE_H_
-#define KELODRCORE_TESTS_SUPPORT_KEY_VALUE_REFERENCE_H_
+#ifndef KELODRCORE_TESTS_UNIT_KEY_VALUE_REFERENCE_H_
+#define KELODRCORE_TESTS_UNIT_KEY_VALUE_REFERENCE_H_
 
 #include <locale>
 #include <map>
@@ -31,4 +31,4 @@ std::map<std::string, V> Reference(const std::string& text) {
   return map;
 }
 
-#endif  // KELODRCORE_TESTS_SUPPORT_KEY_VALUE_REFERENCE_H_
+#endif  // KELODRCORE_TESTS_UNIT_KEY_VALUE_REFERENCE_H_

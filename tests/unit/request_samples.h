@@ -1,7 +1,7 @@
 // What the tests of the web API call share.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_REQUEST_SAMPLES_H_
-#define KELODRCORE_TESTS_SUPPORT_REQUEST_SAMPLES_H_
+#ifndef KELODRCORE_TESTS_UNIT_REQUEST_SAMPLES_H_
+#define KELODRCORE_TESTS_UNIT_REQUEST_SAMPLES_H_
 
 #include <gtest/gtest.h>
 #include <json/json.h>
@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "kelodrcore/request.h"
-#include "support/json_text.h"
+#include "unit/json_text.h"
 
 // The keys that no parameter can have.
 inline const char* const kReserved[] = {"api", "method", "version"};
@@ -42,4 +42,4 @@ inline void ExpectClientSettings(const KeloDRCore::Request& request, int timeout
   EXPECT_EQ(request.getUploadFile().name, name);
 }
 
-#endif  // KELODRCORE_TESTS_SUPPORT_REQUEST_SAMPLES_H_
+#endif  // KELODRCORE_TESTS_UNIT_REQUEST_SAMPLES_H_

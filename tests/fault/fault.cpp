@@ -1,4 +1,4 @@
-#include "support/fault.h"
+#include "fault/fault.h"
 
 #include <json/json.h>
 #include <sys/mman.h>

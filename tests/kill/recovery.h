@@ -1,8 +1,8 @@
 // What the kill sweeps share: files in memory, pairs of kills, and what is asked of the world
 // after.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_RECOVERY_H_
-#define KELODRCORE_TESTS_SUPPORT_RECOVERY_H_
+#ifndef KELODRCORE_TESTS_KILL_RECOVERY_H_
+#define KELODRCORE_TESTS_KILL_RECOVERY_H_
 
 #include <functional>
 #include <string>
@@ -38,4 +38,4 @@ void ExpectPrompt(const std::function<void()>& action);
 // Expects that the lock can be had, at once.
 void ExpectFree(const std::string& lockName);
 
-#endif  // KELODRCORE_TESTS_SUPPORT_RECOVERY_H_
+#endif  // KELODRCORE_TESTS_KILL_RECOVERY_H_

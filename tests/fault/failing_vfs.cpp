@@ -1,10 +1,10 @@
-#include "support/failing_vfs.h"
+#include "fault/failing_vfs.h"
 
 #include <sqlite3.h>
 
 #include <cstring>
 
-#include "support/fault.h"
+#include "fault/fault.h"
 
 using Fault::Hits;
 

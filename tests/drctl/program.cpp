@@ -1,4 +1,4 @@
-#include "support/program.h"
+#include "drctl/program.h"
 
 #include <fcntl.h>
 #include <sys/wait.h>

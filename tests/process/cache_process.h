@@ -1,7 +1,7 @@
 // The fixture of the tests in which processes share a cache file.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_CACHE_PROCESS_H_
-#define KELODRCORE_TESTS_SUPPORT_CACHE_PROCESS_H_
+#ifndef KELODRCORE_TESTS_PROCESS_CACHE_PROCESS_H_
+#define KELODRCORE_TESTS_PROCESS_CACHE_PROCESS_H_
 
 #include <fcntl.h>
 #include <poll.h>
@@ -144,4 +144,4 @@ class CacheProcessTest : public CacheFixture {
   std::string mirror;
 };
 
-#endif  // KELODRCORE_TESTS_SUPPORT_CACHE_PROCESS_H_
+#endif  // KELODRCORE_TESTS_PROCESS_CACHE_PROCESS_H_

@@ -4,8 +4,8 @@
 // test and for the libraries that it uses alike (fault_calls.cpp). They pass every call on, but for
 // the one that is to fail. Only programs that are meant to sweep link them.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_FAULT_H_
-#define KELODRCORE_TESTS_SUPPORT_FAULT_H_
+#ifndef KELODRCORE_TESTS_FAULT_FAULT_H_
+#define KELODRCORE_TESTS_FAULT_FAULT_H_
 
 #include <dlfcn.h>
 
@@ -127,4 +127,4 @@ class FaultTest : public CleanTest {
   int shortTransfers = 0;
 };
 
-#endif  // KELODRCORE_TESTS_SUPPORT_FAULT_H_
+#endif  // KELODRCORE_TESTS_FAULT_FAULT_H_

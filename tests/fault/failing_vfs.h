@@ -1,8 +1,8 @@
 // Fails the calls that SQLite makes for its files, those of its own interface to the system: with
 // any result code, also where no call of the C library would lead to it.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_FAILING_VFS_H_
-#define KELODRCORE_TESTS_SUPPORT_FAILING_VFS_H_
+#ifndef KELODRCORE_TESTS_FAULT_FAILING_VFS_H_
+#define KELODRCORE_TESTS_FAULT_FAILING_VFS_H_
 
 namespace FailingVfs {
 
@@ -18,4 +18,4 @@ int Register();
 
 }  // namespace FailingVfs
 
-#endif  // KELODRCORE_TESTS_SUPPORT_FAILING_VFS_H_
+#endif  // KELODRCORE_TESTS_FAULT_FAILING_VFS_H_

@@ -1,4 +1,4 @@
-#include "support/recovery.h"
+#include "kill/recovery.h"
 
 #include <gtest/gtest.h>
 #include <sys/file.h>

@@ -1,4 +1,4 @@
-#include "support/json_text.h"
+#include "unit/json_text.h"
 
 #include <gtest/gtest.h>
 

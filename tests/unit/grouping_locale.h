@@ -1,7 +1,7 @@
 // A locale in which numbers are not plain.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_GROUPING_LOCALE_H_
-#define KELODRCORE_TESTS_SUPPORT_GROUPING_LOCALE_H_
+#ifndef KELODRCORE_TESTS_UNIT_GROUPING_LOCALE_H_
+#define KELODRCORE_TESTS_UNIT_GROUPING_LOCALE_H_
 
 #include <clocale>
 #include <locale>
@@ -30,4 +30,4 @@ class GroupingLocale {
   std::locale before;
 };
 
-#endif  // KELODRCORE_TESTS_SUPPORT_GROUPING_LOCALE_H_
+#endif  // KELODRCORE_TESTS_UNIT_GROUPING_LOCALE_H_

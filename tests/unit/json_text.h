@@ -1,7 +1,7 @@
 // JSON documents of tests, written as text.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_JSON_TEXT_H_
-#define KELODRCORE_TESTS_SUPPORT_JSON_TEXT_H_
+#ifndef KELODRCORE_TESTS_UNIT_JSON_TEXT_H_
+#define KELODRCORE_TESTS_UNIT_JSON_TEXT_H_
 
 #include <json/json.h>
 
@@ -10,4 +10,4 @@
 // Parsed by JsonCpp alone, not by the library under test; a broken text fails the test.
 Json::Value Parse(const std::string& text);
 
-#endif  // KELODRCORE_TESTS_SUPPORT_JSON_TEXT_H_
+#endif  // KELODRCORE_TESTS_UNIT_JSON_TEXT_H_

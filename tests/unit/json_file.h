@@ -1,7 +1,7 @@
 // What the tests of documents in files share.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_JSON_FILE_H_
-#define KELODRCORE_TESTS_SUPPORT_JSON_FILE_H_
+#ifndef KELODRCORE_TESTS_UNIT_JSON_FILE_H_
+#define KELODRCORE_TESTS_UNIT_JSON_FILE_H_
 
 #include <sys/stat.h>
 #include <unistd.h>
@@ -90,4 +90,4 @@ class JsonValueFileTest : public CleanTest {
   mode_t umaskBefore = 0;
 };
 
-#endif  // KELODRCORE_TESTS_SUPPORT_JSON_FILE_H_
+#endif  // KELODRCORE_TESTS_UNIT_JSON_FILE_H_

@@ -19,8 +19,8 @@
 #include <cstdlib>
 #include <new>
 
-#include "support/fault.h"
-#include "support/interception.h"
+#include "fault/fault.h"
+#include "fault/interception.h"
 
 using Fault::Hits;
 using Fault::Intercepts;

@@ -1,7 +1,7 @@
 // Random JSON documents, the same ones for the same seed.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_RANDOM_JSON_H_
-#define KELODRCORE_TESTS_SUPPORT_RANDOM_JSON_H_
+#ifndef KELODRCORE_TESTS_UNIT_RANDOM_JSON_H_
+#define KELODRCORE_TESTS_UNIT_RANDOM_JSON_H_
 
 #include <json/json.h>
 
@@ -31,4 +31,4 @@ class RandomJson {
   std::mt19937_64 generator;
 };
 
-#endif  // KELODRCORE_TESTS_SUPPORT_RANDOM_JSON_H_
+#endif  // KELODRCORE_TESTS_UNIT_RANDOM_JSON_H_

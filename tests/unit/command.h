@@ -1,7 +1,7 @@
 // What the tests of the commands share.
 
-#ifndef KELODRCORE_TESTS_SUPPORT_COMMAND_H_
-#define KELODRCORE_TESTS_SUPPORT_COMMAND_H_
+#ifndef KELODRCORE_TESTS_UNIT_COMMAND_H_
+#define KELODRCORE_TESTS_UNIT_COMMAND_H_
 
 #include <string>
 #include <type_traits>
@@ -41,4 +41,4 @@ Command OnTable(const std::string& name = "job") {
   return command;
 }
 
-#endif  // KELODRCORE_TESTS_SUPPORT_COMMAND_H_
+#endif  // KELODRCORE_TESTS_UNIT_COMMAND_H_
