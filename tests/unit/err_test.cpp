@@ -1,9 +1,12 @@
 #include "kelodrcore/err.h"
 
+#include <algorithm>
+#include <cstdint>
 #include <map>
 #include <string>
 #include <type_traits>
 
+#include "kelodrcore/sqlite_command.h"
 #include "support/clean_test.h"
 
 namespace {
@@ -80,9 +83,21 @@ TEST_F(ErrTest, EveryOtherNumberIsUnknown) {
 }
 
 TEST_F(ErrTest, ACodeIsAnIntConstant) {
-  static_assert(std::is_same_v<std::underlying_type_t<ERR::Code>, int>);
-  constexpr int code = ERR::BAD_PARAMETER;
-  EXPECT_EQ(code, 401);
+  static_assert(std::is_same_v<decltype(ERR::BAD_PARAMETER), const int>);
+  static_assert(std::is_same_v<decltype(ERR::ERR_DR_MAX), const int>);
+  const int code = 5;
+  EXPECT_EQ(std::max(code, ERR::ERR_UNKNOWN), 407);
+  auto copy = ERR::BAD_PARAMETER;
+  copy = code;
+  EXPECT_EQ(copy, 5);
+}
+
+TEST_F(ErrTest, ACodeCanBeStoredInAColumn) {
+  KeloDRCore::InsertCommand command;
+  EXPECT_TRUE(command.AddFieldValue("code", ERR::ERR_UNKNOWN));
+  EXPECT_EQ(command.ToFormatedInsertValues(), "(code) VALUES (407)");
+  KeloDRCore::SqliteValueList list;
+  EXPECT_TRUE(list.AddValue("code", ERR::ERR_UNKNOWN));
 }
 
 }  // namespace
