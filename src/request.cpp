@@ -2,7 +2,6 @@
 
 #include <string_view>
 #include <utility>
-#include <vector>
 
 namespace KeloDRCore {
 namespace {
@@ -38,8 +37,6 @@ Request::Request(const std::string& apiName, int apiVersion, const std::string& 
 
 Request::Request(const Json::Value& request) { setRequest(request); }
 
-Request::Request(Json::Value&& request) : params(std::move(request)) { takeEnvelope(); }
-
 Request::~Request() = default;
 
 void Request::setAPI(const std::string& value) { api = value; }
@@ -62,56 +59,37 @@ bool Request::isValidKey(const std::string& key) {
 }
 
 bool Request::addParam(const std::string& key, const Json::Value& value) {
-  // Copied before the look-up adds the member: `value` may be params itself.
-  return addParam(key, Json::Value(value));
-}
-
-bool Request::addParam(const std::string& key, Json::Value&& value) {
   if (!isValidKey(key) || !CanHoldMembers(params)) return false;
-  Json::Value& param = params[key];
-  param = Json::Value(std::move(value));  // a plain move assignment would swap
+  params[key] = Json::Value(value);  // copied first: it may be part of what it replaces
   return true;
 }
 
 bool Request::addParam(const Json::Value& members) {
-  if (!CanHoldMembers(params)) return false;
-  if (!members.isObject()) return true;
-  // `members` may lie inside a member that it replaces, so what may hold it outlives the walk.
-  std::vector<Json::Value> replaced;
-  const auto end = members.end();
-  for (auto member = members.begin(); member != end; ++member) {
-    const std::string key = member.name();
+  Json::Value copies = members;  // they may be part of the parameters that change below
+  for (auto copy = copies.begin(); copy != copies.end(); ++copy) {
+    const std::string key = copy.key().asString();
     if (!isValidKey(key)) continue;
-    Json::Value value(*member);
-    params[key].swap(value);
-    if (value.isObject() || value.isArray()) replaced.push_back(std::move(value));
+    if (!CanHoldMembers(params)) return false;
+    params[key].swap(*copy);
   }
   return true;
 }
 
 void Request::setRequest(const Json::Value& request) {
   params = request;
-  takeEnvelope();
-}
-
-void Request::takeEnvelope() {
   if (!params.isObject()) return;
   MoveText(params, kApi, api);
   MoveText(params, kMethod, method);
   MoveInt(params, kVersion, version);
 }
 
-Json::Value Request::makeJson(Json::Value members) const {
-  Json::Value json = CanHoldMembers(members) ? std::move(members) : Json::Value(Json::objectValue);
+Json::Value Request::toJson() const {
+  Json::Value json = CanHoldMembers(params) ? params : Json::Value(Json::objectValue);
   json[kApi] = api;
   json[kMethod] = method;
   json[kVersion] = version;
   return json;
 }
-
-Json::Value Request::toJson() const { return makeJson(params); }
-
-Json::Value Request::takeJson() { return makeJson(std::move(params)); }
 
 std::string Request::toStr() const { return api + "/" + method + "/" + std::to_string(version); }
 
@@ -121,7 +99,7 @@ void Request::clear() {
   api.clear();
   method.clear();
   // Json::Value::clear() throws on a number or a text.
-  if (!params.isObject()) params = Json::Value();
+  if (!params.isObject() && !params.isArray()) params = Json::Value();
   params.clear();
   uploadFile = UploadFileDescription();
 }

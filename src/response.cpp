@@ -63,7 +63,7 @@ void Response::setResp(const Json::Value& document) { resp = document; }
 
 void Response::clear() {
   // Json::Value::clear() throws on a number or a text.
-  if (!resp.isObject()) resp = Json::Value();
+  if (!resp.isObject() && !resp.isArray()) resp = Json::Value();
   resp.clear();
 }
 

@@ -1,5 +1,7 @@
 /// @file
 /// The envelope of one call to the package's web API.
+///
+/// Deliberate, and frozen because callers rely on it: `clear` keeps the encryption flag.
 
 #ifndef KELODRCORE_REQUEST_H_
 #define KELODRCORE_REQUEST_H_
@@ -12,43 +14,38 @@
 
 namespace KeloDRCore {
 
-/// The file that goes with a call. The library stores and copies the texts, and never opens the
+/// The file that goes with a call. The library stores and copies the two texts and never opens the
 /// file.
 struct UploadFileDescription {
   std::string path;  ///< the local file
   std::string name;  ///< its name on the server
 };
 
-/// One call: API, method, version and parameters, and the settings of the client that sends it.
-/// Sending it is the caller's business.
+/// One call: API, method, version and parameters, and the settings of the client that sends it. The
+/// class carries and checks a call; the caller sends it.
 ///
 /// In the JSON form of a call, "api", "method" and "version" stand beside the parameters in one
-/// object; these three keys are reserved and cannot be added as parameters.
+/// object. These three keys are reserved and cannot be added as parameters.
 ///
-/// Nothing here logs or throws on its own account. An argument may be part of the request's own
-/// parameters: what counts is its value at the time of the call.
+/// Nothing here logs. An argument may be part of the request's own parameters: its value at the
+/// time of the call counts.
 class KELODR_EXPORT Request {
  public:
   /// No API, no method, version -1, null parameters, a time-out of 120 seconds, encryption not
   /// required, no file.
   Request();
 
-  /// A call with the given four parts, the rest as by default. `parameters` is copied as it is:
-  /// reserved keys in it are kept, and toJson() overwrites them.
+  /// A call of these four parts; the rest is as by default. `parameters` is copied as it is:
+  /// reserved keys in it are kept, and `toJson` overwrites them.
   Request(const std::string& apiName, int apiVersion, const std::string& methodName,
           const Json::Value& parameters);
 
-  /// The defaults, then setRequest(`request`). Implicit: a JSON call goes wherever a Request does.
-  /// A document that is given away becomes the parameters without being copied, and is null
-  /// afterwards.
-  /// @{
+  /// The defaults, then `setRequest(request)`. Implicit: a JSON call can stand for a `Request`.
   Request(const Json::Value& request);  // NOLINT(google-explicit-constructor)
-  Request(Json::Value&& request);       // NOLINT(google-explicit-constructor)
-  /// @}
 
   virtual ~Request();
 
-  /// Sets one field, unchecked; isValid() is the check.
+  /// Sets one field, unchecked: `isValid` is the check.
   /// @{
   void setAPI(const std::string& value);
   void setMethod(const std::string& value);
@@ -58,7 +55,7 @@ class KELODR_EXPORT Request {
   void setUploadFile(const UploadFileDescription& file);
   /// @}
 
-  /// The fields as they are. References are valid until the field is next changed.
+  /// The fields. A reference is valid until its field is next changed.
   /// @{
   [[nodiscard]] const std::string& getAPI() const { return api; }
   [[nodiscard]] const std::string& getMethod() const { return method; }
@@ -69,55 +66,42 @@ class KELODR_EXPORT Request {
   [[nodiscard]] const Json::Value& getParams() const { return params; }
   /// @}
 
-  /// Whether the call can be sent: an API, a method, and a version of at least 1. Nothing else is
-  /// looked at.
+  /// True when the call can be sent: it has an API, a method and a version of at least 1. Nothing
+  /// else is checked.
   [[nodiscard]] bool isValid() const;
 
-  /// False for exactly "api", "method" and "version" (case-sensitive); the empty key is valid.
+  /// False for exactly "api", "method" and "version". Case counts; the empty key is valid.
   [[nodiscard]] static bool isValidKey(const std::string& key);
 
-  /// Sets the parameter `key` to `value`, replacing an earlier one. Changes nothing and returns
-  /// false for a reserved key, and when the parameters are neither null nor an object. A value that
-  /// is given away is not copied, and is null afterwards if the result is true.
-  /// @{
+  /// Sets the parameter `key` to a copy of `value`; an earlier one is replaced. False for a
+  /// reserved key, and when the parameters are neither null nor an object; nothing changes then.
   bool addParam(const std::string& key, const Json::Value& value);
-  bool addParam(const std::string& key, Json::Value&& value);
-  /// @}
 
-  /// Sets a parameter for every member of the object `members`, but for reserved keys, which are
-  /// skipped silently. Anything but an object has no members: nothing changes and the result is
-  /// true. When the parameters are neither null nor an object, nothing changes and the result is
-  /// false, whatever `members` is.
+  /// Sets a parameter for each member of `members`; the keys of an array are "0", "1" and so on.
+  /// Reserved keys are skipped. False when there is a parameter to set and the parameters are
+  /// neither null nor an object; nothing changes then. A value without members gives true.
   bool addParam(const Json::Value& members);
 
-  /// Loads a call in its JSON form. The parameters become a copy of `request`; "api" and "method"
-  /// then move from them to their fields if they are strings, and "version" if it passes
-  /// Json::Value::isInt(). A member of another type, or a missing one, leaves the field as it was
-  /// (the former stays among the parameters). No field is taken from a `request` that is not an
-  /// object. The time-out, the encryption flag and the file are not touched.
+  /// Loads a call in its JSON form. The parameters become a copy of `request`. Then "api" and
+  /// "method" move from the parameters to their fields when they are strings, and "version" when it
+  /// passes `Json::Value::isInt`. A member of another type stays a parameter. A field without such
+  /// a member keeps its value; so do the time-out, the encryption flag and the file. A `request`
+  /// that is not an object changes the parameters only.
   void setRequest(const Json::Value& request);
 
   /// The JSON form: the parameters with "api", "method" and "version" set. Parameters that are
-  /// neither null nor an object are left out. The time-out, the encryption flag and the file are
-  /// not part of it.
+  /// neither null nor an object are left out, and so are the time-out, the encryption flag and the
+  /// file.
   [[nodiscard]] Json::Value toJson() const;
-
-  /// The same for a request that is done with: its parameters are not copied, and null afterwards.
-  /// Everything else stays.
-  [[nodiscard]] Json::Value takeJson();
 
   /// "API/METHOD/VERSION", the short name for log lines.
   [[nodiscard]] std::string toStr() const;
 
-  /// Back to the defaults, with two exceptions: the encryption flag deliberately stays, and
-  /// parameters that were an object become an empty object (anything else becomes null).
+  /// Sets the fields to their defaults, except for two: the encryption flag stays, and parameters
+  /// that are an object or an array are emptied.
   void clear();
 
  private:
-  // Moves the three reserved members out of the parameters.
-  KELODR_LOCAL void takeEnvelope();
-  KELODR_LOCAL Json::Value makeJson(Json::Value members) const;
-
   static constexpr int kNoVersion = -1;
   static constexpr int kDefaultTimeout = 120;
 

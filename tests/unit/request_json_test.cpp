@@ -117,7 +117,7 @@ TEST_F(RequestJsonTest, LoadingIsCaseSensitive) {
 }
 
 TEST_F(RequestJsonTest, LoadingAnythingButAnObjectOnlySetsTheParams) {
-  std::vector<Json::Value> all = ValuesWithoutMembers();
+  std::vector<Json::Value> all = ParamsWithoutRoom();
   all.emplace_back();
   for (const Json::Value& call : all) {
     Request request = Filled();
@@ -160,7 +160,7 @@ TEST_F(RequestJsonTest, JsonFormOverwritesReservedKeysOfTheParams) {
 }
 
 TEST_F(RequestJsonTest, JsonFormLeavesOutParamsThatCannotHoldMembers) {
-  for (const Json::Value& params : ValuesWithoutMembers()) {
+  for (const Json::Value& params : ParamsWithoutRoom()) {
     const Request request = WithParams(params);
     EXPECT_EQ(request.toJson(), Parse(R"({"api": "A", "method": "list", "version": 1})"));
     EXPECT_EQ(request.getParams(), params);
@@ -171,26 +171,6 @@ TEST_F(RequestJsonTest, JsonFormIsACopy) {
   const Request request = Filled();
   request.toJson()["id"] = 8;
   EXPECT_EQ(request.getParams(), Parse(R"({"id": 7})"));
-}
-
-TEST_F(RequestJsonTest, TakingTheJsonFormGivesTheParamsAway) {
-  Request request = Filled();
-  const Json::Value expected = request.toJson();
-  const Json::Value* const id = &request.getParams()["id"];
-  const Json::Value json = request.takeJson();
-  EXPECT_EQ(json, expected);
-  EXPECT_EQ(&json["id"], id) << "it was copied";
-  EXPECT_TRUE(request.getParams().isNull());
-  EXPECT_EQ(request.toStr(), "A/get/3");
-  ExpectClientSettings(request, 5, true, "/tmp/local", "remote");
-}
-
-TEST_F(RequestJsonTest, TakingTheJsonFormLeavesOutParamsThatCannotHoldMembers) {
-  for (const Json::Value& params : ValuesWithoutMembers()) {
-    Request request = WithParams(params);
-    EXPECT_EQ(request.takeJson(), Parse(R"({"api": "A", "method": "list", "version": 1})"));
-    EXPECT_TRUE(request.getParams().isNull());
-  }
 }
 
 Json::Value RandomCall(RandomJson& random) {

@@ -15,8 +15,8 @@
 // The keys that no parameter can have.
 inline const char* const kReserved[] = {"api", "method", "version"};
 
-// Values that can hold no members by key, other than null.
-inline std::vector<Json::Value> ValuesWithoutMembers() {
+// Parameters to which no member can be added: neither null nor an object.
+inline std::vector<Json::Value> ParamsWithoutRoom() {
   return {Parse("[]"), Parse(R"([{"api": "A"}, 2])"), 7, 2.5, true, "text", ""};
 }
 
