@@ -11,7 +11,7 @@ namespace {
 const char* const kIn = "IN";
 const char* const kNotIn = "NOT IN";
 
-// Every setter builds its text aside before it touches the old one: an operand may be that text.
+// Every setter builds its new text before it replaces the old one: an operand may be the old one.
 
 bool SetComparison(std::string& text, const std::string& lvalue, const char* comparison,
                    const SqliteValue& value) {
@@ -36,8 +36,8 @@ bool AppendGroup(std::string& text, const std::string& left, const char* keyword
   return true;
 }
 
-// Asks the virtual operation: a subclass may know other keywords.
-bool HasKeyword(const SqliteInFamily& condition) {
+// Logs when the keyword is refused. Asks the virtual operation: a subclass may know other keywords.
+bool RequireKeyword(const SqliteInFamily& condition) {
   if (condition.IsValid()) return true;
   KELODR_LOG(ERR, "SetValue", "Bad keyword [%s]", condition.GetKeyword().c_str());
   return false;
@@ -110,10 +110,14 @@ SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string
   SetValue(lvalue, value);
 }
 
+SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+                               std::initializer_list<SqliteValue> values)
+    : SqliteInFamily(listKeyword, lvalue, std::vector<SqliteValue>(values)) {}
+
 bool SqliteInFamily::IsValid() const { return keyword == kIn || keyword == kNotIn; }
 
 bool SqliteInFamily::SetValue(const std::string& lvalue, const std::vector<SqliteValue>& values) {
-  if (!HasKeyword(*this)) return false;
+  if (!RequireKeyword(*this)) return false;
   if (lvalue.empty()) {
     KELODR_LOG(ERR, __func__, "Bad lvalue[%s]", lvalue.c_str());
     return false;
@@ -130,12 +134,18 @@ bool SqliteInFamily::SetValue(const std::string& lvalue, const std::vector<Sqlit
     isFirst = false;
     ValueAccess::AppendLiteral(rendered, value);
   }
-  text = std::move(rendered += " )");
+  rendered += " )";
+  text = std::move(rendered);
   return true;
 }
 
+bool SqliteInFamily::SetValue(const std::string& lvalue,
+                              std::initializer_list<SqliteValue> values) {
+  return SetValue(lvalue, std::vector<SqliteValue>(values));
+}
+
 bool SqliteInFamily::SetValue(const std::string& lvalue, const std::string& value) {
-  if (!HasKeyword(*this)) return false;
+  if (!RequireKeyword(*this)) return false;
   if (lvalue.empty() || value.empty()) {
     KELODR_LOG(ERR, __func__, "Bad lvalue[%s] or value[%s]", lvalue.c_str(), value.c_str());
     return false;
@@ -147,11 +157,15 @@ bool SqliteInFamily::SetValue(const std::string& lvalue, const std::string& valu
 SqliteIn::SqliteIn() : SqliteInFamily(kIn) {}
 SqliteIn::SqliteIn(const std::string& lvalue, const std::vector<SqliteValue>& values)
     : SqliteInFamily(kIn, lvalue, values) {}
+SqliteIn::SqliteIn(const std::string& lvalue, std::initializer_list<SqliteValue> values)
+    : SqliteInFamily(kIn, lvalue, values) {}
 SqliteIn::SqliteIn(const std::string& lvalue, const std::string& value)
     : SqliteInFamily(kIn, lvalue, value) {}
 
 SqliteNotIn::SqliteNotIn() : SqliteInFamily(kNotIn) {}
 SqliteNotIn::SqliteNotIn(const std::string& lvalue, const std::vector<SqliteValue>& values)
+    : SqliteInFamily(kNotIn, lvalue, values) {}
+SqliteNotIn::SqliteNotIn(const std::string& lvalue, std::initializer_list<SqliteValue> values)
     : SqliteInFamily(kNotIn, lvalue, values) {}
 SqliteNotIn::SqliteNotIn(const std::string& lvalue, const std::string& value)
     : SqliteInFamily(kNotIn, lvalue, value) {}

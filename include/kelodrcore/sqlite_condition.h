@@ -2,14 +2,19 @@
 /// WHERE conditions.
 ///
 /// A condition renders itself into SQL text when its operands are set, and keeps that text. Values
-/// are rendered with `SqliteValue::ToFormatedValue`, so texts arrive quoted and escaped; a left
-/// side is written exactly as given. Every `SetValue` answers false on failure, with a line at ERR,
-/// and leaves the text as it was unless told otherwise. A constructor with operands is the default
-/// constructor followed by `SetValue`; where that fails, the text stays empty.
+/// are rendered with `SqliteValue::ToFormatedValue`, so texts are quoted and escaped; a left side
+/// is written exactly as given. Every `SetValue` answers false on failure, with a line at ERR, and
+/// leaves the text as it was, unless its comment says otherwise. A constructor with operands is the
+/// default constructor followed by `SetValue`; where that fails, the text stays empty.
+///
+/// Deliberate, and frozen because statements are compared with it: AND and OR append to the text
+/// that is there, `SqliteIsNull::SetValue` always returns false, and the validity of IN and NOT IN
+/// is that of their keyword, whatever their text.
 
 #ifndef KELODRCORE_SQLITE_CONDITION_H_
 #define KELODRCORE_SQLITE_CONDITION_H_
 
+#include <initializer_list>
 #include <string>
 #include <vector>
 
@@ -69,8 +74,7 @@ class KELODR_EXPORT SqliteAnd : public SqliteCondition {
   /// Calls `SetValue` with the two texts; the operands' `IsValid` is not asked.
   SqliteAnd(const SqliteCondition& left, const SqliteCondition& right);
 
-  /// Appends the group directly behind the text that is there, deliberately. Fails when a side is
-  /// empty.
+  /// Appends the group directly behind the text that is there. Fails when a side is empty.
   bool SetValue(const std::string& left, const std::string& right);
 };
 
@@ -82,8 +86,7 @@ class KELODR_EXPORT SqliteOr : public SqliteCondition {
   /// Calls `SetValue` with the two texts; the operands' `IsValid` is not asked.
   SqliteOr(const SqliteCondition& left, const SqliteCondition& right);
 
-  /// Appends the group directly behind the text that is there, deliberately. Fails when a side is
-  /// empty.
+  /// Appends the group directly behind the text that is there. Fails when a side is empty.
   bool SetValue(const std::string& left, const std::string& right);
 };
 
@@ -93,8 +96,7 @@ class KELODR_EXPORT SqliteIsNull : public SqliteCondition {
   SqliteIsNull();                                    ///< No operands.
   explicit SqliteIsNull(const std::string& lvalue);  ///< Calls `SetValue`.
 
-  /// Replaces the text; an empty lvalue leaves it. Returns false in every case, deliberately: ask
-  /// `IsValid` instead.
+  /// Replaces the text; fails for an empty lvalue. Returns false in both cases: ask `IsValid`.
   bool SetValue(const std::string& lvalue);
 };
 
@@ -104,21 +106,36 @@ class KELODR_EXPORT SqliteInFamily : public SqliteCondition {
   /// Sets the keyword only; any other than "IN" or "NOT IN" makes every setter fail.
   explicit SqliteInFamily(const std::string& listKeyword);
 
-  /// @{
   /// Sets the keyword, then calls `SetValue`.
+  /// @{
   SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
                  const std::vector<SqliteValue>& values);
+  SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+                 std::initializer_list<SqliteValue> values);
+  template <typename T>
+  SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+                 std::initializer_list<T> values)
+      : SqliteInFamily(listKeyword, lvalue,
+                       std::vector<SqliteValue>(values.begin(), values.end())) {}
   SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
                  const std::string& value);
   /// @}
 
-  /// True when the keyword is exactly "IN" or "NOT IN". The text is not looked at, deliberately: a
-  /// condition whose operands were refused is valid and empty.
+  /// True when the keyword is exactly "IN" or "NOT IN". A condition whose operands were refused is
+  /// valid and empty.
   [[nodiscard]] bool IsValid() const override;
 
   /// Replaces the text with a list of the literals, which may be empty. Fails for an invalid
-  /// keyword, an empty lvalue, or an invalid value; the last leaves the text empty.
+  /// keyword, an empty lvalue or an invalid value; the last leaves the text empty. Values in braces
+  /// are always a list, one text in braces too.
+  /// @{
   bool SetValue(const std::string& lvalue, const std::vector<SqliteValue>& values);
+  bool SetValue(const std::string& lvalue, std::initializer_list<SqliteValue> values);
+  template <typename T>
+  bool SetValue(const std::string& lvalue, std::initializer_list<T> values) {
+    return SetValue(lvalue, std::vector<SqliteValue>(values.begin(), values.end()));
+  }
+  /// @}
 
   /// Replaces the text with a list of `value` as given: a sub-query, or literals that the caller
   /// has rendered. Fails for an invalid keyword, an empty lvalue or an empty value.
@@ -135,9 +152,14 @@ class KELODR_EXPORT SqliteInFamily : public SqliteCondition {
 class KELODR_EXPORT SqliteIn : public SqliteInFamily {
  public:
   SqliteIn();  ///< No operands.
-  /// @{
+
   /// Calls `SetValue`.
+  /// @{
   SqliteIn(const std::string& lvalue, const std::vector<SqliteValue>& values);
+  SqliteIn(const std::string& lvalue, std::initializer_list<SqliteValue> values);
+  template <typename T>
+  SqliteIn(const std::string& lvalue, std::initializer_list<T> values)
+      : SqliteIn(lvalue, std::vector<SqliteValue>(values.begin(), values.end())) {}
   SqliteIn(const std::string& lvalue, const std::string& value);
   /// @}
 };
@@ -146,9 +168,14 @@ class KELODR_EXPORT SqliteIn : public SqliteInFamily {
 class KELODR_EXPORT SqliteNotIn : public SqliteInFamily {
  public:
   SqliteNotIn();  ///< No operands.
-  /// @{
+
   /// Calls `SetValue`.
+  /// @{
   SqliteNotIn(const std::string& lvalue, const std::vector<SqliteValue>& values);
+  SqliteNotIn(const std::string& lvalue, std::initializer_list<SqliteValue> values);
+  template <typename T>
+  SqliteNotIn(const std::string& lvalue, std::initializer_list<T> values)
+      : SqliteNotIn(lvalue, std::vector<SqliteValue>(values.begin(), values.end())) {}
   SqliteNotIn(const std::string& lvalue, const std::string& value);
   /// @}
 };

@@ -243,6 +243,40 @@ TEST_F(SqliteConditionTest, InTakesATextAsItIs) {
   ExpectCondition(SqliteIn("id", "'a', 'it's'"), "id IN ( 'a', 'it's' )");
 }
 
+TEST_F(SqliteConditionTest, ValuesInBracesAreAlwaysAList) {
+  EXPECT_EQ(SqliteIn("name", {"a", "b'"}).GetText(), "name IN ( 'a','b''' )");
+  EXPECT_EQ(SqliteNotIn("name", {"a", "b"}).GetText(), "name NOT IN ( 'a','b' )");
+  EXPECT_EQ(SqliteIn("id", {1, 2}).GetText(), "id IN ( 1,2 )");
+  EXPECT_EQ(SqliteNotIn("id", {1}).GetText(), "id NOT IN ( 1 )");
+  EXPECT_EQ(SqliteIn("id", {}).GetText(), "id IN (  )");
+  EXPECT_EQ(SqliteIn("id", {1, "a"}).GetText(), "id IN ( 1,'a' )");
+  EXPECT_EQ(SqliteNotIn("id", {"a", 3}).GetText(), "id NOT IN ( 'a',3 )");
+  EXPECT_EQ(SqliteIn("id", {SqliteValue(1), SqliteValue("a")}).GetText(), "id IN ( 1,'a' )");
+  EXPECT_EQ(SqliteInFamily("IN", "id", {1, 2}).GetText(), "id IN ( 1,2 )");
+  EXPECT_EQ(SqliteInFamily("NOT IN", "id", {1, "a"}).GetText(), "id NOT IN ( 1,'a' )");
+  SqliteIn condition;
+  EXPECT_TRUE(condition.SetValue("id", {1, 2}));
+  EXPECT_EQ(condition.GetText(), "id IN ( 1,2 )");
+  EXPECT_TRUE(condition.SetValue("id", {"a", 2}));
+  EXPECT_EQ(condition.GetText(), "id IN ( 'a',2 )");
+  EXPECT_FALSE(condition.SetValue("id", {SqliteValue(1), SqliteValue()}));
+  EXPECT_EQ(condition.GetText(), "");
+  ExpectError("Invalid rvalue []");
+}
+
+// Taken as the text of the list, it would be SQL.
+TEST_F(SqliteConditionTest, OneTextInBracesIsAListToo) {
+  const std::string text = "a') OR 1=1 --";
+  const std::string list = "( 'a'') OR 1=1 --' )";
+  EXPECT_EQ(SqliteIn("name", {text}).GetText(), "name IN " + list);
+  EXPECT_EQ(SqliteNotIn("name", {text}).GetText(), "name NOT IN " + list);
+  EXPECT_EQ(SqliteInFamily("IN", "name", {text}).GetText(), "name IN " + list);
+  EXPECT_EQ(SqliteIn("name", {"a') OR 1=1 --"}).GetText(), "name IN " + list);
+  SqliteIn condition;
+  EXPECT_TRUE(condition.SetValue("name", {text}));
+  EXPECT_EQ(condition.GetText(), "name IN " + list);
+}
+
 TEST_F(SqliteConditionTest, SettingInAgainReplacesTheText) {
   SqliteIn condition("id", Values{1});
   EXPECT_TRUE(condition.SetValue("n", Values{2}));
