@@ -11,6 +11,7 @@
 #include "kelodrcore/json_value.h"
 #include "kelodrcore/utils.h"
 #include "log.h"
+#include "sqlite_attempt.h"
 #include "sqlite_bulk.h"
 #include "value_access.h"
 
@@ -193,51 +194,13 @@ bool SqliteDB::IsInTransaction() const {
 
 // A transaction that cannot even be rolled back, for lack of memory, ends with the connection: what
 // comes after it must not become a part of it.
-void SqliteDB::RollBack() {
+void SqliteDB::AbandonTransaction() {
   sqlite3_exec(dbHandle, "ROLLBACK", nullptr, nullptr, nullptr);
   if (IsInTransaction()) Close();
 }
 
-// What is done while it lives. Unless it is kept, it leaves the handle in the transaction state in
-// which it was before.
-class SqliteDB::Attempt {
- public:
-  explicit Attempt(SqliteDB& handle) : db(handle), isInner(handle.IsInTransaction()) {}
-  Attempt(const Attempt&) = delete;
-  Attempt& operator=(const Attempt&) = delete;
-
-  ~Attempt() {
-    if (isKept || !db.IsInTransaction()) return;
-    if (!isInner || (hasSavepoint && !UndoSavepoint())) db.RollBack();
-  }
-
-  void Keep() { isKept = true; }
-
-  // Makes all of it one change: a savepoint inside a transaction, else a transaction.
-  bool Begin() {
-    if (!isInner) return db.DoExecSqliteCommand("BEGIN IMMEDIATE");
-    hasSavepoint = db.DoExecSqliteCommand("SAVEPOINT records");
-    return hasSavepoint;
-  }
-  bool End() {
-    isKept = db.DoExecSqliteCommand(isInner ? "RELEASE records" : "COMMIT");
-    return isKept;
-  }
-
- private:
-  bool UndoSavepoint() {
-    const char* const undo = "ROLLBACK TO records; RELEASE records";
-    return sqlite3_exec(db.dbHandle, undo, nullptr, nullptr, nullptr) == SQLITE_OK;
-  }
-
-  SqliteDB& db;
-  const bool isInner;
-  bool hasSavepoint = false;
-  bool isKept = false;
-};
-
-// SQLite would run the text up to the NUL byte.
-bool SqliteDB::IsRefused(const std::string& sql, const char* function) const {
+// True, with the error and a line, for a text of which SQLite would run only the start.
+bool SqliteDB::RefuseNul(const std::string& sql, const char* function) const {
   if (sql.find('\0') == std::string::npos) return false;
   SetErr(ERR::BAD_PARAMETER);
   KELODR_LOG(ERR, function, "NUL byte in command [%s]", sql.c_str());
@@ -245,7 +208,7 @@ bool SqliteDB::IsRefused(const std::string& sql, const char* function) const {
 }
 
 bool SqliteDB::DoExecSqliteCommand(const std::string& sql) {
-  if (IsRefused(sql, __func__)) return false;
+  if (RefuseNul(sql, __func__)) return false;
   Attempt attempt(*this);
   char* errText = nullptr;
   const int code = sqlite3_exec(dbHandle, sql.c_str(), nullptr, nullptr, &errText);
@@ -256,7 +219,7 @@ bool SqliteDB::DoExecSqliteCommand(const std::string& sql) {
 }
 
 bool SqliteDB::DoSelectSqliteRecord(const std::string& sql, SqliteValueList& record) {
-  if (IsRefused(sql, __func__)) return false;
+  if (RefuseNul(sql, __func__)) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   Query query(dbHandle, sql);
   if (query.Next()) record = query.Row();
@@ -265,7 +228,7 @@ bool SqliteDB::DoSelectSqliteRecord(const std::string& sql, SqliteValueList& rec
 
 bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
                                      std::vector<SqliteValueList>& records) {
-  if (IsRefused(sql, __func__)) return false;
+  if (RefuseNul(sql, __func__)) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   Query query(dbHandle, sql);
   while (query.Next()) records.push_back(query.Row());
@@ -327,7 +290,7 @@ bool SqliteDB::Exec(const std::string& sql) {
     KELODR_LOG(ERR, __func__, "empty command to exec db[%s]", dbPath.c_str());
     return false;
   }
-  if (IsRefused(sql, __func__) || !OpenForExec(__func__)) return false;
+  if (RefuseNul(sql, __func__) || !OpenForExec(__func__)) return false;
   unsigned int retries = 0;
   while (!DoExecSqliteCommand(sql)) {
     if (ClassifyErr() && PauseBeforeRetry(retries)) continue;
@@ -348,7 +311,7 @@ bool SqliteDB::OpenForQuery(const std::string& sql, const char* emptyMessage) {
     KELODR_LOG(ERR, function, "%s", emptyMessage);
     return false;
   }
-  if (IsRefused(sql, function)) return false;
+  if (RefuseNul(sql, function)) return false;
   if (Open()) return true;
   KELODR_LOG(ERR, function, "Failed to open db [%s]", dbPath.c_str());
   return false;
@@ -424,7 +387,7 @@ bool SqliteDB::Exec(const SqliteCommand& cmd) {
     SetErr(ERR::BAD_PARAMETER);
     return false;
   }
-  if (IsRefused(sql, __func__)) return false;
+  if (RefuseNul(sql, __func__)) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   if (!CreateTable(cmd.GetTable())) {
     KELODR_LOG(ERR, __func__, "Failed to create table [%s]", cmd.GetTable().tableName.c_str());
@@ -545,11 +508,11 @@ bool SqliteDB::InsertAll(const BulkInsert& insert, const SqliteTableHandler& tab
 
 bool SqliteDB::TryInsertAll(const BulkInsert& insert) {
   Attempt attempt(*this);
-  if (!attempt.Begin()) return false;
+  if (!attempt.SetSavepoint()) return false;
   std::string message;
   const int code = insert.Run(dbHandle, message);
   SetDBErr(code, message.c_str());
-  return code == SQLITE_OK && attempt.End();
+  return code == SQLITE_OK && attempt.ReleaseSavepoint();
 }
 
 }  // namespace KeloDRCore

@@ -50,7 +50,7 @@ bool SqliteTransaction::Commit() {
 void SqliteTransaction::Rollback() {
   if (!IsOwner()) return;
   SetOwner(handle.dbHandle, nullptr);
-  if (handle.IsInTransaction()) handle.RollBack();
+  if (handle.IsInTransaction()) handle.AbandonTransaction();
 }
 
 }  // namespace KeloDRCore

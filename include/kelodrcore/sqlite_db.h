@@ -222,7 +222,7 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   using RecordTaker = std::function<bool(const SqliteValueList& record)>;
 
   KELODR_LOCAL void SetErr(int code) const;  // a code without details
-  KELODR_LOCAL bool IsRefused(const std::string& sql, const char* function) const;
+  KELODR_LOCAL bool RefuseNul(const std::string& sql, const char* function) const;
   KELODR_LOCAL bool OpenForExec(const char* function);
   KELODR_LOCAL bool OpenForQuery(const std::string& sql, const char* emptyMessage);
   KELODR_LOCAL bool ClassifyErr() const;
@@ -235,7 +235,7 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
                               const char* function);
   KELODR_LOCAL bool TryInsertAll(const BulkInsert& insert);
   KELODR_LOCAL bool IsInTransaction() const;
-  KELODR_LOCAL void RollBack();
+  KELODR_LOCAL void AbandonTransaction();
 
   sqlite3* dbHandle;
   std::string dbPath;

@@ -6,7 +6,7 @@
 #include <cstdlib>
 #include <new>
 
-#include "kelodrcore/sqlite_db.h"
+#include "kelodrcore/sqlite_transaction.h"
 #include "support/database.h"
 
 namespace {
@@ -27,6 +27,8 @@ void operator delete(void* memory) noexcept { std::free(memory); }
 void operator delete(void* memory, std::size_t /*size*/) noexcept { std::free(memory); }
 
 namespace {
+
+using KeloDRCore::SqliteTransaction;
 
 class SqliteDBMemoryTest : public DatabaseTest {
  protected:
@@ -99,6 +101,49 @@ TEST_F(SqliteDBMemoryTest, CommandsFailCleanly) {
   FailEachAllocation([&](SqliteDB& scarce) {
     Records rows;
     scarce.SelectRecords(SelectAll(table), rows);
+  });
+}
+
+TEST_F(SqliteDBMemoryTest, BulkInsertsFailCleanlyAndLeaveNoRow) {
+  Records rows(3);
+  for (SqliteValueList& row : rows) row.AddValue("s", "a text that is long enough");
+  rows.back().AddValue("n", 5);
+  const SqliteTableHandler table("bulk", "n, s");
+  FailEachAllocation([&](SqliteDB& scarce) {
+    bool isDone = false;
+    const auto check = [&] {
+      allocationsLeft = -1;
+      SqliteDB other(path, 0, "other");
+      int count = 0;
+      if (other.IsTableExisted("bulk")) other.GetCount(table, count);
+      EXPECT_TRUE(count == 3 || (count == 0 && !isDone)) << count;
+      EXPECT_TRUE(scarce.Exec("BEGIN; ROLLBACK")) << "a transaction was left open";
+      other.Exec("DROP TABLE bulk");
+    };
+    try {
+      isDone = scarce.InsertRecords(table, rows);
+    } catch (const std::bad_alloc&) {
+      check();
+      throw;
+    }
+    if (allocationsLeft < 0) return;
+    check();
+    allocationsLeft = 1;
+  });
+}
+
+TEST_F(SqliteDBMemoryTest, TransactionsFailCleanly) {
+  FailEachAllocation([&](SqliteDB& scarce) {
+    SqliteTransaction transaction(scarce);
+    scarce.InsertRecord(InsertOf(SqliteTableHandler("t", "n, s"), "n", 3));
+    transaction.Commit();
+  });
+}
+
+TEST_F(SqliteDBMemoryTest, RowsAreHandedOverCleanly) {
+  FailEachAllocation([&](SqliteDB& scarce) {
+    scarce.SelectEach(SelectAll(SqliteTableHandler("t", "n, s")),
+                      [](const SqliteValueList& row) { return row.GetValues().size() == 2; });
   });
 }
 

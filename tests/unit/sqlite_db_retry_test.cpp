@@ -173,6 +173,72 @@ TEST_F(SqliteDBRetryTest, RowsOfAFailedAttemptStayWhenItIsTriedAgain) {
   ExpectLog({Info(kFile, "SelectByCommand", "After retry [1] times, success to select command")});
 }
 
+// A text whose second statement fails `times` times, inside a transaction that it begins itself.
+const std::string kTransaction = "BEGIN IMMEDIATE; INSERT INTO t VALUES (3), (fail(5)); COMMIT;";
+
+TEST_F(SqliteDBRetryTest, ATextOfATransactionIsTriedAgainFromItsBeginning) {
+  Start(2);
+  FailNextCalls(2);
+  EXPECT_TRUE(db->Exec(kTransaction));
+  Pauses::ExpectCount(2);
+  LogCapture::Clear();
+  SqliteDB other(path, 0, "");
+  EXPECT_THAT(Rows(other, "SELECT n FROM t"), ElementsAre("n:1", "n:2", "n:3", "n:5"));
+}
+
+TEST_F(SqliteDBRetryTest, ATextThatFailsLeavesNoTransactionThatItBegan) {
+  Start(1);
+  const std::string texts[] = {kTransaction, "SAVEPOINT a; INSERT INTO t VALUES (3), (fail(5))",
+                               "COMMIT; nonsense", "BEGIN; COMMIT; BEGIN; SELECT fail(5)"};
+  for (const std::string& sql : texts) {
+    FailNextCalls(100);
+    EXPECT_FALSE(db->Exec(sql));
+    EXPECT_FALSE(db->DoExecSqliteCommand(sql));
+    ASSERT_TRUE(db->Exec("INSERT INTO t VALUES (4)"));
+    SqliteDB other(path, 0, "");
+    EXPECT_THAT(Rows(other, "SELECT n FROM t"), ElementsAre("n:1", "n:2", "n:4"));
+    ASSERT_TRUE(db->Exec("DELETE FROM t WHERE n > 2"));
+  }
+  LogCapture::Clear();
+}
+
+TEST_F(SqliteDBRetryTest, TheErrorOfATextIsThatOfTheStatementThatFailed) {
+  Start(0);
+  FailNextCalls(100);
+  EXPECT_FALSE(db->Exec(kTransaction));
+  const Json::Value busy = Error(405, 5, "database is locked");
+  EXPECT_EQ(db->GetErr(), busy);
+  EXPECT_FALSE(db->Exec("BEGIN; nonsense"));
+  const Json::Value failure = Error(404, 1, "near \"nonsense\": syntax error");
+  EXPECT_EQ(db->GetErr(), failure);
+  ExpectLog({ExecFailed("Exec", 1, kTransaction, busy),
+             ExecFailed("Exec", 0, "BEGIN; nonsense", failure)});
+}
+
+TEST_F(SqliteDBRetryTest, ATextThatFailsInsideATransactionLeavesItOpen) {
+  Start(0);
+  ASSERT_TRUE(db->Exec("BEGIN; INSERT INTO t VALUES (3)"));
+  EXPECT_FALSE(db->Exec("INSERT INTO t VALUES (4); nonsense"));
+  LogCapture::Clear();
+  EXPECT_TRUE(db->Exec("COMMIT"));
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1", "n:2", "n:3", "n:4"));
+}
+
+TEST_F(SqliteDBRetryTest, ATextThatSucceedsMayLeaveATransactionOpen) {
+  Start(0);
+  ASSERT_TRUE(db->Exec("BEGIN; INSERT INTO t VALUES (3)"));
+  ASSERT_TRUE(db->Exec("ROLLBACK"));
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1", "n:2"));
+}
+
+TEST_F(SqliteDBRetryTest, StatementsOutsideATransactionRunAgainWithTheRetry) {
+  Start(1);
+  FailNextCalls(1);
+  EXPECT_TRUE(db->Exec("INSERT INTO t VALUES (3); INSERT INTO t VALUES (fail(5))"));
+  LogCapture::Clear();
+  EXPECT_THAT(Rows(*db, "SELECT n FROM t"), ElementsAre("n:1", "n:2", "n:3", "n:3", "n:5"));
+}
+
 TEST_F(SqliteDBRetryTest, SingleAttemptsNeverRetry) {
   Start(3);
   FailNextCalls(3);

@@ -72,6 +72,13 @@ TEST_F(SqliteDBTableTest, IsTableExistedTellsPresentFromAbsent) {
   EXPECT_EQ(db->GetErr(), Error(0));
 }
 
+TEST_F(SqliteDBTableTest, IsTableExistedReadsItsRowsAsAnyQueryDoes) {
+  EXPECT_TRUE(db->IsTableExisted("' UNION SELECT NULL AS n; --"));
+  EXPECT_TRUE(db->IsTableExisted("' UNION SELECT 2.5; --"));
+  ExpectLog({Warn(kFile, "ParseRecord", "field [1] has null value"),
+             Warn(kFile, "ParseRecord", "Not supported type [2] with field [1]")});
+}
+
 TEST_F(SqliteDBTableTest, IsTableExistedTakesANameOfAnyLength) {
   const std::string name(1000, 'n');
   EXPECT_FALSE(db->IsTableExisted(name));

@@ -480,6 +480,67 @@ TEST_F(SqliteDBTest, ATextWithANulByteDoesNotRun) {
   EXPECT_THAT(records, IsEmpty());
 }
 
+TEST_F(SqliteDBTest, AConditionWithANulByteDeletesNothing) {
+  const SqliteTableHandler table("t", "name TEXT");
+  ASSERT_TRUE(db->InsertRecord(InsertOf(table, "name", "a")));
+  LogCapture::Clear();
+  DeleteCommand command;
+  command.SetTable(table);
+  command.SetCondition(KeloDRCore::SqliteEqual("name", std::string("a\0", 2)));
+  const std::string shown = "DELETE FROM t WHERE name='a";
+  EXPECT_FALSE(db->DeleteRecord(command));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  ExpectLog({Info(kFile, "Exec", "label Exec cmd: " + shown),
+             Err(kFile, "Exec", "NUL byte in command [" + shown + "]")});
+  EXPECT_FALSE(db->DeleteRecord(std::string("1\0", 2), table));
+  EXPECT_FALSE(db->DeleteRecord(std::string("1\0", 2), SqliteTableHandler("new", "n")));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  LogCapture::Clear();
+  EXPECT_THAT(Rows(*db, "SELECT name FROM t"), ElementsAre("name:'a'"));
+  EXPECT_FALSE(db->IsTableExisted("new"));
+}
+
+TEST_F(SqliteDBTest, ATableNameWithANulByteNamesNoTable) {
+  ASSERT_TRUE(db->Exec("CREATE TABLE t (n)"));
+  const SqliteTableHandler table(std::string("t'; --\0", 7), "n");
+  int count = -1;
+  EXPECT_FALSE(db->IsTableExisted(table.tableName));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(db->GetCount(table, count));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_EQ(count, -1);
+  EXPECT_FALSE(db->CreateTable(table));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  LogCapture::Clear();
+}
+
+TEST_F(SqliteDBTest, BulkInsertsNameAConnectionThatIsNotThere) {
+  opensWithoutHandle = true;
+  EXPECT_FALSE(db->InsertRecords(SqliteTableHandler("t", ""), {record}));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  LogCapture::Clear();
+  record.AddValue("n", 1);
+  EXPECT_FALSE(db->InsertRecords(SqliteTableHandler("t", ""), {record}));
+  opensWithoutHandle = false;
+  EXPECT_EQ(db->GetErr(), Error(403));
+  ExpectLog({Info(kFile, "InsertRecords", "label Exec cmd: INSERT INTO t (n) VALUES (?);"),
+             Err(kFile, "InsertRecords", "DB[" + path + "] is not opened")});
+}
+
+class ThrowingDB : public SqliteDB {
+ public:
+  using SqliteDB::SqliteDB;
+  std::string GetErrCodeStr(int /*code*/) const override { throw Json::LogicError("own"); }
+};
+
+TEST_F(SqliteDBTest, WhatTheNamingOfACodeThrowsPassesUnchanged) {
+  ThrowingDB throwing(path, 0, "label");
+  EXPECT_THROW((void)throwing.GetErr(), Json::LogicError);
+  EXPECT_THROW(throwing.Exec("nonsense"), Json::LogicError);
+  EXPECT_THROW(throwing.SelectByCommand("nonsense", record), Json::LogicError);
+  EXPECT_THROW(throwing.SelectByCommand("nonsense", records), Json::LogicError);
+}
+
 TEST_F(SqliteDBTest, FailureNamesBytesThatAreNotUtf8) {
   const std::string sql = "DROP TABLE \"\xff\xfe'\x01\"";
   const Json::Value failure = Error(404, 1, "no such table: \xff\xfe'\x01");
