@@ -120,7 +120,8 @@ class CommandLine {
                         "one of " +
                             Names(columns));
     command->add_option("--order", options.query.order, "Sort by FIELD; may be repeated");
-    command->add_flag("!--desc", options.query.ascending, "Sort descending");
+    command->add_flag_callback(
+        "--desc", [this] { options.query.ascending = false; }, "Sort descending");
     command->add_option("--limit", options.query.limit, "At most that many rows")
         ->check(CLI::PositiveNumber);
     command->add_option("--offset", options.query.offset, "Skip that many rows")
