@@ -370,8 +370,12 @@ bool SqliteDB::CreateTable(const SqliteTableHandler& table) {
     KELODR_LOG(ERR, __func__, "Invalid table [%s]", table.tableName.c_str());
     return false;
   }
+  const bool wasInTransaction = IsInTransaction();
   if (IsTableExisted(table.tableName)) return true;
-  if (!Exec("CREATE TABLE IF NOT EXISTS " + table.tableName + " (" + table.columnDefs + ")")) {
+  // A failed query may have ended the transaction: what follows must not be kept without it.
+  const bool isLost = wasInTransaction && !IsInTransaction();
+  if (isLost ||
+      !Exec("CREATE TABLE IF NOT EXISTS " + table.tableName + " (" + table.columnDefs + ")")) {
     KELODR_LOG(ERR, __func__, "Failed to create table [%s] with cmd[%s]", table.tableName.c_str(),
                table.columnDefs.c_str());
     return false;

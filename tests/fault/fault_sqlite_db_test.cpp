@@ -10,7 +10,7 @@
 #include "fault/failing_vfs.h"
 #include "fault/fault.h"
 #include "kelodrcore/err.h"
-#include "kelodrcore/sqlite_db.h"
+#include "kelodrcore/sqlite_transaction.h"
 
 using Fault::Outcome;
 using KeloDRCore::DeleteCommand;
@@ -18,6 +18,7 @@ using KeloDRCore::InsertCommand;
 using KeloDRCore::SelectCommand;
 using KeloDRCore::SqliteDB;
 using KeloDRCore::SqliteTableHandler;
+using KeloDRCore::SqliteTransaction;
 using KeloDRCore::SqliteValueList;
 using KeloDRCore::UpdateCommand;
 
@@ -137,10 +138,22 @@ void SqliteDBFaultTest::MakeUnfinishedFile() {
 bool SqliteDBFaultTest::With(const std::function<bool(SqliteDB&)>& action) {
   error = Json::Value();
   SqliteDB db(path, kRetries, "label");
-  const bool isDone = action(db);
-  const Fault::Suspension suspension;
-  if (!isDone) error = db.GetErr();
-  return isDone;
+  const auto expectNothingBegun = [&db] {
+    if (db.IsExisted()) {
+      EXPECT_TRUE(db.Exec("BEGIN; ROLLBACK")) << "a transaction was left open";
+    }
+  };
+  try {
+    const bool isDone = action(db);
+    const Fault::Suspension suspension;
+    if (!isDone) error = db.GetErr();
+    expectNothingBegun();
+    return isDone;
+  } catch (const std::bad_alloc&) {
+    const Fault::Suspension suspension;
+    expectNothingBegun();
+    throw;
+  }
 }
 
 int AddRow(void* rows, int /*columns*/, char** values, char** /*names*/) {
@@ -304,6 +317,81 @@ TEST_F(SqliteDBFaultTest, ADeletionIsDoneWholeOrNotAtAll) {
                {});
 }
 
+TEST_F(SqliteDBFaultTest, ATextOfATransactionIsDoneWholeOrNotAtAll) {
+  const auto action = [](SqliteDB& db) {
+    return db.Exec(
+        "BEGIN IMMEDIATE; REPLACE INTO t VALUES (3, 'three');"
+        "REPLACE INTO t VALUES (4, 'four'); COMMIT");
+  };
+  SweepWriting([this] { MakeFile(); }, action, {"1 one", "2 two", "3 three", "4 four"});
+}
+
+// Two runs of records with the same fields.
+std::vector<SqliteValueList> ManyRecords() {
+  std::vector<SqliteValueList> records(4);
+  const char* const texts[] = {"three", "four", "five"};
+  for (int i = 0; i < 3; ++i) {
+    records[static_cast<size_t>(i)].AddValue("n", i + 3);
+    records[static_cast<size_t>(i)].AddValue("s", texts[i]);
+  }
+  records[3].AddValue("s", "six");
+  records[3].AddValue("rowid", 6);
+  return records;
+}
+
+const Rows kAfterMany = {"1 one", "2 two", "3 three", "4 four", "5 five", "6 six"};
+
+TEST_F(SqliteDBFaultTest, ManyRecordsAreInsertedOrNone) {
+  const std::vector<SqliteValueList> records = ManyRecords();
+  SweepWriting([this] { MakeFile(); },
+               [&](SqliteDB& db) { return db.InsertOrReplaceRecords(table, records); }, kAfterMany);
+  SweepWriting([this] { RemoveFile(); },
+               [&](SqliteDB& db) { return db.InsertOrReplaceRecords(table, records); },
+               Rows(kAfterMany.begin() + 2, kAfterMany.end()));
+}
+
+TEST_F(SqliteDBFaultTest, ATransactionIsKeptWholeOrNotAtAll) {
+  const std::vector<SqliteValueList> records = ManyRecords();
+  const auto action = [&](SqliteDB& db) {
+    SqliteTransaction transaction(db);
+    return transaction.IsOpen() && db.Exec("UPDATE t SET s = 'new' WHERE n = 1") &&
+           db.InsertOrReplaceRecords(table, records) && transaction.Commit();
+  };
+  Rows after = kAfterMany;
+  after[0] = "1 new";
+  SweepWriting([this] { MakeFile(); }, action, after);
+}
+
+// What an insert of many leaves behind when it fails inside a transaction that is committed then.
+TEST_F(SqliteDBFaultTest, ATransactionHoldsNoPartOfAFailedInsert) {
+  const std::vector<SqliteValueList> records = ManyRecords();
+  MakeFile();
+  const auto run = [&] {
+    error = Json::Value();
+    SqliteDB db(path, 0, "label");
+    SqliteTransaction transaction(db);
+    bool isDone = false;
+    try {
+      isDone = transaction.IsOpen() && db.InsertOrReplaceRecords(table, records);
+    } catch (const std::bad_alloc&) {
+    }
+    const Fault::Suspension suspension;
+    transaction.Commit();
+    return isDone;
+  };
+  const auto check = [&](const Outcome& outcome) {
+    EXPECT_EQ(sqlite3_memory_used(), memoryBefore);
+    const Rows rows = Read();
+    EXPECT_EQ(rows, outcome.succeeded ? kAfterMany : kBefore);
+  };
+  const Fault::Operation operation = {[this] { MakeFile(); }, run, check};
+  SweepMemory(operation);
+  for (const int failure : {FailingVfs::kError, FailingVfs::kFull}) {
+    Sweep(operation, failure, Fault::kOnce);
+    Sweep(operation, failure, Fault::kForGood);
+  }
+}
+
 TEST_F(SqliteDBFaultTest, ATableIsThereOrItsFailureTold) {
   const auto action = [&](SqliteDB& db) {
     if (!db.CreateTable(table)) return false;
@@ -372,6 +460,21 @@ TEST_F(SqliteDBFaultTest, RecordsComeWholeOrNotAtAll) {
     const Fault::Suspension suspension;
     found = ToRows(records);
     return selected;
+  };
+  SweepReading(action, {"n:1, s:'one'", "n:2, s:'two'"});
+}
+
+TEST_F(SqliteDBFaultTest, RowsAreHandedOverWholeOrNotAtAll) {
+  missingIsNotTold = true;
+  SelectCommand select;
+  select.SetTable(table);
+  select.SelectAll();
+  const auto action = [&](SqliteDB& db) {
+    return db.SelectEach(select, [&](const SqliteValueList& record) {
+      const Fault::Suspension suspension;
+      found.push_back(record.ToStr());
+      return true;
+    });
   };
   SweepReading(action, {"n:1, s:'one'", "n:2, s:'two'"});
 }

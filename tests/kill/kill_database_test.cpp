@@ -1,14 +1,15 @@
-// Inserts killed at every system call.
+// Inserts, of one record and of many, killed at every system call.
 
 #include <sqlite3.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <functional>
 #include <string>
 #include <vector>
 
-#include "kelodrcore/sqlite_db.h"
+#include "kelodrcore/sqlite_transaction.h"
 #include "kill/recovery.h"
 #include "support/clean_test.h"
 #include "support/tracer.h"
@@ -18,6 +19,7 @@ namespace {
 using KeloDRCore::InsertCommand;
 using KeloDRCore::SqliteDB;
 using KeloDRCore::SqliteTableHandler;
+using KeloDRCore::SqliteTransaction;
 using KeloDRCore::SqliteValueList;
 using testing::Values;
 using Tracer::Moment;
@@ -42,11 +44,46 @@ class KilledInsertTest : public CleanTest, public testing::WithParamInterface<bo
 
   bool Insert(int number) const {
     SqliteDB db(path, 0, "");
+    return Insert(db, number);
+  }
+
+  static bool Insert(SqliteDB& db, int number) {
     InsertCommand insert;
-    insert.SetTable(SqliteTableHandler("t", "n INTEGER UNIQUE, filler TEXT"));
+    insert.SetTable(kTable);
     insert.AddFieldValue("n", number);
     insert.AddFieldValue("filler", std::string(10000, 'x'));
     return db.InsertRecord(insert);
+  }
+
+  // 2 and all from 20 on. The cache is small, so that rows reach the file before the commit.
+  static bool InsertMany(SqliteDB& db) {
+    std::vector<SqliteValueList> records(kMany);
+    for (int i = 0; i < kMany; ++i) {
+      records[static_cast<size_t>(i)].AddValue("n", i == 0 ? 2 : 20 + i);
+      records[static_cast<size_t>(i)].AddValue("filler", std::string(10000, 'x'));
+    }
+    return db.Exec("PRAGMA cache_size=5") && db.InsertRecords(kTable, records);
+  }
+
+  // Sweeps an operation that stores what InsertMany does and `more` rows, or nothing.
+  void SweepMany(const std::function<bool()>& operation, size_t more) const {
+    bool sawRows = false;
+    bool sawNone = false;
+    const std::vector<int> kills =
+        Tracer::Sweep([this] { Prepare(); },
+                      [&] {
+                        if (operation()) WriteText(Ack(2), "");
+                      },
+                      [&](const Moment& moment) {
+                        ExpectNextInsertSucceeds(moment);
+                        const size_t rows = Select("SELECT n FROM t WHERE n = 2 OR n > 4").size();
+                        EXPECT_EQ(rows, IsThere(2) ? kMany + more : 0U) << moment;
+                        (rows > 0 ? sawRows : sawNone) = true;
+                      });
+    ASSERT_EQ(kills.size(), 1U);
+    EXPECT_GT(kills[0], 50);
+    EXPECT_TRUE(sawRows && sawNone);
+    RecordProperty("kills", kills[0]);
   }
 
   // Tells by a file that the insert succeeded.
@@ -96,6 +133,9 @@ class KilledInsertTest : public CleanTest, public testing::WithParamInterface<bo
     LogCapture::Clear();
   }
 
+  static constexpr int kMany = 12;
+  static inline const SqliteTableHandler kTable{"t", "n INTEGER UNIQUE, filler TEXT"};
+
   std::string path;
   std::error_code copyError;
 };
@@ -117,6 +157,25 @@ TEST_P(KilledInsertTest, LeavesTheRowOrNotAndTheDatabaseSound) {
   EXPECT_GT(kills[0], 50);
   EXPECT_TRUE(sawRow && sawNone);
   RecordProperty("kills", kills[0]);
+}
+
+TEST_P(KilledInsertTest, OfManyRecordsLeavesAllOrNone) {
+  SweepMany(
+      [this] {
+        SqliteDB db(path, 0, "");
+        return InsertMany(db);
+      },
+      0);
+}
+
+TEST_P(KilledInsertTest, InATransactionLeavesAllOrNone) {
+  SweepMany(
+      [this] {
+        SqliteDB db(path, 0, "");
+        SqliteTransaction transaction(db);
+        return Insert(db, 10) && InsertMany(db) && Insert(db, 11) && transaction.Commit();
+      },
+      2);
 }
 
 // A sample of the pairs of a kill and a kill of the insert after it, which rolls the first one

@@ -216,6 +216,46 @@ TEST_F(SqliteDBProcessTest, EightWritersLoseNoRow) {
       IsEmpty());
 }
 
+// A child that inserts 20 times 10 rows at once.
+pid_t StartBulkWriter(const std::string& path, int number) {
+  const pid_t child = fork();
+  if (child != 0) return child;
+  bool isGood = true;
+  {
+    SqliteDB db(path, 1000, "writer");
+    isGood = db.Exec("PRAGMA synchronous=OFF");
+    const SqliteTableHandler table("shared", "writer INTEGER, n INTEGER, UNIQUE (writer, n)");
+    for (int round = 0; round < 20; ++round) {
+      Records rows(10);
+      for (int i = 0; i < 10; ++i) {
+        rows[static_cast<size_t>(i)].AddValue("writer", number);
+        rows[static_cast<size_t>(i)].AddValue("n", 10 * round + i);
+      }
+      isGood = db.InsertRecords(table, rows) && isGood;
+    }
+  }
+  _exit(isGood ? 0 : 1);
+}
+
+TEST_F(SqliteDBProcessTest, WritersOfManyRecordsLoseNoneAndShowNoHalf) {
+  ASSERT_TRUE(db->CreateTable(
+      SqliteTableHandler("shared", "writer INTEGER, n INTEGER, UNIQUE (writer, n)")));
+  db = std::make_unique<SqliteDB>(path, 1000, "reader");
+  std::vector<pid_t> writers;
+  for (int number = 0; number < 4; ++number) writers.push_back(StartBulkWriter(path, number));
+  int count = 0;
+  while (count < 800) {
+    ASSERT_TRUE(db->GetCount(SqliteTableHandler("shared", ""), count));
+    ASSERT_EQ(count % 10, 0);
+  }
+  for (const pid_t writer : writers) {
+    int status = -1;
+    EXPECT_EQ(waitpid(writer, &status, 0), writer);
+    EXPECT_EQ(status, 0);
+  }
+  LogCapture::Clear();
+}
+
 TEST_F(SqliteDBProcessTest, AReadOnlyFileIsReadAndNotWritten) {
   ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
   ASSERT_EQ(chmod(path.c_str(), 0444), 0);
