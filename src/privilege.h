@@ -8,6 +8,8 @@
 
 #include <sys/types.h>
 
+#include "log.h"
+
 namespace KeloDRCore {
 
 // Enters on construction and leaves on destruction, an exception's way out included. A failed step
@@ -41,6 +43,6 @@ class PrivilegeBracket {
 
 // Opens a bracket that lasts to the end of the enclosing scope.
 #define KELODR_PRIVILEGED() \
-  const ::KeloDRCore::PrivilegeBracket privilegeBracket(__FILE_NAME__, __LINE__)
+  const ::KeloDRCore::PrivilegeBracket privilegeBracket(KELODR_FILE_NAME, __LINE__)
 
 #endif  // KELODRCORE_SRC_PRIVILEGE_H_
