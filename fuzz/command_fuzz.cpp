@@ -23,22 +23,22 @@ sqlite3* Database() {
 
 std::string WithoutNul(const std::string& text) { return text.substr(0, text.find('\0')); }
 
-SqliteValue TakeValue(Input& input) {
-  switch (input.Byte() % 4) {
+SqliteValue TakeValue(FuzzedDataProvider& input) {
+  switch (input.ConsumeIntegralInRange(0, 3)) {
     case 0:
-      return input.Number<int>();
+      return input.ConsumeIntegral<int>();
     case 1:
-      return (input.Byte() & 1) != 0;
+      return input.ConsumeBool();
     case 2:
-      return input.Number<unsigned int>();
+      return input.ConsumeIntegral<unsigned int>();
     default:
-      return WithoutNul(input.Text());
+      return WithoutNul(input.ConsumeRandomLengthString(255));
   }
 }
 
-SqliteCondition TakeCondition(Input& input, int depth) {
-  const char* const column = (input.Byte() & 1) != 0 ? "a" : "b";
-  switch (depth > 0 ? input.Byte() % 7 : input.Byte() % 4) {
+SqliteCondition TakeCondition(FuzzedDataProvider& input, int depth) {
+  const char* const column = input.ConsumeBool() ? "a" : "b";
+  switch (input.ConsumeIntegralInRange(0, depth > 0 ? 6 : 3)) {
     case 0:
       return SqliteEqual(column, TakeValue(input));
     case 1:
@@ -46,9 +46,10 @@ SqliteCondition TakeCondition(Input& input, int depth) {
     case 2:
       return SqliteIsNull(column);
     case 3:
-      return SqliteNotIn(column, std::vector<SqliteValue>{TakeValue(input), TakeValue(input)});
+      return SqliteNotIn(column, {TakeValue(input), TakeValue(input)});
     case 4:
-      return SqliteIn(column, std::vector<SqliteValue>(input.Byte() % 5, TakeValue(input)));
+      return SqliteIn(
+          column, std::vector<SqliteValue>(input.ConsumeIntegralInRange(0U, 4U), TakeValue(input)));
     case 5:
       return SqliteAnd(TakeCondition(input, depth - 1), TakeCondition(input, depth - 1));
     default:
@@ -70,7 +71,7 @@ void CheckStatement(const SqliteCommand& command) {
 }
 
 template <typename Command>
-Command Filled(Input& input) {
+Command Filled(FuzzedDataProvider& input) {
   Command command;
   command.SetTable(SqliteTableHandler("job", ""));
   SqliteValueList values;
@@ -83,7 +84,7 @@ Command Filled(Input& input) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  Input input(data, size);
+  FuzzedDataProvider input(data, size);
   CheckStatement(Filled<InsertCommand>(input));
   UpdateCommand update = Filled<UpdateCommand>(input);
   update.SetCondition(TakeCondition(input, 4));
@@ -96,7 +97,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   select.SetTable(SqliteTableHandler("job", ""));
   select.AddField("a");
   select.AddOrderField("b");
-  select.SetLimit(input.Number<int>(), input.Number<int>());
+  select.SetLimit(input.ConsumeIntegral<int>(), input.ConsumeIntegral<int>());
   select.SetCondition(TakeCondition(input, 4));
   CheckStatement(select);
   return 0;

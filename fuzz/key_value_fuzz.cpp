@@ -39,8 +39,9 @@ void Check(const std::string& path, const std::string& text) {
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static const int fd = memfd_create("fuzz", MFD_CLOEXEC);
   static const std::string path = "/proc/self/fd/" + std::to_string(fd);
-  Require(ftruncate(fd, 0) == 0 && pwrite(fd, data, size, 0) == ssize_t(size), "the file is there");
-  const std::string text(reinterpret_cast<const char*>(data), size);
+  const std::string text = FuzzedDataProvider(data, size).ConsumeRemainingBytesAsString();
+  Require(ftruncate(fd, 0) == 0 && pwrite(fd, text.data(), size, 0) == ssize_t(size),
+          "the file is there");
   Check<std::string>(path, text);
   Check<int>(path, text);
   Check<double>(path, text);

@@ -46,13 +46,13 @@ void CheckText(std::string text) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  Input input(data, size);
-  CheckNumber(input.Number<int>());
-  CheckNumber(input.Number<unsigned int>());
-  CheckNumber(input.Number<long>());
-  CheckNumber(input.Number<unsigned long>());
-  CheckNumber(input.Number<long long>());
-  CheckNumber(input.Number<unsigned long long>());
-  CheckText(input.Rest());
+  FuzzedDataProvider input(data, size);
+  CheckNumber(input.ConsumeIntegral<int>());
+  CheckNumber(input.ConsumeIntegral<unsigned int>());
+  CheckNumber(input.ConsumeIntegral<long>());
+  CheckNumber(input.ConsumeIntegral<unsigned long>());
+  CheckNumber(input.ConsumeIntegral<long long>());
+  CheckNumber(input.ConsumeIntegral<unsigned long long>());
+  CheckText(input.ConsumeRemainingBytesAsString());
   return 0;
 }

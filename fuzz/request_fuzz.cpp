@@ -3,18 +3,33 @@
 #include <kelodrcore/json_value.h>
 #include <kelodrcore/request.h>
 
+#include <algorithm>
+#include <string>
+#include <vector>
+
 #include "fuzz.h"
+
+namespace {
 
 using KeloDRCore::Request;
 namespace JsonValue = KeloDRCore::JsonValue;
 
+// Whether there is a member to merge.
+bool HasParameter(const Json::Value& members) {
+  if (!members.isObject()) return members.isArray() && !members.empty();
+  const std::vector<std::string> names = members.getMemberNames();
+  return std::any_of(names.begin(), names.end(), Request::isValidKey);
+}
+
+}  // namespace
+
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  Input input(data, size);
-  const std::string key = input.Text();
-  const std::string merged = input.Text();
+  FuzzedDataProvider input(data, size);
+  const std::string key = input.ConsumeRandomLengthString();
+  const std::string merged = input.ConsumeRandomLengthString();
   Json::Value document;
   Json::Value members;
-  if (!JsonValue::fromString(document, input.Rest())) return 0;
+  if (!JsonValue::fromString(document, input.ConsumeRemainingBytesAsString())) return 0;
   JsonValue::fromString(members, merged);
 
   Request request(document);
@@ -25,7 +40,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const bool isAdded = request.addParam(key, members);
   Require(isAdded == (hasRoom && Request::isValidKey(key)), "a good key is added");
   if (isAdded) Require(request.getParams()[key] == members, "with its value");
-  Require(request.addParam(members) == hasRoom, "members are merged into an object");
+  const bool isMerged = hasRoom || !HasParameter(members);
+  Require(request.addParam(members) == isMerged, "members are merged into an object");
   Require(request.toJson().isObject(), "a call stays an object");
   request.clear();
   Require(!request.isValid(), "a cleared call is not valid");

@@ -44,7 +44,7 @@ void AskEverything(const Response& reply) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  const std::string text(reinterpret_cast<const char*>(data), size);
+  const std::string text = FuzzedDataProvider(data, size).ConsumeRemainingBytesAsString();
   Json::Value document = "untouched";
   if (!JsonValue::fromString(document, text)) {
     Require(document == "untouched", "a text that does not parse changes nothing");
