@@ -10,8 +10,8 @@
 
 namespace KeloDRCore {
 
-/// A table's name and the text that defines its columns: a plain value that checks nothing. What an
-/// empty field means is told by its users, `SqliteCommand` and `SqliteDB`.
+/// A table's name and the text that defines its columns: a plain value that checks nothing.
+/// `SqliteCommand` and `SqliteDB` say what an empty field means to them.
 class KELODR_EXPORT SqliteTableHandler {
  public:
   /// Both fields empty.
@@ -20,8 +20,8 @@ class KELODR_EXPORT SqliteTableHandler {
   /// Copies the two texts.
   SqliteTableHandler(const std::string& name, const std::string& columns);
 
-  /// @{
   /// Copies both fields.
+  /// @{
   SqliteTableHandler(const SqliteTableHandler& other);
   SqliteTableHandler& operator=(const SqliteTableHandler& other);
   /// @}

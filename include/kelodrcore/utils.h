@@ -1,5 +1,8 @@
 /// @file
 /// Small helpers: a random back-off, UUIDs, and the test for paths on a data volume.
+///
+/// Deliberate, and frozen because callers rely on it: a period of equal bounds or one that starts
+/// at 0 is refused, a long one wraps at 32 bits, and a volume path is known by its prefix alone.
 
 #ifndef KELODRCORE_UTILS_H_
 #define KELODRCORE_UTILS_H_
@@ -12,10 +15,8 @@ namespace KeloDRCore {
 
 /// Sleeps for a random number of milliseconds, drawn uniformly from the closed range [min, max].
 /// Blocks the calling thread; a signal may end the sleep early. The period is kept to 32 bits of
-/// microseconds: one above 4,294,967 ms (71 minutes) begins again at 0.
-///
-/// False, at once and with a line at ERR, unless 0 < min < max: equal bounds and a period that
-/// starts at 0 are refused on purpose.
+/// microseconds: one above 4,294,967 ms (71 minutes) begins again at 0. False, at once and with a
+/// line at ERR, unless 0 < min < max.
 KELODR_EXPORT bool RandomSleepInMSec(unsigned int min, unsigned int max);
 
 /// A new UUID as "/usr/bin/uuidgen" prints it, without surrounding white space. Empty when the tool
@@ -25,8 +26,7 @@ KELODR_EXPORT std::string GenerateUUID();
 /// Tests of texts.
 namespace Validator {
 
-/// True when `path` begins with "/volume". A bare prefix test, deliberately: nothing is normalised
-/// and nothing looked up.
+/// True when `path` begins with "/volume". The path is neither normalised nor looked up.
 [[nodiscard]] KELODR_EXPORT bool IsVolPath(const std::string& path);
 
 }  // namespace Validator
