@@ -12,13 +12,17 @@
 //
 // So only the holder of the lock renames or removes the name, and nothing is ever written into a
 // file that was found. Nobody waits in flock: anybody who may read the temporary could lock it.
-// A link, queue or the like at the name was planted; it cannot be locked, so the directory is
-// locked while it is removed, lest the second of two writers removes the temporary of the first.
+//
+// A temporary is the writer's until it gets the owner of the document. Anything else at its name, a
+// link, a queue, a directory or a stranger's file, was planted: its lock says nothing. It is
+// removed under a lock of the directory, lest the second of two writers removes the temporary of
+// the first. A stranger can hold that lock too, so a writer has patience for it, but not for ever.
 
 #include "document_file.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -28,6 +32,7 @@
 #include <utility>
 
 #include "json_text.h"
+#include "posix/access.h"
 #include "posix/descriptor.h"
 #include "posix/file_io.h"
 #include "posix/retry.h"
@@ -38,9 +43,9 @@ namespace {
 
 constexpr int kMaxLinks = 40;                // as many as the kernel follows
 constexpr int kMaxAttempts = 60000;          // a minute of pauses
+constexpr int kPatience = 1000;              // a second of them
 constexpr useconds_t kPause = 1000;          // microseconds
 constexpr size_t kMaxNameInTemporary = 100;  // some file systems allow 143 bytes a name
-constexpr mode_t kPermissionBits = 07777;
 
 using Posix::Descriptor;
 using Posix::Fail;
@@ -71,10 +76,6 @@ bool SetMode(const Descriptor& file, mode_t mode) {
   return Retry([&] { return fchmod(file.Get(), mode); }) == 0;
 }
 
-bool SetOwner(const Descriptor& file, uid_t uid, gid_t gid) {
-  return Retry([&] { return fchown(file.Get(), uid, gid); }) == 0;
-}
-
 // C strings end at the first NUL byte: such a path would name another file.
 bool IsPath(const std::string& path) {
   return !path.empty() && path.find('\0') == std::string::npos;
@@ -86,13 +87,57 @@ struct Place {
   std::string name;
 };
 
+std::string TemporaryName(const std::string& name) {
+  size_t length = name.size();
+  if (length > kMaxNameInTemporary) {
+    length = kMaxNameInTemporary;  // not within a UTF-8 character, which some file systems refuse
+    while (length > 1 && (static_cast<unsigned char>(name[length]) & 0xC0) == 0x80) --length;
+  }
+  return "." + name.substr(0, length) + ".kelodr-" + std::to_string(geteuid());
+}
+
+// To a name that is free: nobody can guess it and use it first.
+bool MoveAway(int directory, const std::string& name) {
+  unsigned long long random = 0;
+  if (Retry([&] { return getrandom(&random, sizeof random, 0); }) < 0) return false;
+  const std::string free = TemporaryName(name) + "-" + std::to_string(random);
+  return Retry([&] { return renameat(directory, name.c_str(), directory, free.c_str()); }) == 0 ||
+         errno == ENOENT;
+}
+
+bool IsDecoy(const struct stat& link, const struct stat& directory) {
+  constexpr mode_t kShared = S_ISVTX | S_IWOTH;
+  return (directory.st_mode & kShared) == kShared && link.st_uid != geteuid() &&
+         link.st_uid != directory.st_uid;
+}
+
+// Where the link at `place` leads; nothing when no link is there. As fs.protected_symlinks has it,
+// and without it too, a stranger's link in a directory like /tmp is refused. What is asked is open:
+// nothing takes its place in between.
 bool ReadLink(const Place& place, std::string& target) {
+  target.clear();
+  const Descriptor link = OpenAt(place.directory.Get(), place.name, O_PATH | O_NOFOLLOW);
+  if (!link.IsOpen()) return errno == ENOENT;
+  struct stat found = {};
+  struct stat directory = {};
+  if (!StatFile(link, found) || !StatFile(place.directory, directory)) return false;
+  if (!S_ISLNK(found.st_mode)) return true;
+  if (IsDecoy(found, directory)) return Fail(EACCES);
   char buffer[PATH_MAX];
-  const ssize_t size = Retry(
-      [&] { return readlinkat(place.directory.Get(), place.name.c_str(), buffer, sizeof buffer); });
+  const ssize_t size = Retry([&] { return readlinkat(link.Get(), "", buffer, sizeof buffer); });
   if (size < 0) return false;
   target.assign(buffer, static_cast<size_t>(size));
   return true;
+}
+
+// A stranger's directory at the name of a believed document would stop every write.
+bool ClearName(const Place& place) {
+  struct stat found = {};
+  const int directory = place.directory.Get();
+  if (!StatAt(directory, place.name, AT_SYMLINK_NOFOLLOW, found)) return errno == ENOENT;
+  if (!S_ISDIR(found.st_mode)) return true;
+  found.st_mode = S_IFREG;
+  return Posix::IsBelieved(found, directory) || MoveAway(directory, place.name);
 }
 
 // The place at the end of the links that begin with `path`, or of `path` itself.
@@ -104,26 +149,31 @@ bool Locate(std::string path, Whose whose, Place& place) {
     place.directory = std::move(directory);
     place.name = path.substr(path.rfind('/') + 1);
     if (place.name.empty()) return Fail(EISDIR);
-    if (whose == Whose::kBelieved) return true;
-    if (!ReadLink(place, path)) return errno == EINVAL || errno == ENOENT;
+    if (whose == Whose::kBelieved) return ClearName(place);
+    if (!ReadLink(place, path)) return false;
+    if (path.empty()) return true;
     base = place.directory.Get();
   }
   // Only links that became a loop just now: the kernel refused any other before.
   return Fail(ELOOP);
 }
 
-// The state of the file that the new one takes its owner and mode from; `state` comes in empty and
-// stays so when there is none. False for what must not be replaced by a file.
-using State = std::optional<struct stat>;
-bool LookAt(const Place& place, Whose whose, State& state) {
+bool Counts(const struct stat& found, const Place& place, Whose whose) {
+  if (whose == Whose::kBelieved) return Posix::IsBelieved(found, place.directory.Get());
+  return S_ISREG(found.st_mode);
+}
+
+// Opens the file that the new one takes its access from; `old` comes in closed and stays so when
+// there is none. False for what must not be replaced by a file.
+bool OpenOld(const Place& place, Whose whose, Descriptor& old) {
+  old = OpenAt(place.directory.Get(), place.name, O_PATH | O_NOFOLLOW);
+  if (!old.IsOpen()) return errno == ENOENT;
   struct stat found = {};
-  const int directory = place.directory.Get();
-  if (!StatAt(directory, place.name, AT_SYMLINK_NOFOLLOW, found)) return errno == ENOENT;
+  if (!StatFile(old, found)) return false;
+  if (Counts(found, place, whose)) return true;
+  old.Close();
   if (S_ISDIR(found.st_mode)) return Fail(EISDIR);
-  if (whose == Whose::kBelieved && !Posix::IsBelieved(found, directory)) return true;
-  if (!S_ISREG(found.st_mode)) return Fail(EINVAL);
-  state = found;
-  return true;
+  return whose == Whose::kBelieved || Fail(EINVAL);
 }
 
 // The kernel looks first: it refuses what is not to be replaced before anything is touched, and
@@ -134,20 +184,12 @@ bool IsReplaceable(const std::string& path) {
   return S_ISREG(found.st_mode) || Fail(S_ISDIR(found.st_mode) ? EISDIR : EINVAL);
 }
 
-std::string TemporaryName(const std::string& name) {
-  size_t length = name.size();
-  if (length > kMaxNameInTemporary) {
-    length = kMaxNameInTemporary;  // not within a UTF-8 character, which some file systems refuse
-    while (length > 1 && (static_cast<unsigned char>(name[length]) & 0xC0) == 0x80) --length;
-  }
-  return "." + name.substr(0, length) + ".kelodr-" + std::to_string(geteuid());
-}
-
 // The temporary of one writer: from Claim() to Publish() it is locked and under its name; if
 // Publish() does not come, it is removed.
 class Temporary {
  public:
-  explicit Temporary(const Place& where) : place(where), name(TemporaryName(where.name)) {}
+  Temporary(const Place& where, uid_t ownerOfDocument)
+      : place(where), name(TemporaryName(where.name)), owner(ownerOfDocument) {}
   Temporary(const Temporary&) = delete;
   Temporary& operator=(const Temporary&) = delete;
   ~Temporary() {
@@ -162,8 +204,9 @@ class Temporary {
   enum class Try { kDone, kAgain, kBusy, kFailed };
 
   Try Create(mode_t mode);
-  Try RemoveFound() const;
-  Try RemovePlanted() const;
+  Try RemoveFound(int attempt) const;
+  bool IsPlanted(const struct stat& found) const;
+  Try RemovePlanted(int attempt) const;
   Try RemoveLeftover() const;
   Try Find(struct stat& found) const;
   Try Lock(const Descriptor& opened) const;
@@ -172,6 +215,7 @@ class Temporary {
 
   const Place& place;
   const std::string name;
+  const uid_t owner;
   Descriptor file;
   bool published = false;
 };
@@ -207,11 +251,15 @@ Temporary::Try Temporary::Create(mode_t mode) {
   return locked;
 }
 
-Temporary::Try Temporary::RemoveFound() const {
+bool Temporary::IsPlanted(const struct stat& found) const {
+  return !S_ISREG(found.st_mode) || (found.st_uid != geteuid() && found.st_uid != owner);
+}
+
+Temporary::Try Temporary::RemoveFound(int attempt) const {
   struct stat found = {};
   const Try result = Find(found);
   if (result != Try::kDone) return result;
-  return S_ISREG(found.st_mode) ? RemoveLeftover() : RemovePlanted();
+  return IsPlanted(found) ? RemovePlanted(attempt) : RemoveLeftover();
 }
 
 Temporary::Try Temporary::RemoveLeftover() const {
@@ -223,21 +271,26 @@ Temporary::Try Temporary::RemoveLeftover() const {
   return UnlinkAt(Directory(), name) ? Try::kAgain : Try::kFailed;
 }
 
-Temporary::Try Temporary::RemovePlanted() const {
-  if (!TryLock(place.directory)) return errno == EWOULDBLOCK ? Try::kBusy : Try::kFailed;
+Temporary::Try Temporary::RemovePlanted(int attempt) const {
+  const bool locked = TryLock(place.directory);
+  if (!locked && errno != EWOULDBLOCK) return Try::kFailed;
+  if (!locked && attempt < kPatience) return Try::kBusy;
   struct stat found = {};
   Try result = Find(found);
-  if (result == Try::kDone) {
-    result = S_ISREG(found.st_mode) || UnlinkAt(Directory(), name) ? Try::kAgain : Try::kFailed;
+  if (result == Try::kDone && IsPlanted(found)) {
+    const bool isGone =
+        S_ISDIR(found.st_mode) ? MoveAway(Directory(), name) : UnlinkAt(Directory(), name);
+    if (!isGone) result = Try::kFailed;
   }
-  return Unlock(place.directory) ? result : Try::kFailed;
+  if (result == Try::kDone) result = Try::kAgain;
+  return !locked || Unlock(place.directory) ? result : Try::kFailed;
 }
 
 bool Temporary::Claim(mode_t mode) {
   for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
     Try result = Create(mode);
     if (result == Try::kDone) return true;
-    if (result == Try::kAgain) result = RemoveFound();
+    if (result == Try::kAgain) result = RemoveFound(attempt);
     if (result == Try::kFailed) return false;
     if (result == Try::kBusy) usleep(kPause);
   }
@@ -253,39 +306,36 @@ bool Temporary::Publish() {
   return published;
 }
 
-// A write clears the set-id bits, and so does a change of owner: the mode comes last. The owner's
-// read bit stays set until the file is published, because another writer of the same user must be
-// able to open the temporary.
-bool TakeOver(const Descriptor& file, const struct stat& old) {
-  struct stat created = {};
-  if (!StatFile(file, created)) return false;
-  const bool sameOwner = created.st_uid == old.st_uid && created.st_gid == old.st_gid;
-  if (!sameOwner && !SetOwner(file, old.st_uid, old.st_gid)) return false;
-  return SetMode(file, (old.st_mode & kPermissionBits) | S_IRUSR);
+// The owner's read bit stays set until the file is published: another writer of the same user must
+// be able to open the temporary.
+constexpr mode_t kReadByOwner = S_IRUSR;
+
+bool RemoveReadBit(const Descriptor& file, mode_t mode) {
+  return (mode & kReadByOwner) != 0 || (SetMode(file, mode & Posix::kModeBits) && Sync(file));
 }
 
-bool TakeReadBit(const Descriptor& file, const State& old) {
-  if (!old || (old->st_mode & S_IRUSR) != 0) return true;
-  return SetMode(file, old->st_mode & kPermissionBits) && Sync(file);
-}
-
-// A new file gets its mode from the kernel (umask, default ACL); the new text of a file that was
-// there is nobody else's until its mode is taken over.
-mode_t ModeOfTemporary(const State& old) { return old ? 0600 : 0666; }
-
+// A new file gets its mode from the kernel (umask, default ACL). What replaces a file is nobody
+// else's until it gets the access of that file.
 bool Replace(const Place& place, Whose whose, const std::string& text) {
-  State before;
-  State old;
-  if (!LookAt(place, whose, before)) return false;
-  Temporary temporary(place);
-  if (!temporary.Claim(ModeOfTemporary(before))) return false;
+  Descriptor before;
+  struct stat state = {};
+  state.st_uid = geteuid();
+  state.st_mode = 0666;
+  if (!OpenOld(place, whose, before) || (before.IsOpen() && !StatFile(before, state))) return false;
+  Temporary temporary(place, state.st_uid);
+  if (!temporary.Claim(before.IsOpen() ? 0600 : 0666)) return false;
   // While this writer waited for another, the file may have come into being, or changed.
-  if (!LookAt(place, whose, old)) return false;
-  if (!old) old = before;
-  if (!Posix::WriteAll(temporary.File().Get(), text)) return false;
-  if (old && !TakeOver(temporary.File(), *old)) return false;
-  if (!Sync(temporary.File()) || !temporary.Publish()) return false;
-  return TakeReadBit(temporary.File(), old) && Sync(place.directory);
+  Descriptor old;
+  if (!OpenOld(place, whose, old)) return false;
+  if (!old.IsOpen()) old = std::move(before);
+  const Descriptor& file = temporary.File();
+  if (!Posix::WriteAll(file.Get(), text)) return false;
+  if (old.IsOpen() &&
+      !(StatFile(old, state) && Posix::CopyAccess(old.Get(), file.Get(), kReadByOwner))) {
+    return false;
+  }
+  return Sync(file) && temporary.Publish() && RemoveReadBit(file, state.st_mode) &&
+         Sync(place.directory);
 }
 
 Descriptor OpenDocument(const std::string& path, Whose whose) {

@@ -40,19 +40,24 @@ KELODR_EXPORT bool fromFile(Json::Value& value, const std::string& path);
 /// or the new one, whole, even when the writer is killed or the disk is full.
 ///
 /// The new document goes to a temporary beside the file, which is synced, renamed over the file and
-/// made durable with a sync of the directory. A file that was there keeps its mode, set-id bits
-/// included, and its owner; a new one gets its mode from the umask. A symbolic link is followed:
-/// the file that it names is replaced, or created, and the link stays.
+/// made durable with a sync of the directory. A new file gets its mode from the umask. A file that
+/// was there keeps its mode, set-id bits included, its owner, its POSIX ACL and its attributes
+/// `user.*` and `security.*`.
+///
+/// A symbolic link is followed: the file that it names is replaced, or created, and the link stays.
+/// In a directory like /tmp, which is sticky and writable by all, only a link of the effective user
+/// or of the directory's owner is followed (`EACCES`).
 ///
 /// Writers of one file wait for each other, a minute at most (`EBUSY`); each leaves its whole
 /// document. Killed writers of one user leave at most one temporary (".NAME.kelodr-UID", a long
-/// NAME cut; UID is the writer's effective user id), which that user's next write removes.
+/// NAME cut; UID is the writer's effective user id), which that user's next write removes. What
+/// another user put at its name is removed; a directory is moved away, to a longer name.
 ///
 /// True once the document is on the disk. False with `errno` telling why, and with the old document
-/// in place: no such directory, a path that names something other than a regular file, an owner
-/// that this process may not give the file, any failed call. The one exception: when only a step
-/// after the rename fails (the sync of the directory), the new document is in place and the result
-/// is false all the same.
+/// in place: no such directory, a path that names something other than a regular file, an owner or
+/// attribute that this process may not set, any failed call. There is one exception: when only a
+/// step after the rename fails (the sync of the directory), the new document is in place and the
+/// result is false all the same.
 KELODR_EXPORT bool toFile(const Json::Value& value, const std::string& path);
 
 }  // namespace KeloDRCore::JsonValue

@@ -129,6 +129,16 @@ FAULT_CALL(int, flock, -1, (int fd, int operation), (fd, operation), EINTR, EAGA
 FAULT_CALL(int, fchmod, -1, (int fd, mode_t mode), (fd, mode), EINTR, EIO, EACCES)
 FAULT_CALL(int, fchown, -1, (int fd, uid_t uid, gid_t gid), (fd, uid, gid), EINTR, EIO, EACCES)
 
+FAULT_CALL(ssize_t, listxattr, -1, (const char* path, char* list, size_t size), (path, list, size),
+           EINTR, EIO, EACCES, ENOMEM)
+FAULT_CALL(ssize_t, getxattr, -1, (const char* path, const char* name, void* value, size_t size),
+           (path, name, value, size), EINTR, EIO, EACCES, ENOMEM)
+FAULT_CALL(int, setxattr, -1,
+           (const char* path, const char* name, const void* value, size_t size, int flags),
+           (path, name, value, size, flags), EINTR, EIO, ENOSPC, EACCES, ENOMEM)
+FAULT_CALL(int, removexattr, -1, (const char* path, const char* name), (path, name), EINTR, EIO,
+           EACCES, ENOMEM)
+
 FAULT_CALL(int, dup2, -1, (int from, int to), (from, to), EINTR, EMFILE)
 FAULT_CALL(int, dup3, -1, (int from, int to, int flags), (from, to, flags), EINTR, EMFILE)
 FAULT_CALL(int, pipe2, -1, (int* ends, int flags), (ends, flags), EMFILE, ENOMEM)

@@ -43,13 +43,6 @@ TEST_F(JsonValueFileTest, APlantedLinkOrQueueIsTakenAwayAndNotFollowed) {
   EXPECT_EQ(NamesIn(dir), (Names{"a", "other"}));
 }
 
-TEST_F(JsonValueFileTest, APlantedDirectoryIsAFailure) {
-  WriteText(Path("a"), "1");
-  ASSERT_EQ(mkdir(Path(TemporaryOf("a")).c_str(), 0755), 0);
-  ExpectNotWritten(Path("a"), EISDIR);
-  EXPECT_EQ(ReadText(Path("a")), "1");
-}
-
 // Returns when somebody has opened and closed the file so many times without writing.
 void WaitUntilClosed(const std::string& path, int times) {
   const int events = inotify_init1(IN_CLOEXEC);
