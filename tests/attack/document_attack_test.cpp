@@ -1,0 +1,275 @@
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+
+#include "attack/attack.h"
+#include "kelodrcore/json_value.h"
+
+using KeloDRCore::JsonValue::toFile;
+
+namespace {
+
+constexpr char kPath[] = "/tmp/doc";
+constexpr char kTemporary[] = "/tmp/.doc.kelodr-0";
+constexpr char kAccess[] = "system.posix_acl_access";
+constexpr char kDefault[] = "system.posix_acl_default";
+
+// An access control list as the kernel takes it.
+struct AclEntry {
+  uint16_t tag;
+  uint16_t permissions;
+  uint32_t id;
+};
+struct Acl {
+  uint32_t version = 2;
+  AclEntry entries[5];
+};
+constexpr uint32_t kNobody = UINT32_MAX;
+constexpr uint16_t kRead = 4;
+constexpr uint16_t kReadWrite = 6;
+
+// The owner reads and writes, and the user may do what `permissions` say; nobody else anything.
+Acl AclForUser(uint16_t permissions) {
+  return {2,
+          {{0x01, kReadWrite, kNobody},
+           {0x02, permissions, kUser},
+           {0x04, 0, kNobody},
+           {0x10, permissions, kNobody},
+           {0x20, 0, kNobody}}};
+}
+
+std::string Attribute(const std::string& path, const char* name) {
+  char value[256];
+  const ssize_t size = getxattr(path.c_str(), name, value, sizeof value);
+  return size < 0 ? "none" : std::string(value, static_cast<size_t>(size));
+}
+
+template <typename T>
+void SetAttribute(const std::string& path, const char* name, const T& value) {
+  ASSERT_EQ(setxattr(path.c_str(), name, &value, sizeof value, 0), 0) << name;
+}
+
+void ExpectRefused(const std::string& path, int error) {
+  errno = 0;
+  EXPECT_FALSE(toFile("new", path)) << path;
+  EXPECT_EQ(errno, error) << path;
+}
+
+void ExpectReplaced(const std::string& path) {
+  EXPECT_TRUE(toFile("new", path)) << path << ": " << strerror(errno);
+  EXPECT_EQ(ReadText(path), "\"new\"") << path;
+}
+
+// Whether the user can read the file, which he is not told by its mode alone.
+void ExpectReadableByUser(const std::string& path, bool isReadable) {
+  AsUser([&] { EXPECT_EQ(access(path.c_str(), R_OK) == 0, isReadable) << path; });
+}
+
+using DocumentAttackTest = AttackTest;
+
+TEST_F(DocumentAttackTest, AStrangersLinkInAStickyDirectoryIsNotFollowed) {
+  for (const char* target : {kSecret, "/tmp/safe/new"}) {
+    Attack([&] {
+      AsUser([&] { MakeLink(target, kPath); });
+      ExpectRefused(kPath, EACCES);
+      MakeLink(kPath, HomePath("first"));
+      ExpectRefused(HomePath("first"), EACCES);
+      EXPECT_TRUE(S_ISLNK(LookAt(kPath).st_mode));
+    });
+  }
+}
+
+TEST_F(DocumentAttackTest, LinksOfOnesOwnAndOfTheDirectorysOwnerAreFollowed) {
+  Attack([] {
+    WriteText(HomePath("target"), "old");
+    MakeLink(HomePath("target"), kPath);
+    ExpectReplaced(kPath);
+    MakeDir("/tmp/sticky", 01777, kUser);
+    AsUser([] { MakeLink(HomePath("target"), "/tmp/sticky/link"); });
+    ExpectReplaced("/tmp/sticky/link");
+    EXPECT_TRUE(S_ISLNK(LookAt(kPath).st_mode));
+    EXPECT_TRUE(S_ISLNK(LookAt("/tmp/sticky/link").st_mode));
+  });
+}
+
+TEST_F(DocumentAttackTest, LinksAreFollowedWhereADirectoryIsNotBothStickyAndOpenToAll) {
+  for (const mode_t mode : {0777U, 01775U}) {
+    Attack([&] {
+      MakeDir("/tmp/dir", 0777);
+      AsUser([] { MakeLink(HomePath("target"), "/tmp/dir/link"); });
+      ASSERT_EQ(chmod("/tmp/dir", mode), 0);
+      ExpectReplaced("/tmp/dir/link");
+      EXPECT_EQ(NamesIn(kHome), Names{"target"});
+    });
+  }
+}
+
+TEST_F(DocumentAttackTest, ASwappedLinkIsNotFollowed) {
+  Attack([] {
+    const UserLoop user([] {
+      symlink(kSecret, HomePath("link").c_str());
+      rename(HomePath("link").c_str(), kPath);
+      WriteText(HomePath("file"), "1");
+      rename(HomePath("file").c_str(), kPath);
+      unlink(kPath);
+    });
+    int written = 0;
+    Race([&] { written += toFile("new", kPath); });
+    EXPECT_GT(written, 0);
+  });
+}
+
+TEST_F(DocumentAttackTest, AccessListAndAttributesStay) {
+  Attack([] {
+    const std::string path = HomePath("doc");
+    WriteText(path, "old");
+    SetAttribute(path, kAccess, AclForUser(kRead));
+    SetAttribute(path, "user.note", 'u');
+    SetAttribute(path, "security.label", 's');
+    const std::string list = Attribute(path, kAccess);
+    ASSERT_NE(list, "none");
+    ExpectReplaced(path);
+    EXPECT_EQ(Attribute(path, kAccess), list);
+    EXPECT_EQ(Attribute(path, "user.note"), "u");
+    EXPECT_EQ(Attribute(path, "security.label"), "s");
+    ExpectFile(path, 0, 0640);
+    ExpectReadableByUser(path, true);
+  });
+}
+
+TEST_F(DocumentAttackTest, ADefaultAccessListDoesNotOpenAReplacedFile) {
+  for (const mode_t mode : {0600U, 0640U, 0660U}) {
+    Attack([&] {
+      MakeDir("/tmp/dir", 0755);
+      const std::string path = "/tmp/dir/doc";
+      WriteText(path, "old");
+      ASSERT_EQ(chmod(path.c_str(), mode), 0);
+      SetAttribute("/tmp/dir", kDefault, AclForUser(kReadWrite));
+      umask(0);
+      ExpectReplaced(path);
+      EXPECT_EQ(Attribute(path, kAccess), "none");
+      ExpectFile(path, 0, mode);
+      ExpectReadableByUser(path, false);
+    });
+  }
+}
+
+TEST_F(DocumentAttackTest, ANewFileGetsTheDefaultAccessList) {
+  Attack([] {
+    MakeDir("/tmp/dir", 0755);
+    SetAttribute("/tmp/dir", kDefault, AclForUser(kReadWrite));
+    WriteText("/tmp/dir/plain", "");
+    ExpectReplaced("/tmp/dir/doc");
+    EXPECT_EQ(Attribute("/tmp/dir/doc", kAccess), Attribute("/tmp/dir/plain", kAccess));
+    ExpectFile("/tmp/dir/doc", 0, LookAt("/tmp/dir/plain").st_mode & 07777);
+  });
+}
+
+TEST_F(DocumentAttackTest, AnAttributeThatCannotBeKeptIsAFailure) {
+  Attack([] {
+    const std::string path = HomePath("doc");
+    AsUser([&] { WriteText(path, "old"); });
+    SetAttribute(path, "security.label", 's');
+    AsUser([&] {
+      ExpectRefused(path, EPERM);
+      EXPECT_EQ(ReadText(path), "old");
+      EXPECT_EQ(NamesIn(kHome), Names{"doc"});
+    });
+  });
+}
+
+TEST_F(DocumentAttackTest, AClosedDocumentIsNeverOpenWhileItIsReplaced) {
+  Attack([] {
+    MakeDir("/tmp/dir", 0755);
+    SetAttribute("/tmp/dir", kDefault, AclForUser(kReadWrite));
+    const std::string path = "/tmp/dir/doc";
+    WriteText(path, "old");
+    ASSERT_EQ(removexattr(path.c_str(), kAccess), 0);
+    ASSERT_EQ(chmod(path.c_str(), 0660), 0);
+    umask(0);
+    {
+      const UserLoop user([] {
+        for (const char* name : {"/tmp/dir/.doc.kelodr-0", "/tmp/dir/doc"}) {
+          if (open(name, O_RDONLY) >= 0) WriteText(HomePath("opened"), name);
+        }
+      });
+      Race([&] { EXPECT_TRUE(toFile(std::string(100000, 'x'), path)); });
+    }
+    EXPECT_EQ(ReadText(HomePath("opened")), "");
+  });
+}
+
+TEST_F(DocumentAttackTest, APlantedTemporaryIsNoObstacle) {
+  const std::function<void()> plants[] = {
+      [] { WriteText(kTemporary, "planted"); },
+      [] { MakeQueue(kTemporary); },
+      [] { MakeLink(kSecret, kTemporary); },
+      [] { MakeLink(SafePath("new"), kTemporary); },
+      [] { MakeDir(kTemporary, 0777, kUser); },
+      [] {
+        MakeDir(kTemporary, 0700, kUser);
+        WriteText(std::string(kTemporary) + "/file", "");
+      },
+  };
+  for (const auto& plant : plants) {
+    Attack([&] {
+      for (int i = 0; i < 2; ++i) {
+        AsUser(plant);
+        ExpectReplaced(kPath);
+        ExpectFile(kPath, 0, 0644);
+        EXPECT_FALSE(IsThere(kTemporary));
+      }
+    });
+  }
+}
+
+TEST_F(DocumentAttackTest, ALockOnAPlantedTemporaryIsNotWaitedFor) {
+  Attack([] {
+    const UserLoop user([] {
+      const int fd = open(kTemporary, O_RDWR | O_CREAT, 0666);
+      ASSERT_EQ(flock(fd, LOCK_EX), 0);
+      WriteText(HomePath("locked"), "");
+      pause();
+    });
+    while (!IsThere(HomePath("locked"))) usleep(1000);
+    alarm(10);
+    ExpectReplaced(kPath);
+  });
+}
+
+TEST_F(DocumentAttackTest, TemporariesPlantedAgainAndAgainDoNoHarm) {
+  Attack([] {
+    {
+      const UserLoop user([] {
+        symlink(kSecret, kTemporary);
+        unlink(kTemporary);
+        mkdir(kTemporary, 0777);
+        rmdir(kTemporary);
+        WriteText(kTemporary, "planted");
+        unlink(kTemporary);
+      });
+      Race([] {
+        if (toFile("new", kPath)) {
+          EXPECT_EQ(ReadText(kPath), "\"new\"");
+        }
+      });
+    }
+    ExpectReplaced(kPath);
+    ExpectFile(kPath, 0, 0644);
+  });
+}
+
+TEST_F(DocumentAttackTest, OnlyARegularFileIsReplaced) {
+  Attack([] {
+    AsUser([] { MakeQueue(kPath); });
+    ExpectRefused(kPath, EINVAL);
+    EXPECT_TRUE(S_ISFIFO(LookAt(kPath).st_mode));
+  });
+}
+
+}  // namespace
