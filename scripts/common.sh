@@ -4,7 +4,7 @@
 
 script=$(basename "$0")
 
-help() { sed -n '2,/^[^#]/{/^#/s/^# \{0,1\}//p}' "$0"; }
+help() { sed -n '2,/^\([^#]\|$\)/{/^#/s/^# \{0,1\}//p}' "$0"; }
 
 # fail MESSAGE
 fail() {
