@@ -54,7 +54,7 @@ cmake -S tests/package/consumer -B "$packages/consumer" -DCMAKE_PREFIX_PATH="$ro
 cmake --build "$packages/consumer"
 LD_LIBRARY_PATH=$libdir$libraries "$packages/consumer/consumer"
 echo "== drctl of the packages"
-LD_LIBRARY_PATH=$libdir$libraries "$root/usr/bin/drctl" --db "$packages/registry.db" node count
+LD_LIBRARY_PATH=$libdir$libraries "$root/usr/bin/drctl" --db "$packages/registry.db" volume scan
 if [ "$preset" = package ]; then
   echo "== installed and removed"
   tests/package/dpkg.sh "$packages"/*.deb

@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <charconv>
+#include <cstddef>
 
 #include "paths.h"
 
@@ -137,7 +138,7 @@ bool Registry::GetNode(const std::string& name, SqliteValueList& node) {
 
 bool Registry::CountNodes(int& count) {
   count = 0;
-  return !IsExisted() || (CreateTable(kNodes) && GetCount(kNodes, count));
+  return CreateTable(kNodes) && GetCount(kNodes, count);
 }
 
 bool Registry::EachNode(const Query& query, const Take& take) {

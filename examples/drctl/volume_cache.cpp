@@ -32,16 +32,19 @@ Json::Value VolumeCache::GetInfo() const { return kName; }
 
 Json::Value VolumeCache::GetDefaultValue() const { return Json::arrayValue; }
 
+Json::Value VolumeCache::Scan() const {
+  isScanned = true;
+  return ToJson(ScanMounts(), VolumeColumns());
+}
+
 bool VolumeCache::GetUpdatedData(Json::Value& out) const {
   // Between this process's look at the file and its claim another one may have come and gone.
   if (!IsTimeout()) {
     out = GetCachedData();
     if (IsValidData(out)) return true;
   }
-  isScanned = true;
-  const Rows volumes = ScanMounts();
-  out = ToJson(volumes, VolumeColumns());
-  return !volumes.empty();
+  out = Scan();
+  return IsValidData(out);
 }
 
 bool VolumeCache::IsValidData(const Json::Value& data) const {
@@ -58,6 +61,8 @@ Json::Value VolumeCache::ReadVolumes(Source& source) {
   Json::Value volumes = Read();
   // Whoever loses the race for the claim is given what there was; the winner's data come.
   if (!isScanned && IsTimeout()) volumes = Read();
+  // Who can take no lock has no cache, but can see the mounts.
+  if (!IsValidData(volumes)) volumes = Scan();
   const long long fileTime = FileTime();
   if (isScanned) {
     source = Source::kScan;

@@ -28,6 +28,8 @@ class VolumeCache : public KeloDRCore::Cache {
   Json::Value ReadVolumes(Source& source);
 
  private:
+  Json::Value Scan() const;
+
   // The modification time of the cache file; -1 while there is none.
   long long FileTime() const;
 
