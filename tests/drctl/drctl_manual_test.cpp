@@ -5,7 +5,7 @@
 #include <sstream>
 
 #include "drctl/locks.h"
-#include "support/program.h"
+#include "drctl/program.h"
 
 namespace {
 
