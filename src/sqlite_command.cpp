@@ -14,7 +14,7 @@ bool SetField(SqliteValueList& list, const std::string& field, const SqliteValue
   return false;
 }
 
-// Checks the condition; what its text means to the command stays with the command.
+// Checks the condition, and leaves its text to the command's other SetCondition.
 template <typename Command>
 bool SetConditionText(Command& command, const SqliteCondition& condition) {
   if (!condition.IsValid()) {

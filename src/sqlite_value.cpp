@@ -11,13 +11,6 @@
 namespace KeloDRCore {
 namespace {
 
-// The one place where integers become JSON: Json::Value has no unambiguous constructor for long or
-// long long across 32 and 64 bits.
-Json::Value ToJson(long long number) { return Json::Value(static_cast<Json::Int64>(number)); }
-Json::Value ToJson(unsigned long long number) {
-  return Json::Value(static_cast<Json::UInt64>(number));
-}
-
 // Doubles each quote, byte for byte as replacing with a regular expression would.
 void AppendQuoted(std::string& text, const char* at, const char* end) {
   text.reserve(text.size() + static_cast<size_t>(end - at) + 2);
@@ -86,12 +79,11 @@ SqliteValue::SqliteValue() : valid(false) {}
 SqliteValue::SqliteValue(int number) : valid(true), value(number) {}
 SqliteValue::SqliteValue(bool truth) : valid(true), value(truth) {}
 SqliteValue::SqliteValue(unsigned int number) : valid(true), value(number) {}
-SqliteValue::SqliteValue(long number)
-    : valid(true), value(ToJson(static_cast<long long>(number))) {}
-SqliteValue::SqliteValue(unsigned long number)
-    : valid(true), value(ToJson(static_cast<unsigned long long>(number))) {}
-SqliteValue::SqliteValue(long long number) : valid(true), value(ToJson(number)) {}
-SqliteValue::SqliteValue(unsigned long long number) : valid(true), value(ToJson(number)) {}
+// Json::Value takes neither a long nor a long long on both 32 and 64 bits.
+SqliteValue::SqliteValue(long number) : valid(true), value(Json::Int64{number}) {}
+SqliteValue::SqliteValue(unsigned long number) : valid(true), value(Json::UInt64{number}) {}
+SqliteValue::SqliteValue(long long number) : valid(true), value(Json::Int64{number}) {}
+SqliteValue::SqliteValue(unsigned long long number) : valid(true), value(Json::UInt64{number}) {}
 SqliteValue::SqliteValue(const std::string& text) : valid(true), value(text) {}
 SqliteValue::SqliteValue(const char* text)
     : valid(text != nullptr), value(valid ? Json::Value(text) : Json::Value()) {}

@@ -122,7 +122,7 @@ TEST(LayoutTest, ConditionsWithoutFieldsOfTheirOwnAddNone) {
   EXPECT_EQ(sizeof(SqliteRecord), sizeof(void*));
 }
 
-// Only the field itself shows it: a condition, once set, is never empty again.
+// Only the field shows it, because a condition that was set never becomes empty again.
 TEST(LayoutTest, AConditionTakesADeletesPermissionBack) {
   DeleteCommand command;
   const auto deletesAll = [&command] {

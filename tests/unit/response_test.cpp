@@ -70,7 +70,7 @@ std::string Ask(const Query& query, const Response& response) {
   }
 }
 
-// Asks every query of `document`: those that `found` does not name find nothing.
+// Asks every query of `document`. The queries that `found` does not name must find nothing.
 void ExpectAnswers(const Json::Value& document, const Answers& found) {
   const Response response(document);
   for (const Query& query : kQueries) {

@@ -264,7 +264,7 @@ TEST_F(SqliteConditionTest, ValuesInBracesAreAlwaysAList) {
   ExpectError("Invalid rvalue []");
 }
 
-// Taken as the text of the list, it would be SQL.
+// As the text of the list it would be SQL.
 TEST_F(SqliteConditionTest, OneTextInBracesIsAListToo) {
   const std::string text = "a') OR 1=1 --";
   const std::string list = "( 'a'') OR 1=1 --' )";
@@ -285,7 +285,7 @@ TEST_F(SqliteConditionTest, SettingInAgainReplacesTheText) {
   ExpectCondition(condition, "m IN ( 3 )");
 }
 
-// Valid by its keyword, whatever became of its text.
+// The keyword makes it valid, whatever its text is.
 void ExpectValidWithText(const SqliteCondition& condition, const std::string& text) {
   EXPECT_EQ(condition.GetText(), text);
   EXPECT_TRUE(condition.IsValid());

@@ -256,7 +256,7 @@ TEST_F(SelectCommandTest, NumbersArePlainWhateverTheLocale) {
   EXPECT_EQ(update.ToStr(), "]condition:[]/values:[n=1234567]");
 }
 
-// Builders as plain as can be, to hold the commands against.
+// Plain builders, with which the commands are compared.
 struct Reference {
   std::map<std::string, std::string> literals;
   std::vector<std::string> fields;

@@ -198,7 +198,7 @@ TEST_F(SqliteValueListTest, AMissingFieldGivesAnInvalidValueThatLivesWithTheList
   LogCapture::Clear();
 }
 
-// Holds for a `T` of any value that it is not read from the field.
+// Expects that the field is not read as a `T` and leaves `value` alone.
 template <typename T>
 void ExpectNotRead(const SqliteValueList& list, const std::string& field, const T& value) {
   T out = value;

@@ -323,8 +323,8 @@ TEST_F(SqliteValueTest, NumbersArePlainWhateverTheLocale) {
   ExpectRefused<std::string>(1234567, "old", "[1234567] is not string");
 }
 
-// A random text, mostly short, of at most 200 characters, `quotes` of 8 of them quotes, the others
-// any byte but NUL or, when `isUtf8`, any character.
+// A random text of at most 200 characters, mostly short. `quotes` of 8 characters are quotes; the
+// others are any byte but NUL or, when `isUtf8`, any character.
 std::string RandomText(std::mt19937& random, unsigned int quotes, bool isUtf8) {
   static const std::vector<std::string> kCharacters = {
       "a", "\n", "\\", "\xC3\xA9", "\xE2\x82\xAC", "\xF0\x9F\x98\x80"};
