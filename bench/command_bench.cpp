@@ -108,7 +108,7 @@ void MeasureCommand(const std::string& work, std::shared_ptr<KeloDRCore::SqliteC
   Register("GetCommand", work, kLibrary, [=](benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(command->GetCommand());
   });
-  Register("GetCommand", work, Baseline(1.2), [=](benchmark::State& state) {
+  Register("GetCommand", work, Baseline(2.5), [=](benchmark::State& state) {
     for (auto _ : state) benchmark::DoNotOptimize(byHand());
   });
 }
