@@ -4,14 +4,13 @@
 #define KELODRCORE_POSIX_RETRY_H_
 
 #include <cerrno>
-#include <cstdio>
 #include <type_traits>
 
 namespace KeloDRCore::Posix {
 
-// Whether a call that has just failed, after so many interruptions, is to be made again. Where they
-// do not end, EINTR is a failure like any other: nobody hangs.
-inline bool IsInterrupted(int before) {
+// Whether to make a failed call again: it was interrupted, and not `kMost` times before. After that
+// EINTR is a failure like any other.
+inline bool MustRetry(int before) {
   constexpr int kMost = 1000000;  // far more than the signals that interrupt any wait
   return errno == EINTR && before < kMost;
 }
@@ -27,19 +26,8 @@ auto Retry(Call call) {
     }
   };
   auto result = call();
-  for (int i = 0; isFailure(result) && IsInterrupted(i); ++i) result = call();
+  for (int i = 0; isFailure(result) && MustRetry(i); ++i) result = call();
   return result;
-}
-
-// getc, which getline and fgets cannot stand in for: they lose what they have read when a signal
-// handler returns into them.
-inline int GetByte(FILE* stream) {
-  int byte = getc(stream);
-  for (int i = 0; byte == EOF && ferror(stream) != 0 && IsInterrupted(i); ++i) {
-    clearerr(stream);
-    byte = getc(stream);
-  }
-  return byte;
 }
 
 }  // namespace KeloDRCore::Posix

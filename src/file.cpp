@@ -8,8 +8,7 @@
 #include <cerrno>
 #include <charconv>
 #include <cstdio>
-#include <ext/stdio_filebuf.h>
-#include <istream>
+#include <ios>
 #include <limits>
 #include <locale>
 #include <memory>
@@ -20,6 +19,8 @@
 #include "kelocore.h"
 #include "kelodrcore/json_value.h"
 #include "log.h"
+#include "posix/descriptor.h"
+#include "posix/file_io.h"
 #include "posix/retry.h"
 #include "privilege.h"
 
@@ -31,45 +32,35 @@ struct StreamCloser {
 };
 using Stream = std::unique_ptr<FILE, StreamCloser>;
 
-// An input file stream with close-on-exec, which std::ifstream cannot set.
-class InputFile {
- public:
-  explicit InputFile(const std::string& path)
-      : fd(Posix::Retry([&] { return open(path.c_str(), O_RDONLY | O_CLOEXEC); })),
-        buffer(fd, std::ios::in),
-        lines(&buffer) {
-    // A buffer without a stream (no memory for one) does not own the descriptor.
-    if (fd >= 0 && !buffer.is_open()) close(fd);
-  }
+// What is at `path` may be anybody's: a queue without data is an error, and not waited for.
+Posix::Descriptor OpenToRead(const std::string& path) {
+  return Posix::Open(path, O_RDONLY | Posix::kHarmless);
+}
 
-  bool IsOpen() const { return buffer.is_open(); }
-  bool NextLine(std::string& line) {
-    errno = 0;
-    if (std::getline(lines, line)) return true;
-    // A directory opens like a file and counts as an empty one.
-    isCut = lines.bad() && errno != EISDIR;
-    return false;
-  }
-  // Whether the lines ended before the file did.
-  bool IsCut() const { return isCut; }
+// A directory opens like a file and counts as an empty one, as it does to std::ifstream.
+bool ReadToEnd(const Posix::Descriptor& file, std::string& text) {
+  if (Posix::ReadAll(file.Get(), text)) return true;
+  text.clear();
+  return errno == EISDIR;
+}
 
- private:
-  int fd;
-  bool isCut = false;
-  __gnu_cxx::stdio_filebuf<char> buffer;
-  std::istream lines;
-};
-
-// fgets, except that an interrupted read is taken up again.
-template <int kSize>
-bool ReadChunk(FILE* stream, char (&chunk)[kSize]) {
-  int length = 0;
-  int byte = 0;
-  while (length < kSize - 1 && byte != '\n' && (byte = Posix::GetByte(stream)) != EOF) {
-    chunk[length++] = static_cast<char>(byte);
+// What fgets makes of `text`: pieces of at most one line and 1023 bytes, of which a NUL byte hides
+// the rest.
+std::string JoinPieces(std::string_view text) {
+  constexpr size_t kLongest = 1023;
+  std::string joined;
+  while (!text.empty()) {
+    const size_t lineEnd = std::min(text.find('\n'), text.size() - 1) + 1;
+    const std::string_view piece = text.substr(0, std::min(lineEnd, kLongest));
+    joined += piece.substr(0, piece.find('\0'));
+    text.remove_prefix(piece.size());
   }
-  chunk[length] = '\0';
-  return length > 0;
+  return joined;
+}
+
+// A path that begins with "-" would be an option to a program.
+std::string AsArgument(const std::string& path) {
+  return path.rfind('-', 0) == 0 ? "./" + path : path;
 }
 
 enum class WriteResult { kDone, kWriteFailed, kFlushFailed, kSyncFailed };
@@ -94,15 +85,15 @@ bool Read(const std::string& path, Json::Value& value) {
     KELODR_LOG(DEBUG, __func__, "file[%s] is not existed", path.c_str());
     return true;
   }
-  InputFile file(path);
+  const Posix::Descriptor file = OpenToRead(path);
   if (!file.IsOpen()) {
     KELODR_LOG(ERR, __func__, "File[%s] is not opened.", path.c_str());
     return false;
   }
-  std::string content;
-  for (std::string line; file.NextLine(line);) content += line;
-  // The start of a document can be a document itself, "12" of "123".
-  return !file.IsCut() && JsonValue::fromString(value, content);
+  std::string text;
+  if (!ReadToEnd(file, text)) return false;
+  text.erase(std::remove(text.begin(), text.end(), '\n'), text.end());
+  return JsonValue::fromString(value, text);
 }
 
 bool Read(int fd, Json::Value& value) {
@@ -111,10 +102,8 @@ bool Read(int fd, Json::Value& value) {
     KELODR_LOG(ERR, __func__, "Failed to open file descriptor [%d]", fd);
     return false;
   }
-  std::string content;
-  char chunk[1024];
-  while (ReadChunk(stream.get(), chunk)) content += chunk;
-  return ferror(stream.get()) == 0 && JsonValue::fromString(value, content);
+  std::string text;
+  return Posix::ReadAll(fd, text) && JsonValue::fromString(value, JoinPieces(text));
 }
 
 bool Write(const std::string& path, const Json::Value& value) {
@@ -173,7 +162,7 @@ bool CreateDir(const std::string& path, int mode) {
   }
 
   KELODR_PRIVILEGED();
-  if (KLIBCExec("/bin/mkdir", "-p", path.c_str(), "-m", modeText) != 0) {
+  if (KLIBCExec("/bin/mkdir", "-p", AsArgument(path).c_str(), "-m", modeText) != 0) {
     KELODR_LOG(ERR, __func__, "Failed to create dir [%s] with mode [%o]", path.c_str(), bits);
     return false;
   }
@@ -182,7 +171,7 @@ bool CreateDir(const std::string& path, int mode) {
 
 bool RemoveDir(const std::string& path) {
   if (KLIBCFileCheckDir(path.c_str()) == 0) return true;
-  return KLIBCExec("/bin/rm", "-rf", path.c_str(), nullptr, nullptr) == 0;
+  return KLIBCExec("/bin/rm", "-rf", AsArgument(path).c_str(), nullptr, nullptr) == 0;
 }
 
 std::string GetParentDir(const std::string& path) { return path.substr(0, path.rfind('/')); }
@@ -292,14 +281,18 @@ int Read(const std::string& path, std::map<K, V>& map) {
     return -1;
   }
   if (access(path.c_str(), F_OK) != 0) return 0;
-  InputFile file(path);
-  if (!file.IsOpen()) {
+  const Posix::Descriptor file = OpenToRead(path);
+  std::string text;
+  if (!file.IsOpen() || !ReadToEnd(file, text)) {
     KELODR_LOG(WARN, __func__, "File[%s] is not opened.", path.c_str());
     return -1;
   }
   std::map<K, V> entries;  // apart from `map`, of which `path` may be a part
   ReaderOf<V> reader;
-  for (std::string line; file.NextLine(line);) {
+  for (size_t start = 0; start < text.size();) {
+    const size_t end = std::min(text.find('\n', start), text.size());
+    const std::string line = text.substr(start, end - start);
+    start = end + 1;
     K key{};
     V value{};
     if (parseLineKeyValue(line, reader, key, value)) {
@@ -309,10 +302,6 @@ int Read(const std::string& path, std::map<K, V>& map) {
       KELODR_LOG(NOTICE, __func__, "Failed to parse line[%s] from file [%s]", line.c_str(),
                  path.c_str());
     }
-  }
-  if (file.IsCut()) {
-    KELODR_LOG(WARN, __func__, "File[%s] is not opened.", path.c_str());
-    return -1;
   }
   map = std::move(entries);
   return static_cast<int>(map.size());

@@ -8,7 +8,7 @@
 #include "kelocore.h"
 #include "kelorandom.h"
 #include "log.h"
-#include "posix/retry.h"
+#include "posix/file_io.h"
 
 namespace KeloDRCore {
 
@@ -30,13 +30,11 @@ std::string GenerateUUID() {
     KELODR_LOG(ERR, __func__, "Failed to exec the command [%s].", kCommand);
     return "";
   }
+  constexpr size_t kLongest = 65536;  // a tool that prints for ever ends there
   std::string line;
-  FILE* const stream = output.get();
-  for (int byte = Posix::GetByte(stream); byte != EOF && byte != '\n';
-       byte = Posix::GetByte(stream)) {
-    line += static_cast<char>(byte);
-  }
-  if (ferror(stream) != 0) return "";  // the start of a UUID is none
+  if (!Posix::ReadAll(fileno(output.get()), line, kLongest))
+    return "";  // the start of a UUID is none
+  line = line.substr(0, line.find('\n'));
   KLIBCStrTrim(line.data(), nullptr, nullptr);
   return line.c_str();  // which the trimming has shortened
 }

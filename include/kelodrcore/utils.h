@@ -1,8 +1,6 @@
 /// @file
-/// Small helpers: a random back-off, UUIDs, and the test for paths on a data volume.
-///
-/// Deliberate, and frozen because callers rely on it: a period of equal bounds or one that starts
-/// at 0 is refused, a long one wraps at 32 bits, and a volume path is known by its prefix alone.
+/// Small helpers: a random pause, UUIDs, and the test for paths on a data volume. What is called
+/// deliberate here is frozen.
 
 #ifndef KELODRCORE_UTILS_H_
 #define KELODRCORE_UTILS_H_
@@ -15,12 +13,15 @@ namespace KeloDRCore {
 
 /// Sleeps for a random number of milliseconds, drawn uniformly from the closed range [min, max].
 /// Blocks the calling thread; a signal may end the sleep early. The period is kept to 32 bits of
-/// microseconds: one above 4,294,967 ms (71 minutes) begins again at 0. False, at once and with a
-/// line at ERR, unless 0 < min < max.
+/// microseconds: one above 4,294,967 ms (71 minutes) begins again at 0.
+///
+/// False, at once and with a line at ERR, unless 0 < min < max: equal bounds and a period that
+/// starts at 0 are deliberately refused.
 KELODR_EXPORT bool RandomSleepInMSec(unsigned int min, unsigned int max);
 
-/// A new UUID as "/usr/bin/uuidgen" prints it, without surrounding white space. Empty when the tool
-/// cannot be started (a line at ERR) or prints nothing (no line).
+/// A new UUID: the first line that "/usr/bin/uuidgen" prints, without surrounding white space. The
+/// tool's first 64 KiB count. Empty when the tool cannot be started (a line at ERR), prints nothing
+/// or cannot be read (no line).
 KELODR_EXPORT std::string GenerateUUID();
 
 /// Tests of texts.

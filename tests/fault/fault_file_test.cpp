@@ -93,7 +93,7 @@ TEST_F(FileFaultTest, ReadGivesTheWholeDocumentOrLeavesTheValue) {
     std::vector<LogLine> expected;
     if (outcome.Failed("access")) {
       expected = {Debug("file.cpp", "Read", "file[" + path + "] is not existed")};
-    } else if (outcome.FailedForGood("open64") || outcome.Failed("fdopen")) {
+    } else if (outcome.FailedForGood("openat64")) {
       expected = {Failure("Read", "File[" + path + "] is not opened.")};
     }
     if (outcome.error != Fault::kNoMemory) {

@@ -1,9 +1,10 @@
-// Calls that fail where nothing else does while a file is read.
+// What other processes see of a file while it is read.
 
-#include <unistd.h>
+#include <fcntl.h>
 
-#include <cerrno>
-#include <set>
+#include <functional>
+#include <map>
+#include <string>
 
 #include "fault/interception.h"
 #include "kelodrcore/file.h"
@@ -11,23 +12,38 @@
 
 namespace {
 
-using InterceptedFileTest = CleanTest;
+namespace File = KeloDRCore::File;
 
-// The number 0 is a descriptor like another.
-TEST_F(InterceptedFileTest, NoDescriptorIsLeftWhereThereIsNoStreamForIt) {
-  WriteText(Path("file"), "1");
-  EXPECT_EQ(RunInChild([this] {
-              close(STDIN_FILENO);
-              const std::set<int> before = OpenDescriptors();
-              const Fault::Interception noStream("fdopen", 1, ENOMEM);
-              Json::Value value("before");
-              EXPECT_FALSE(KeloDRCore::File::Read(Path("file"), value));
-              EXPECT_TRUE(noStream.HasRun());
-              EXPECT_EQ(value, Json::Value("before"));
-              EXPECT_EQ(OpenDescriptors(), before);
-              LogCapture::Clear();
-            }),
-            0);
+class InterceptedFileTest : public CleanTest {
+ protected:
+  // Whatever `read` has open while it reads Path("file") is closed on exec.
+  void ExpectCloseOnExec(const std::function<void(const std::string& path)>& read) {
+    const std::set<int> before = OpenDescriptors();
+    const Fault::Interception look("read", 1, [&] {
+      const std::set<int> now = OpenDescriptors();
+      EXPECT_EQ(now.size(), before.size() + 1);
+      for (const int fd : now) {
+        EXPECT_TRUE(before.count(fd) > 0 || fcntl(fd, F_GETFD) == FD_CLOEXEC) << fd;
+      }
+      return Fault::kGoOn;
+    });
+    read(Path("file"));
+    EXPECT_TRUE(look.HasRun());
+  }
+};
+
+TEST_F(InterceptedFileTest, ADocumentIsOpenedCloseOnExec) {
+  WriteText(Path("file"), "7");
+  Json::Value value;
+  ExpectCloseOnExec([&](const std::string& path) { EXPECT_TRUE(File::Read(path, value)); });
+  EXPECT_EQ(value, Json::Value(7));
+}
+
+TEST_F(InterceptedFileTest, KeyValueTextIsOpenedCloseOnExec) {
+  WriteText(Path("file"), "a=1");
+  std::map<std::string, int> map;
+  ExpectCloseOnExec([&](const std::string& path) { EXPECT_EQ(File::Read(path, map), 1); });
+  EXPECT_EQ(map["a"], 1);
 }
 
 }  // namespace

@@ -96,7 +96,7 @@ TEST_F(FileDirRootTest, CreateDirRunsMkdirWithThePathBeforeTheMode) {
         EXPECT_TRUE(File::CreateDir(Path("a b"), 0750));
         EXPECT_TRUE(File::CreateDir("-x", 07));
       },
-      "[/bin/mkdir][-p][" + Path("a b") + "][-m][750]\n[/bin/mkdir][-p][-x][-m][7]\n");
+      "[/bin/mkdir][-p][" + Path("a b") + "][-m][750]\n[/bin/mkdir][-p][./-x][-m][7]\n");
 }
 
 TEST_F(FileDirRootTest, CreateDirRunsNothingWhenThereIsNothingToMake) {
@@ -196,6 +196,22 @@ TEST_F(FileDirRootTest, RemoveDirRemovesTheWholeTree) {
 TEST_F(FileDirRootTest, RemoveDirRunsRmWithThePath) {
   ExpectCalls(
       "/bin/rm", [this] { EXPECT_TRUE(File::RemoveDir(dir)); }, "[/bin/rm][-rf][" + dir + "]\n");
+}
+
+// mkdir and rm take what begins with "-" for an option, as far as the environment has them do so.
+TEST_F(FileDirRootTest, APathThatBeginsWithAHyphenIsAPath) {
+  EXPECT_EQ(RunInChild([this] {
+              ASSERT_EQ(chdir(dir.c_str()), 0);
+              for (const std::string path : {"-m", "-v/sub", "--help", "-"}) {
+                EXPECT_TRUE(File::CreateDir(path, 0700)) << path;
+                EXPECT_EQ(ModeOf("./" + path), 0700U) << path;
+              }
+              for (const std::string path : {"-m", "-v", "--help", "-"}) {
+                EXPECT_TRUE(File::RemoveDir(path)) << path;
+              }
+            }),
+            0);
+  EXPECT_EQ(NamesIn(dir), std::vector<std::string>{});
 }
 
 TEST_F(FileDirRootTest, RemoveDirRunsNothingForWhatIsNoDirectory) {

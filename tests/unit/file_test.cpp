@@ -9,6 +9,8 @@
 
 #include <atomic>
 #include <csignal>
+#include <cstdlib>
+#include <map>
 #include <string>
 
 #include "kelodrcore/json_value.h"
@@ -145,12 +147,36 @@ TEST_F(FileTest, ReadOfALargeDocumentIsWhole) {
   EXPECT_EQ(value, written);
 }
 
-TEST_F(FileTest, ReadOpensItsFileCloseOnExec) {
-  Json::Value value;
-  ExpectOpenedCloseOnExec(Path("fifo"), "7", [&value](const std::string& path) {
-    EXPECT_TRUE(File::Read(path, value));
-  });
-  EXPECT_EQ(value, Json::Value(7));
+// Nobody writes to the queue, then somebody who has nothing to say yet.
+TEST_F(FileTest, ReadDoesNotWaitForAQueue) {
+  ASSERT_EQ(mkfifo(Path("queue").c_str(), 0600), 0);
+  Json::Value value("kept");
+  EXPECT_FALSE(File::Read(Path("queue"), value));
+  const int writer = open(Path("queue").c_str(), O_RDWR | O_CLOEXEC);
+  EXPECT_FALSE(File::Read(Path("queue"), value));
+  EXPECT_EQ(value, Json::Value("kept"));
+  close(writer);
+}
+
+// A terminal of one's own would end the daemon by ^C.
+TEST_F(FileTest, ReadTakesNoTerminalForItsOwn) {
+  const int terminal = posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC);
+  if (terminal < 0) GTEST_SKIP() << "no terminals here";
+  ASSERT_EQ(grantpt(terminal), 0);
+  ASSERT_EQ(unlockpt(terminal), 0);
+  const std::string path = ptsname(terminal);
+  EXPECT_EQ(RunInChild([&] {
+              ASSERT_NE(setsid(), -1);
+              Json::Value value;
+              std::map<std::string, int> map;
+              EXPECT_FALSE(File::Read(path, value));
+              EXPECT_FALSE(JsonValue::fromFile(value, path));
+              EXPECT_EQ(File::Read(path, map), -1);
+              EXPECT_EQ(open("/dev/tty", O_RDWR | O_CLOEXEC), -1);
+              LogCapture::Clear();
+            }),
+            0);
+  close(terminal);
 }
 
 // --- Read(fd) ------------------------------------------------------------------------------------

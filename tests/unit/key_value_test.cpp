@@ -1,3 +1,7 @@
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <cmath>
 #include <cstring>
 #include <limits>
@@ -109,6 +113,18 @@ TYPED_TEST(EveryInstanceTest, ADirectoryReadsAsAnEmptyFile) {
   EXPECT_TRUE(map.empty());
 }
 
+TYPED_TEST(EveryInstanceTest, AQueueIsNotWaitedFor) {
+  const std::string path = this->Path("queue");
+  ASSERT_EQ(mkfifo(path.c_str(), 0600), 0);
+  const int writer = open(path.c_str(), O_RDWR | O_CLOEXEC);
+  typename TestFixture::Map map{{"old", {}}};
+  EXPECT_EQ(File::Read(path, map), -1);
+  EXPECT_EQ(map.count("old"), 1U);
+  this->ExpectLog({Warn("file.cpp", "Read", "File[" + path + "] is not opened.")});
+  close(writer);
+  EXPECT_EQ(File::Read(path, map), 0);
+}
+
 TYPED_TEST(EveryInstanceTest, TheLastLineOfAKeyWinsAndEntriesAreCounted) {
   typename TestFixture::Map map{{"old", {}}};
   EXPECT_EQ(this->Read("a=1\na=2\nb=3\n", map), 2);
@@ -124,13 +140,6 @@ TYPED_TEST(EveryInstanceTest, ThePathMayBeAKeyOfTheMap) {
   EXPECT_EQ(File::Read(map.begin()->first, map), 1);
   EXPECT_EQ(map.count("b"), 1U);
   this->ExpectLog({NoSeparator("a"), this->NotParsed("a")});
-}
-
-TEST_F(KeyValueTest, TheFileIsOpenedCloseOnExec) {
-  Strings map;
-  ExpectOpenedCloseOnExec(Path("fifo"), "a=1",
-                          [&map](const std::string& path) { EXPECT_EQ(File::Read(path, map), 1); });
-  EXPECT_EQ(map, (Strings{{"a", "1"}}));
 }
 
 // --- the lines -----------------------------------------------------------------------------------
