@@ -21,7 +21,7 @@ case $preset in
   lint) groups=(build examples lint) ;;
   bench | fuzz) groups=(build "$preset") ;;
   system-platform) groups=(build) options=(-D "CMAKE_LIBRARY_PATH=$build/dev/platform") ;;
-  storm) groups=(build test) targets=(--target storm) ;;
+  storm) groups=(build test) targets=(--target storm power) ;;
   tsan) targets=(--target threads_test) ;;
   coverage) groups+=(coverage) ;;
 esac
