@@ -1,4 +1,5 @@
 #include <fcntl.h>
+#include <pty.h>
 #include <sys/file.h>
 #include <sys/xattr.h>
 #include <unistd.h>
@@ -8,8 +9,12 @@
 #include <cstring>
 
 #include "attack/attack.h"
+#include "kelodrcore/file.h"
 #include "kelodrcore/json_value.h"
+#include "support/test_cache.h"
 
+namespace File = KeloDRCore::File;
+using KeloDRCore::JsonValue::fromFile;
 using KeloDRCore::JsonValue::toFile;
 
 namespace {
@@ -272,6 +277,47 @@ TEST_F(DocumentAttackTest, OnlyARegularFileIsReplaced) {
     AsUser([] { MakeQueue(kPath); });
     ExpectRefused(kPath, EINVAL);
     EXPECT_TRUE(S_ISFIFO(LookAt(kPath).st_mode));
+  });
+}
+
+// All readers of files, of the path at which something was planted.
+void ReadEverything(const std::string& path) {
+  Json::Value value("untouched");
+  EXPECT_FALSE(fromFile(value, path));
+  EXPECT_FALSE(File::Read(path, value));
+  EXPECT_EQ(value, "untouched");
+  std::map<std::string, std::string> map;
+  EXPECT_LE(File::Read(path, map), 0);
+}
+
+TEST_F(DocumentAttackTest, AQueueIsNotWaitedFor) {
+  Attack([] {
+    AsUser([] { MakeQueue(kPath); });
+    ReadEverything(kPath);
+  });
+}
+
+TEST_F(DocumentAttackTest, ATerminalIsNotTakenAsTheControllingOne) {
+  Attack([] {
+    int master = -1;
+    int slave = -1;
+    char name[64];
+    ASSERT_EQ(openpty(&master, &slave, name, nullptr, nullptr), 0);
+    ASSERT_EQ(chown(name, kUser, kUser), 0);
+    AsUser([&] {
+      MakeLink(name, kPath);
+      MakeLink(name, "/tmp/default_dr_cache");
+    });
+    EXPECT_EQ(RunInChild([] {
+                alarm(10);
+                setsid();
+                ReadEverything(kPath);
+                TestCache("", "", 1000, true, 0).Read();
+                toFile("new", kPath);
+                EXPECT_EQ(open("/dev/tty", O_RDWR), -1);
+                EXPECT_EQ(errno, ENXIO);
+              }),
+              0);
   });
 }
 

@@ -79,6 +79,20 @@ TEST_F(ProgramAttackTest, ProgramsGetAFixedEnvironment) {
   });
 }
 
+TEST_F(ProgramAttackTest, ANameLikeAnOptionIsAName) {
+  Attack([] {
+    MakeDir("work", 0755);
+    ASSERT_EQ(chdir("work"), 0);
+    for (const char* name : {"-v", "--help", "-m", "-", "--"}) {
+      EXPECT_TRUE(File::CreateDir(name, 0750)) << name;
+      EXPECT_EQ(NamesIn("."), Names{name});
+      EXPECT_EQ(LookAt(name).st_mode, S_IFDIR | 0750U) << name;
+      EXPECT_TRUE(File::RemoveDir(name)) << name;
+      EXPECT_EQ(NamesIn("."), Names{}) << name;
+    }
+  });
+}
+
 TEST_F(ProgramAttackTest, WhatAProgramSaysDoesNotReachTheCallersFiles) {
   Attack([] {
     WriteText("data", "data");
