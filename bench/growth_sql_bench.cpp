@@ -39,6 +39,25 @@ size_t SelectByHand(const std::string& path) {
   return records.size();
 }
 
+size_t EachWithLibrary(const std::string& path) {
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  size_t rows = 0;
+  const auto count = [&rows](const KeloDRCore::SqliteValueList& /*record*/) { return ++rows > 0; };
+  Require(db.SelectEach(SelectAllNodes(), count), "SelectEach");
+  return rows;
+}
+
+size_t EachByHand(const std::string& path) {
+  sqlite3* const db = OpenRaw(path);
+  sqlite3_stmt* statement = nullptr;
+  sqlite3_prepare_v2(db, kSelect, -1, &statement, nullptr);
+  size_t rows = 0;
+  for (; sqlite3_step(statement) == SQLITE_ROW; ++rows) ReadRaw(statement);
+  sqlite3_finalize(statement);
+  sqlite3_close(db);
+  return rows;
+}
+
 // An empty database, whose making is not measured.
 void MakeUntimed(benchmark::State& state, const std::string& path) {
   state.PauseTiming();
@@ -58,9 +77,28 @@ void MeasureInsert(int rows, const Contestant& contestant,
   });
 }
 
-void MeasureSelect(int rows, const Contestant& contestant,
+void MeasureBulk(int rows) {
+  Register("growth bulk", std::to_string(rows), kLibrary, [=](benchmark::State& state) {
+    const auto records = RecordsOf(MakeNodes(rows));
+    const std::string path = ScratchPath("growth.db");
+    for (auto _ : state) {
+      MakeUntimed(state, path);
+      InsertAllWithLibrary(path, records);
+    }
+  });
+  Register("growth bulk", std::to_string(rows), Baseline(), [=](benchmark::State& state) {
+    const std::vector<Node> nodes = MakeNodes(rows);
+    const std::string path = ScratchPath("growth.db");
+    for (auto _ : state) {
+      MakeUntimed(state, path);
+      InsertPrepared(path, nodes);
+    }
+  });
+}
+
+void MeasureSelect(const char* operation, int rows, const Contestant& contestant,
                    size_t (*selectAll)(const std::string&)) {
-  Register("growth select", std::to_string(rows), contestant, [=](benchmark::State& state) {
+  Register(operation, std::to_string(rows), contestant, [=](benchmark::State& state) {
     const std::string path = DatabaseOf(rows);
     for (auto _ : state) Require(selectAll(path) == static_cast<size_t>(rows), "select");
   });
@@ -81,9 +119,9 @@ size_t PeakMemory(bool reset) {
 }
 
 // In a child, so that no earlier work has left memory to use again.
-void MeasureMemory(int rows, const Contestant& contestant,
+void MeasureMemory(const char* operation, int rows, const Contestant& contestant,
                    size_t (*selectAll)(const std::string&)) {
-  Register("growth memory", std::to_string(rows), contestant, [=](benchmark::State& state) {
+  Register(operation, std::to_string(rows), contestant, [=](benchmark::State& state) {
     const std::string path = DatabaseOf(rows);
     double bytes = 0;
     for (auto _ : state) {
@@ -115,10 +153,15 @@ const Benchmarks registered([] {
   for (const int rows : {1000, 10000, 100000, 1000000}) {
     MeasureInsert(rows, kLibrary, InsertWithLibrary);
     MeasureInsert(rows, Baseline(), InsertByHand);
-    MeasureSelect(rows, kLibrary, SelectWithLibrary);
-    MeasureSelect(rows, Baseline(), SelectByHand);
-    MeasureMemory(rows, kLibrary, SelectWithLibrary);
-    MeasureMemory(rows, Baseline(), SelectByHand);
+    MeasureBulk(rows);
+    MeasureSelect("growth select", rows, kLibrary, SelectWithLibrary);
+    MeasureSelect("growth select", rows, Baseline(), SelectByHand);
+    MeasureSelect("growth each", rows, kLibrary, EachWithLibrary);
+    MeasureSelect("growth each", rows, Baseline(), EachByHand);
+    MeasureMemory("growth memory", rows, kLibrary, SelectWithLibrary);
+    MeasureMemory("growth memory", rows, Baseline(), SelectByHand);
+    MeasureMemory("growth each memory", rows, kLibrary, EachWithLibrary);
+    MeasureMemory("growth each memory", rows, Baseline(), EachByHand);
   }
   for (size_t size = 16; size <= size_t{64} << 20; size *= 16) {
     MeasureValueInsert(size, kLibrary, InsertWithLibrary, SelectWithLibrary);

@@ -123,4 +123,46 @@ void InsertByHand(const std::string& path, const std::vector<Node>& nodes) {
   sqlite3_close(db);
 }
 
+std::vector<KeloDRCore::SqliteValueList> RecordsOf(const std::vector<Node>& nodes) {
+  std::vector<KeloDRCore::SqliteValueList> records(nodes.size());
+  auto record = records.begin();
+  for (const Node& node : nodes) {
+    record->AddValue("address", node.address);
+    record->AddValue("id", node.id);
+    record->AddValue("name", node.name);
+    record->AddValue("online", node.online);
+    record->AddValue("port", node.port);
+    ++record;
+  }
+  return records;
+}
+
+void InsertAllWithLibrary(const std::string& path,
+                          const std::vector<KeloDRCore::SqliteValueList>& records) {
+  KeloDRCore::SqliteDB db(path, 3, "bench");
+  Require(db.InsertRecords(NodeTable(), records), "InsertRecords");
+}
+
+void InsertPrepared(const std::string& path, const std::vector<Node>& nodes) {
+  sqlite3* const db = OpenRaw(path);
+  ExecRaw(db, "BEGIN IMMEDIATE");
+  sqlite3_stmt* statement = nullptr;
+  sqlite3_prepare_v2(db, "INSERT INTO nodes (address,id,name,online,port) VALUES (?,?,?,?,?);", -1,
+                     &statement, nullptr);
+  for (const Node& node : nodes) {
+    sqlite3_bind_text(statement, 1, node.address.data(), static_cast<int>(node.address.size()),
+                      SQLITE_STATIC);
+    sqlite3_bind_int(statement, 2, node.id);
+    sqlite3_bind_text(statement, 3, node.name.data(), static_cast<int>(node.name.size()),
+                      SQLITE_STATIC);
+    sqlite3_bind_int(statement, 4, node.online ? 1 : 0);
+    sqlite3_bind_int64(statement, 5, node.port);
+    Require(sqlite3_step(statement) == SQLITE_DONE, sqlite3_errmsg(db));
+    sqlite3_reset(statement);
+  }
+  sqlite3_finalize(statement);
+  ExecRaw(db, "COMMIT");
+  sqlite3_close(db);
+}
+
 }  // namespace bench

@@ -48,6 +48,12 @@ void InsertWithLibrary(const std::string& path, const std::vector<Node>& nodes);
 void InsertWithOneCommand(const std::string& path, const std::vector<Node>& nodes);
 void InsertByHand(const std::string& path, const std::vector<Node>& nodes);
 
+// The nodes as records; all of them at once, and by hand with one prepared statement.
+std::vector<KeloDRCore::SqliteValueList> RecordsOf(const std::vector<Node>& nodes);
+void InsertAllWithLibrary(const std::string& path,
+                          const std::vector<KeloDRCore::SqliteValueList>& records);
+void InsertPrepared(const std::string& path, const std::vector<Node>& nodes);
+
 // All rows of the table as one text, to hold databases against each other.
 std::string Contents(const std::string& path);
 

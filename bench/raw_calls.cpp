@@ -65,22 +65,24 @@ void InsertRaw(sqlite3* db, const std::string& sql) {
          "INFO", static_cast<int>(getpid()), "bench");
 }
 
+Record ReadRaw(sqlite3_stmt* statement) {
+  Record record;
+  const int columns = sqlite3_column_count(statement);
+  for (int i = 0; i < columns; ++i) {
+    const char* const name = sqlite3_column_name(statement, i);
+    if (sqlite3_column_type(statement, i) == SQLITE_INTEGER) {
+      record.emplace(name, static_cast<Json::Int64>(sqlite3_column_int64(statement, i)));
+    } else {
+      record.emplace(name, TextOf(statement, i));
+    }
+  }
+  return record;
+}
+
 void SelectRaw(sqlite3* db, const char* sql, std::vector<Record>& records) {
   sqlite3_stmt* statement = nullptr;
   Require(sqlite3_prepare_v2(db, sql, -1, &statement, nullptr) == SQLITE_OK, sqlite3_errmsg(db));
-  const int columns = sqlite3_column_count(statement);
-  while (sqlite3_step(statement) == SQLITE_ROW) {
-    Record record;
-    for (int i = 0; i < columns; ++i) {
-      const char* const name = sqlite3_column_name(statement, i);
-      if (sqlite3_column_type(statement, i) == SQLITE_INTEGER) {
-        record.emplace(name, static_cast<Json::Int64>(sqlite3_column_int64(statement, i)));
-      } else {
-        record.emplace(name, TextOf(statement, i));
-      }
-    }
-    records.push_back(std::move(record));
-  }
+  while (sqlite3_step(statement) == SQLITE_ROW) records.push_back(ReadRaw(statement));
   sqlite3_finalize(statement);
 }
 

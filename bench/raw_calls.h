@@ -38,6 +38,9 @@ void RenderInsert(const Node& node, std::string& text);
 // statement.
 void InsertRaw(sqlite3* db, const std::string& sql);
 
+// The row of the statement.
+Record ReadRaw(sqlite3_stmt* statement);
+
 // Every row of the statement into a map of its own.
 void SelectRaw(sqlite3* db, const char* sql, std::vector<Record>& records);
 

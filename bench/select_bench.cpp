@@ -1,4 +1,4 @@
-// SelectRecords: rows of five columns, each into a record of its own.
+// SelectRecords and SelectEach: rows of five columns, each into a record of its own.
 
 #include <SQLiteCpp/SQLiteCpp.h>
 #include <sqlite3.h>
@@ -87,6 +87,34 @@ void SelectByHand(benchmark::State& state) {
   sqlite3_close(db);
 }
 
+void EachWithLibrary(benchmark::State& state) {
+  KeloDRCore::SqliteDB db(DatabaseOf(kRows), 3, "bench");
+  const KeloDRCore::SelectCommand command = SelectAllNodes();
+  for (auto _ : state) {
+    size_t fields = 0;
+    Require(db.SelectEach(command,
+                          [&](const KeloDRCore::SqliteValueList& record) {
+                            fields += record.GetValues().size();
+                            return true;
+                          }),
+            "SelectEach");
+    Require(fields == 5 * kRows, "SelectEach leaves fields out");
+  }
+}
+
+void EachByHand(benchmark::State& state) {
+  sqlite3* const db = OpenRaw(DatabaseOf(kRows));
+  for (auto _ : state) {
+    size_t fields = 0;
+    sqlite3_stmt* statement = nullptr;
+    sqlite3_prepare_v2(db, kSelect, -1, &statement, nullptr);
+    while (sqlite3_step(statement) == SQLITE_ROW) fields += ReadRaw(statement).size();
+    sqlite3_finalize(statement);
+    Require(fields == 5 * kRows, "the loop by hand leaves fields out");
+  }
+  sqlite3_close(db);
+}
+
 void SelectWithSqliteCpp(benchmark::State& state) {
   const SQLite::Database db(DatabaseOf(kRows));
   FillRecords(state, [&db](std::vector<Record>& records) {
@@ -120,6 +148,8 @@ const Benchmarks registered([] {
   measure(Baseline(1.05), SelectByHand);
   measure({"SQLiteCpp", 1}, SelectWithSqliteCpp);
   measure({"SOCI", 1}, SelectWithSoci);
+  Register("SelectEach", "20,000 rows", kLibrary, EachWithLibrary)->Unit(benchmark::kMillisecond);
+  Register("SelectEach", "20,000 rows", Baseline(1.05), EachByHand)->Unit(benchmark::kMillisecond);
 });
 
 }  // namespace

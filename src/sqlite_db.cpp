@@ -255,8 +255,10 @@ bool SqliteDB::SetQueryEnd(int code) const {
   return false;
 }
 
-// Gives the failure of an attempt its place among the codes. True when it was another one's lock.
+// Gives the failure of an attempt its place among the codes, which what SQLite was not given has
+// already. True when it was another one's lock.
 bool SqliteDB::ClassifyErr() const {
+  if (errCode == ERR::BAD_PARAMETER) return false;
   const ErrRecorder raw = ThrowOnlyBadAlloc([this] { return ErrRecorder(*this); });
   SetDBErr(raw);
   return IsBusyOrLocked(raw.errCode);
@@ -491,7 +493,8 @@ bool SqliteDB::InsertAll(const BulkInsert& insert, const SqliteTableHandler& tab
     KELODR_LOG(ERR, function, "invalid records for table [%s]", table.tableName.c_str());
     return false;
   }
-  const std::string sql = insert.GetCommand();
+  const std::string sql = insert.FirstCommand();
+  if (RefuseNul(sql, function)) return false;
   KELODR_LOG(INFO, function, "%s Exec cmd: %s", logLabel.c_str(), sql.c_str());
   SetErr(ERR::ERR_DATABASE_OPERATION);
   if (!CreateTable(table)) {
@@ -515,7 +518,11 @@ bool SqliteDB::TryInsertAll(const BulkInsert& insert) {
   if (!attempt.SetSavepoint()) return false;
   std::string message;
   const int code = insert.Run(dbHandle, message);
-  SetDBErr(code, message.c_str());
+  if (code == BulkInsert::kInvalidRecord) {
+    SetErr(ERR::BAD_PARAMETER);
+  } else {
+    SetDBErr(code, message.c_str());
+  }
   return code == SQLITE_OK && attempt.ReleaseSavepoint();
 }
 

@@ -166,16 +166,36 @@ TEST_F(SqliteDBBulkTest, AnEmptyRecordAnywhereIsRefused) {
   ExpectInvalid(kTable, {Record(1), SqliteValueList()});
 }
 
-TEST_F(SqliteDBBulkTest, ANulByteInANameIsRefused) {
-  ExpectInvalid(SqliteTableHandler(std::string("t\0x", 3), "n"), {Record(1)});
-
+TEST_F(SqliteDBBulkTest, ANulByteInTheFirstStatementIsRefused) {
   record.AddValue(std::string("n\0x", 3), 1);
-  ExpectInvalid(kTable, {Record(1), record});
+  EXPECT_FALSE(db->InsertRecords(kTable, {record, Record(1)}));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(db->InsertRecords(SqliteTableHandler(std::string("t\0x", 3), "n"), {Record(1)}));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  EXPECT_FALSE(HasFile());
+  ExpectLog({Err(kFile, "InsertRecords", "NUL byte in command [INSERT INTO t (n]"),
+             Err(kFile, "InsertRecords", "NUL byte in command [INSERT INTO t]")});
 }
 
-TEST_F(SqliteDBBulkTest, AnUnsignedIntegerAbove63BitsIsRefused) {
-  ExpectInvalid(kTable, {Record(1, 1), Record(2, std::numeric_limits<unsigned long long>::max())});
-  ExpectInvalid(kTable, {Record(1, 1ULL << 63)});
+TEST_F(SqliteDBBulkTest, WhatCannotBeBoundIsRefusedAndNothingIsStored) {
+  Start(3);
+  record.AddValue(std::string("n\0x", 3), 1);
+  const Records refused[] = {
+      {Record(1), record},
+      {Record(1, 1), Record(2, std::numeric_limits<unsigned long long>::max())},
+      {Record(1, 1ULL << 63)}};
+  for (const Records& rows : refused) {
+    EXPECT_FALSE(db->InsertRecords(kTable, rows));
+    EXPECT_EQ(db->GetErr(), Error(401));
+    const std::vector<LogLine> lines = LogCapture::Take();
+    ASSERT_EQ(lines.size(), 2U);
+    EXPECT_EQ(lines[1], ExecFailed("InsertRecords", 0,
+                                   lines[0].message.substr(std::string("label Exec cmd: ").size()),
+                                   Error(401)));
+    EXPECT_THAT(Kept(), IsEmpty());
+    EXPECT_TRUE(db->Exec("BEGIN; ROLLBACK"));
+  }
+  Pauses::ExpectCount(0);
 }
 
 TEST_F(SqliteDBBulkTest, IntegersAreStoredWhole) {
