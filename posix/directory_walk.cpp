@@ -55,6 +55,12 @@ bool IsAt(int parent, const std::string& name, int directory) {
          IsSameFile(named, open);
 }
 
+// Whatever the umask: it is everybody's way to the files below.
+bool Make(int parent, const std::string& name) {
+  return Retry([&] { return mkdirat(parent, name.c_str(), kMode); }) == 0 &&
+         Retry([&] { return fchmodat(parent, name.c_str(), kMode, 0); }) == 0;
+}
+
 Descriptor OpenStep(int parent, const Step& step, const std::string& path,
                     const MakeDirectory& make) {
   for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
@@ -64,7 +70,7 @@ Descriptor OpenStep(int parent, const Step& step, const std::string& path,
       if (!Secure(opened.Get())) return {};
       if (IsAt(parent, step.name, opened.Get())) return opened;
     } else if (errno == ENOENT) {
-      if (!make(step.path)) return {};
+      if (!Make(parent, step.name) && !make(step.path)) return {};
     } else if (!RemovePlanted(parent, step)) {
       // Below the first step the way is safe, and the whole directory is what cannot be made.
       make(step.isFirst ? step.path : path);

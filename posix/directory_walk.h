@@ -10,19 +10,20 @@
 
 namespace KeloDRCore::Posix {
 
-// Makes the directory at a path; false when that cannot be done.
+// Makes the directory at a path, or tells that it cannot be made: false.
 using MakeDirectory = std::function<bool(const std::string& path)>;
 
 // Opens the directory `path`, which begins with `start`. `start` itself may be a link, no step
-// below it may. `make` is called for a step that is missing, with its path.
+// below it may. A step that is missing is made with mode 0755; where that fails, it is left to
+// `make`.
 //
 // Nobody with fewer rights may decide what is found on the way. As root, a step is made root's and
 // writable by nobody else, and what a stranger put in the place of one is removed; the first step
 // is root's whoever put a file there. To an ordinary user a step must be root's or its own. Behind
 // a step "..", which leads away from `start`, only links are refused.
 //
-// A closed descriptor when the directory cannot be had. Where that is because something else stands
-// in the place of a step, `make` has been called for what is missing.
+// A closed descriptor when the directory cannot be had. `make` has been called, too, where
+// something else stands in the place of a step.
 Descriptor OpenStepwise(const std::string& start, const std::string& path,
                         const MakeDirectory& make);
 

@@ -1,32 +1,68 @@
+// Who holds which lock when.
+//
+//   look     the lock shared, for 5 s at most: is there a claim?
+//   claim    the lock exclusive, for 5 s at most: look once more and create the pid file.
+//   fetch    no lock. The pid file names this process: that is the claim.
+//   write    no lock. Only the holder of the claim replaces the document, in one step.
+//   release  the lock exclusive, for 60 s at most: remove the pid file, unless it is another's.
+//
+// A claim counts while the process in the pid file lives and the file is believed (posix/trust.h).
+// A pid file of this very process counts only between claim and release (`Claim`); it is left over
+// otherwise, and the next look removes it. Somebody who holds the lock is claiming or releasing; a
+// lock that cannot be opened tells of nobody, and nobody waits for it.
+
 #include "kelodrcore/cache.h"
 
 #include <sys/file.h>
 #include <sys/stat.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <climits>
+#include <csignal>
 #include <cstring>
 #include <ctime>
+#include <mutex>
 #include <new>
+#include <thread>
 #include <utility>
 
+#include "document_file.h"
 #include "kelocore.h"
 #include "kelodrcore/file.h"
 #include "kelodrcore/file_lock.h"
 #include "kelodrcore/json_value.h"
 #include "kelodrcore/utils.h"
+#include "lock_fork.h"
 #include "log.h"
+#include "posix/file_io.h"
+#include "posix/trust.h"
 #include "privilege.h"
 
 namespace KeloDRCore {
+
+// The lock of a cache.
+class CacheLock {
+ public:
+  using Outcome = FileLock::Outcome;
+
+  explicit CacheLock(const std::string& path) : name(path + ".lock"), lock(name) {}
+  Outcome Take(int type, unsigned int timeout) { return lock.attempt(type | LOCK_NB, timeout); }
+  std::string Path() const { return FileLock::getLockFilePath(name); }
+
+ private:
+  const std::string name;
+  FileLock lock;
+};
+
 namespace {
 
 const char kFallbackPath[] = "/tmp/default_dr_cache";
 
 // How long a lock is waited for, in seconds. Releasing a claim waits longer: a pid file that stays
-// behind stops every update until its process ends.
+// behind stops every update until this process looks again, or ends.
 constexpr unsigned int kLockTimeout = 5;
 constexpr unsigned int kReleaseTimeout = 60;
 
@@ -47,42 +83,80 @@ std::string GetCachedPath(const std::string& dir, const std::string& file) {
   return dir + "/" + file + ".cached";
 }
 
-std::string PidFile(const std::string& path) { return path + ".pid"; }
-std::string LockName(const std::string& path) { return path + ".lock"; }
-
-// In seconds; -1 for a file that is missing or cannot be looked at.
+// In seconds; -1 for a file that is missing or not believed.
 time_t ModificationTime(const std::string& path) {
-  struct stat status;
-  if (access(path.c_str(), F_OK) != 0 || stat(path.c_str(), &status) != 0) return -1;
+  struct stat status = {};
+  if (access(path.c_str(), F_OK) != 0 || !Posix::StatBelieved(path, status)) return -1;
   return status.st_mtime;
 }
 
 // The modification time as it is remembered: its low 32 bits tell a change as well.
 int ModificationStamp(const std::string& path) { return static_cast<int>(ModificationTime(path)); }
 
-// The caller holds the lock, shared or exclusive.
-bool IsClaimed(const std::string& pidFile) {
-  const int pid = KLIBCReadPidFile(pidFile.c_str());
-  return pid > 0 && KLIBCProcAlive(pid) == 1;
-}
-
-// True also when the lock cannot be had: somebody is claiming the update or releasing it. The lock
-// is closed on return, so that no forked child inherits it.
-bool IsBusy(const std::string& path) {
-  const std::string pidFile = PidFile(path);
-  FileLock lock(LockName(path));
-  return !lock.lock(LOCK_SH | LOCK_NB, kLockTimeout) || IsClaimed(pidFile);
-}
-
-bool LockToRelease(FileLock& lock) {
-  try {
-    return lock.lock(LOCK_EX | LOCK_NB, kReleaseTimeout);
-  } catch (const std::bad_alloc&) {
-    return false;
+// A cache file by whatever path it is reached.
+struct Identity {
+  explicit Identity(const std::string& path) : name(path.substr(path.rfind('/') + 1)) {
+    struct stat found = {};
+    if (Posix::StatAt(AT_FDCWD, Posix::DirectoryOf(path), 0, found)) {
+      device = found.st_dev;
+      inode = found.st_ino;
+    }
   }
-}
+  bool operator==(const Identity& other) const {
+    return device == other.device && inode == other.inode && name == other.name;
+  }
 
-// What stays behind stops every update while this process lives: one failure is not the last word.
+  dev_t device = 0;
+  ino_t inode = 0;
+  std::string name;
+};
+
+// The claim of an update, which its destructor releases.
+class Claim {
+ public:
+  explicit Claim(const std::string& cachePath);
+  ~Claim();
+  Claim(const Claim&) = delete;
+  Claim& operator=(const Claim&) = delete;
+
+  // Claims the update; false when somebody else is updating, or when that cannot be done.
+  bool SetUpdating();
+
+  // Whether this process is updating the cache, in any thread or in this one.
+  enum class By { kAnyThread, kThisThread };
+  static bool IsMadeBy(By who, const std::string& path);
+
+  // KLIBCProcForkEx for a child that makes a claim of its own.
+  static int ForkRefresher();
+
+ private:
+  void UnsetUpdating();
+  bool Lock();
+  void Enlist();
+  void Delist();
+
+  // The claims of this process.
+  static std::mutex mutex;
+  static Claim* first;
+
+  // What the release needs is made before the claim: it must not fail for want of memory.
+  const std::string& path;
+  const std::string pidFile;
+  const Identity identity;
+  const pid_t pid = getpid();
+  const std::thread::id thread = std::this_thread::get_id();
+  CacheLock lock;
+  bool isHeld = false;
+  Claim* next = nullptr;
+};
+
+std::mutex Claim::mutex;
+Claim* Claim::first = nullptr;
+
+std::string PidFile(const std::string& path) { return path + ".pid"; }
+
+// What stays behind stops every update while this process lives and does not look: one failure is
+// not the last word.
 int RemovePidFile(const std::string& pidFile) {
   int ret = unlink(pidFile.c_str());
   for (int attempt = 1; ret != 0 && errno != ENOENT && attempt < kRemoveAttempts; ++attempt) {
@@ -91,14 +165,162 @@ int RemovePidFile(const std::string& pidFile) {
   return ret;
 }
 
-bool CreatePidFile(const std::string& path) {
+bool CreatePidFile(const std::string& pidFile) {
   KELODR_PRIVILEGED();
-  return KLIBCProcPidFileCreate(PidFile(path).c_str()) == 0;
+  return KLIBCProcPidFileCreate(pidFile.c_str()) == 0;
+}
+
+// The live process in a believed pid file, or 0.
+int ClaimantOf(const std::string& pidFile) {
+  struct stat status = {};
+  if (!Posix::StatBelieved(pidFile, status)) return 0;
+  const int pid = KLIBCReadPidFile(pidFile.c_str());
+  return pid > 0 && KLIBCProcAlive(pid) == 1 ? pid : 0;
+}
+
+// The caller holds the lock, shared or exclusive. Only this process looks twice at a pid file that
+// names it, so that a shared lock is enough to remove one that is left over.
+bool IsClaimed(const std::string& path) {
+  const std::string pidFile = PidFile(path);
+  const int pid = ClaimantOf(pidFile);
+  if (pid != getpid() || Claim::IsMadeBy(Claim::By::kAnyThread, path)) return pid > 0;
+  KELODR_PRIVILEGED();
+  RemovePidFile(pidFile);
+  return false;
+}
+
+enum class Updater { kNone, kSomebody, kUnknown };
+
+// The lock is closed on return, so that no forked child inherits it.
+Updater LookForUpdater(const std::string& path) {
+  CacheLock lock(path);
+  switch (lock.Take(LOCK_SH, kLockTimeout)) {
+    case CacheLock::Outcome::kTaken:
+      return IsClaimed(path) ? Updater::kSomebody : Updater::kNone;
+    case CacheLock::Outcome::kBusy:
+      return Updater::kSomebody;
+    default:
+      return Updater::kUnknown;
+  }
+}
+
+Claim::Claim(const std::string& cachePath)
+    : path(cachePath), pidFile(PidFile(path)), identity(path), lock(path) {}
+
+Claim::~Claim() {
+  if (!isHeld) return;
+  UnsetUpdating();
+  Delist();
+}
+
+bool Claim::SetUpdating() {
+  if (LookForUpdater(path) != Updater::kNone) return false;
+  CacheLock claiming(path);
+  if (claiming.Take(LOCK_EX, kLockTimeout) != CacheLock::Outcome::kTaken) {
+    KELODR_LOG(DEBUG, __func__, "Failed to lock [%s]", claiming.Path().c_str());
+    return false;
+  }
+  // Another process may have claimed the update between the look above and the lock.
+  if (IsClaimed(path)) {
+    KELODR_LOG(DEBUG, __func__, "there is other process to update cache [%s]", path.c_str());
+    return false;
+  }
+  if (!CreatePidFile(pidFile)) {
+    KELODR_LOG(DEBUG, __func__, "Failed to set cache [%s] updating", path.c_str());
+    return false;
+  }
+  Enlist();
+  KELODR_LOG(DEBUG, __func__, "---> Start to update cache [%s]", path.c_str());
+  return true;
+}
+
+bool Claim::Lock() try {
+  return lock.Take(LOCK_EX, kReleaseTimeout) == CacheLock::Outcome::kTaken;
+} catch (const std::bad_alloc&) {
+  return false;
+}
+
+void Claim::UnsetUpdating() {
+  if (!Lock()) {
+    KELODR_LOG(NOTICE, __func__, "Failed to lock to unset cache[%s]", path.c_str());
+  }
+  if (ClaimantOf(pidFile) > 0) {
+    // Read again: what cannot be read now may be another's, and one's own is found by the next
+    // look.
+    const int claimant = KLIBCReadPidFile(pidFile.c_str());
+    if (claimant != getpid()) {
+      KELODR_LOG(DEBUG, __func__, "Failed to unset updating cache [%s] since different pid[%d]",
+                 pidFile.c_str(), claimant);
+      return;
+    }
+  }
+  {
+    KELODR_PRIVILEGED();
+    const int ret = RemovePidFile(pidFile);
+    if (ret != 0) {
+      KELODR_LOG(NOTICE, __func__, "Failed to unlink [%s] with ret[%d](%s)", pidFile.c_str(), ret,
+                 strerror(errno));
+    }
+  }
+  KELODR_LOG(DEBUG, __func__, "<--- Finish to update cache [%s]", path.c_str());
+}
+
+void Claim::Enlist() {
+  const std::lock_guard<std::mutex> guard(mutex);
+  next = std::exchange(first, this);
+  isHeld = true;
+}
+
+void Claim::Delist() {
+  const std::lock_guard<std::mutex> guard(mutex);
+  Claim** link = &first;
+  while (*link != this) link = &(*link)->next;
+  *link = next;
+}
+
+bool Claim::IsMadeBy(By who, const std::string& path) {
+  const Identity identity(path);
+  const std::lock_guard<std::mutex> guard(mutex);
+  for (const Claim* claim = first; claim != nullptr; claim = claim->next) {
+    // Claims of a process that forked this one are not its own.
+    if (claim->pid != getpid() || !(claim->identity == identity)) continue;
+    if (who == By::kAnyThread || claim->thread == std::this_thread::get_id()) return true;
+  }
+  return false;
+}
+
+// The mutex is the child's own then, whatever other threads do.
+int Claim::ForkRefresher() {
+  const std::lock_guard<std::mutex> guard(mutex);
+  return ForkWithoutLocks(kDetached);
+}
+
+// For a forked child. If another thread was inside syslog at the fork, the locks of the log and of
+// the time zone are taken for ever here: then SIGALRM ends the child, before it claims anything.
+void ShowThatLogWorks() {
+  constexpr unsigned int kSeconds = 5;
+  struct sigaction byDefault = {};
+  struct sigaction handler = {};
+  sigset_t signals;
+  sigset_t mask;
+  byDefault.sa_handler = SIG_DFL;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGALRM);
+  sigaction(SIGALRM, &byDefault, &handler);
+  pthread_sigmask(SIG_UNBLOCK, &signals, &mask);
+  alarm(kSeconds);
+  setlogmask(setlogmask(0));
+  const time_t now = 0;
+  struct tm local = {};
+  localtime_r(&now, &local);
+  alarm(0);
+  pthread_sigmask(SIG_SETMASK, &mask, nullptr);
+  sigaction(SIGALRM, &handler, nullptr);
 }
 
 bool WriteFile(const Json::Value& document, const std::string& path) {
   KELODR_PRIVILEGED();
-  return JsonValue::toFile(document, path);
+  return ReplaceDocument(document, path, Whose::kBelieved);
 }
 
 // Runs `step` until it succeeds, at most `limit` + 2 times (but once at least), with a sleep of
@@ -166,7 +388,7 @@ bool Cache::Load() const {
   // Before the file is read: one that is replaced in between then counts as changed.
   const int modified = ModificationStamp(path);
   Json::Value document;
-  if (!JsonValue::fromFile(document, path)) {
+  if (!ReadDocument(document, path, Whose::kBelieved)) {
     KELODR_LOG(DEBUG, __func__, "Failed to read data from cache [%s]", path.c_str());
     return false;
   }
@@ -179,15 +401,20 @@ bool Cache::Load() const {
 
 bool Cache::Update() const {
   const bool required = IsUpdatedDataRequired();
-  if (IsBusy(path)) {
-    if (required) WaitForUpdate();
-    return true;
+  // A fetch reads its own cache.
+  if (Claim::IsMadeBy(Claim::By::kThisThread, path)) return true;
+  switch (LookForUpdater(path)) {
+    case Updater::kNone:
+      return required ? UpdateUnderClaim() : UpdateInBackground();
+    case Updater::kSomebody:
+      return !required || WaitForUpdate();
+    default:
+      return false;
   }
-  return required ? UpdateUnderClaim() : UpdateInBackground();
 }
 
 bool Cache::UpdateInBackground() const {
-  const int pid = KLIBCProcForkEx(kDetached);
+  const int pid = Claim::ForkRefresher();
   if (pid < 0) {
     KELODR_LOG(WARN, "Update", "Failed to fork(). errno=[%d/%m]", errno);
     return false;
@@ -196,6 +423,7 @@ bool Cache::UpdateInBackground() const {
   // Nothing of the caller's goes on in the child: neither its frames nor its exit handlers nor what
   // it had in its stream buffers.
   try {
+    ShowThatLogWorks();
     UpdateUnderClaim();
   } catch (...) {
     // Nobody is there to be told.
@@ -204,72 +432,19 @@ bool Cache::UpdateInBackground() const {
 }
 
 bool Cache::UpdateUnderClaim() const {
-  // What releases the claim is made before it: the release must not fail for want of memory.
-  const std::string pidFile = PidFile(path);
-  FileLock lock(LockName(path));
-  if (!SetUpdating()) return false;
-  bool updated = false;
-  try {
-    updated = DoUpdate();
-  } catch (...) {
-    UnsetUpdating(pidFile, lock);
-    throw;
-  }
-  UnsetUpdating(pidFile, lock);
-  return updated;
+  Claim claim(path);
+  return claim.SetUpdating() && DoUpdate();
 }
 
-void Cache::WaitForUpdate() const {
+bool Cache::WaitForUpdate() const {
   KELODR_LOG(DEBUG, "Update", "start to block wait cache [%s] ", path.c_str());
+  Updater updater = Updater::kSomebody;
   do {
     RandomSleepInMSec(300, 1000);
-  } while (IsBusy(path) && IsTimeout());
+    updater = LookForUpdater(path);
+  } while (updater == Updater::kSomebody && IsTimeout());
   KELODR_LOG(DEBUG, "Update", "finish to block wait cache [%s] ", path.c_str());
-}
-
-bool Cache::SetUpdating() const {
-  if (IsBusy(path)) return false;
-  FileLock lock(LockName(path));
-  if (!lock.lock(LOCK_EX | LOCK_NB, kLockTimeout)) {
-    KELODR_LOG(DEBUG, __func__, "Failed to lock [%s]",
-               FileLock::getLockFilePath(LockName(path)).c_str());
-    return false;
-  }
-  // Another process may have claimed the update between the look above and the lock.
-  if (IsClaimed(PidFile(path))) {
-    KELODR_LOG(DEBUG, __func__, "there is other process to update cache [%s]", path.c_str());
-    return false;
-  }
-  if (!CreatePidFile(path)) {
-    KELODR_LOG(DEBUG, __func__, "Failed to set cache [%s] updating", path.c_str());
-    return false;
-  }
-  KELODR_LOG(DEBUG, __func__, "---> Start to update cache [%s]", path.c_str());
-  return true;
-}
-
-void Cache::UnsetUpdating(const std::string& pidFile, FileLock& lock) const {
-  if (!LockToRelease(lock)) {
-    KELODR_LOG(NOTICE, __func__, "Failed to lock to unset cache[%s]", path.c_str());
-  }
-  if (IsClaimed(pidFile)) {
-    const int pid = KLIBCReadPidFile(pidFile.c_str());
-    // A pid file that can no longer be read is removed: it would name this process while it lives.
-    if (pid > 0 && pid != getpid()) {
-      KELODR_LOG(DEBUG, __func__, "Failed to unset updating cache [%s] since different pid[%d]",
-                 pidFile.c_str(), pid);
-      return;
-    }
-  }
-  {
-    KELODR_PRIVILEGED();
-    const int ret = RemovePidFile(pidFile);
-    if (ret != 0) {
-      KELODR_LOG(NOTICE, __func__, "Failed to unlink [%s] with ret[%d](%s)", pidFile.c_str(), ret,
-                 strerror(errno));
-    }
-  }
-  KELODR_LOG(DEBUG, __func__, "<--- Finish to update cache [%s]", path.c_str());
+  return updater != Updater::kUnknown;
 }
 
 bool Cache::DoUpdate() const {
@@ -330,7 +505,7 @@ bool Cache::IsTimeout() const {
 
 int Cache::GetMaxUpdateTime() const {
   Json::Value document;
-  if (!JsonValue::fromFile(document, path) || !document.isObject()) return 0;
+  if (!ReadDocument(document, path, Whose::kBelieved) || !document.isObject()) return 0;
   const Json::Value& seconds = document["max_updated_time"];
   return seconds.isInt() ? seconds.asInt() : 0;
 }

@@ -12,27 +12,34 @@
 
 namespace KeloDRCore {
 
-class FileLock;
-
 /// A cached JSON document: read by every process, refreshed by one at a time.
 ///
 /// A subclass tells how fresh data is fetched and judged. This class keeps the file, answers from
-/// memory while the file is unchanged, and sees to it that only one process fetches: it claims the
-/// update with a pid file (the cache file's path + ".pid") under a `FileLock` (named that path +
-/// ".lock"), which is held only while the pid file is looked at or changed, never during the fetch.
-/// A claim whose process has died is no claim.
+/// memory while the file is unchanged, and lets only one process fetch: it claims the update with a
+/// pid file (the cache file's path + ".pid") under a `FileLock` (named that path + ".lock"). The
+/// lock is held only while the pid file is looked at or changed, never during the fetch. A claim
+/// whose process has died is no claim. A claim of this process that its release left behind is
+/// given up at the next use.
 ///
 /// The file holds one JSON object: "timeout", "info" (`GetInfo()`), "cached_data",
 /// "begin_time_to_update" and "finish_time_to_update" (seconds since the epoch, both 0 when
 /// unknown), "updated_time" (the seconds between the two) and "max_updated_time" (the largest of
 /// these so far, a whole number). It is replaced in one step, as root. Only "cached_data" and
-/// "max_updated_time" are read back; the file's age is that of its modification time, and a change
+/// "max_updated_time" are read back. The file's age is that of its modification time, and a change
 /// of the file is noticed by that time too, in whole seconds, deliberately.
 ///
+/// Both files count only when they are regular files of root, of the effective user, or of the
+/// owner of their directory, the last not in a directory that all may write. Any other document
+/// counts as missing, any other pid file as no claim, and the next write replaces it.
+///
 /// Messages of the cache's course are logged at DEBUG, and at NOTICE when the lock to release a
-/// claim cannot be had or the pid file not be removed. What the subclass throws reaches the caller,
-/// with the claim released; nothing else throws. An object is used by one thread at a time, its
-/// const operations too.
+/// claim cannot be had or the pid file cannot be removed. What the subclass throws reaches the
+/// caller, with the claim released. Throws `Json::RuntimeError` where JsonCpp throws it instead of
+/// `std::bad_alloc`.
+///
+/// An object is used by one thread at a time, its const operations too. A fetch may read its own
+/// cache, through any object, in the thread in which it runs: it gets the data that is there. A
+/// signal ends a pause between two tries or looks early. What is called deliberate here is frozen.
 class KELODR_EXPORT Cache {
  public:
   /// The cache file is `dir` + "/" + `file` + ".cached"; a missing `dir` is created with mode 0755.
@@ -55,7 +62,9 @@ class KELODR_EXPORT Cache {
   [[nodiscard]] virtual Json::Value GetDefaultValue() const;
 
   /// Computes fresh data into `out`, which is null at the call; false when that failed. Runs in the
-  /// calling process or in a forked one whose standard streams are on /dev/null.
+  /// calling process or in a forked one. The forked one has its standard streams on /dev/null,
+  /// holds no `FileLock` of its caller, and must not use a `SqliteDB` that its caller has open: a
+  /// fetch opens its own.
   virtual bool GetUpdatedData(Json::Value& out) const = 0;
 
   /// True when the data is usable. Data that is not is neither written nor taken for current.
@@ -81,16 +90,19 @@ class KELODR_EXPORT Cache {
   /// document as it was.
   bool Load() const;
 
-  /// Sees to it that the data is refreshed, by one process at a time.
+  /// Refreshes the data, in one process at a time.
   ///
   /// When no process is refreshing, and fresh data is required (`IsUpdatedDataRequired`), the
   /// calling process refreshes; the result is that of `DoUpdate`, or false when another process was
   /// quicker to claim the update. When it is not required, a detached child refreshes, which is not
-  /// waited for, and the result is true; false when the fork failed (a line at WARN).
+  /// waited for, and the result is true; false when the fork failed (a line at WARN). A child that
+  /// cannot log, because another thread was logging at the fork, claims nothing and ends.
   ///
   /// When another process is refreshing, the result is true: at once, or, when fresh data is
   /// required, once the file is no longer stale or no process is refreshing any more. That wait has
-  /// no bound of its own.
+  /// no bound of its own. Inside a fetch of the same cache the result is true at once.
+  ///
+  /// False at once when the lock cannot be opened; the lines of `FileLock` say why.
   bool Update() const;
 
   /// Fetches and writes the data without claiming the update; sleeps 500 to 1000 ms between two
@@ -121,9 +133,7 @@ class KELODR_EXPORT Cache {
  private:
   KELODR_LOCAL bool UpdateInBackground() const;
   KELODR_LOCAL bool UpdateUnderClaim() const;
-  KELODR_LOCAL void WaitForUpdate() const;
-  KELODR_LOCAL bool SetUpdating() const;
-  KELODR_LOCAL void UnsetUpdating(const std::string& pidFile, FileLock& lock) const;
+  KELODR_LOCAL bool WaitForUpdate() const;
   KELODR_LOCAL Json::Value MakeDocument(const Json::Value& data, long long begin,
                                         long long finish) const;
 

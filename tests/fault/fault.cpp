@@ -38,6 +38,9 @@ State* NewState() {
 // A signal that never stops coming is no fault of the system's; this many in a row is bad enough.
 constexpr int kSignalsInARow = 10;
 
+// In seconds. A failure that lasts must not hang anybody: SIGALRM ends the test then.
+constexpr unsigned int kLongestRun = 60;
+
 // Not 0 for what sets errno.
 int ErrnoOf(int error) {
   if (error == Fault::kNoMemory) return ENOMEM;
@@ -155,13 +158,14 @@ void FaultTest::TearDown() {
 void FaultTest::SweepCalls(const Fault::Operation& operation) {
   for (const int error : {EINTR, EIO, ENOSPC, EMFILE, EACCES, EAGAIN, ENOMEM}) {
     Sweep(operation, error, Fault::kOnce);
-    Sweep(operation, error, error == EINTR ? kSignalsInARow : forGood);
+    const int held = error == EAGAIN ? heldForGood : Fault::kForGood;
+    Sweep(operation, error, error == EINTR ? kSignalsInARow : held);
   }
 }
 
 void FaultTest::SweepMemory(const Fault::Operation& operation) {
   Sweep(operation, Fault::kNoMemory, Fault::kOnce);
-  Sweep(operation, Fault::kNoMemory, forGood);
+  Sweep(operation, Fault::kNoMemory, Fault::kForGood);
 }
 
 void FaultTest::SweepTransfers(const Fault::Operation& operation) {
@@ -175,7 +179,7 @@ void FaultTest::SweepTransfers(const Fault::Operation& operation) {
     Sweep(operation, portion, Fault::kForGood);
   }
   EXPECT_GT(shortTransfers, before) << "nothing was moved";
-  Sweep(operation, Fault::kDiskFull, forGood);
+  Sweep(operation, Fault::kDiskFull, Fault::kForGood);
 }
 
 void FaultTest::ExpectUndisturbed(const Fault::Outcome& outcome) const {
@@ -199,9 +203,11 @@ bool FaultTest::RunFailing(const Fault::Operation& operation, const Fault::Plan&
   const uid_t uid = geteuid();
   const gid_t gid = getegid();
   Fault::Outcome outcome{false, false, plan.error, 0, {}, {}};
+  alarm(kLongestRun);
   Fault::Arm(plan);
   const bool threwWrongly = RunCaught(operation, mayThrowJsonError, outcome);
   outcome.failures = Fault::Disarm();
+  alarm(0);
   outcome.failed = Fault::FailedCalls();
   outcome.log = LogCapture::Take();
   SCOPED_TRACE("call " + std::to_string(plan.first) + " " + NameOf(plan.error) + ", " +

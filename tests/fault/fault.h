@@ -111,8 +111,8 @@ class FaultTest : public CleanTest {
   // Whether JsonCpp's own exception may come out where it finds no memory.
   bool mayThrowJsonError = false;
 
-  // How many calls fail "for good"; less where the operation waits until they no longer do.
-  int forGood = Fault::kForGood;
+  // How many calls find a lock held "for good"; less where the operation waits for its holder.
+  int heldForGood = Fault::kForGood;
 
  private:
   bool RunFailing(const Fault::Operation& operation, const Fault::Plan& plan);

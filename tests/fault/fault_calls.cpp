@@ -124,9 +124,13 @@ FAULT_CALL(int, unlinkat, -1, (int dir, const char* path, int flags), (dir, path
            EIO, EACCES, ENOMEM)
 FAULT_CALL(int, mkdir, -1, (const char* path, mode_t mode), (path, mode), EIO, ENOSPC, EACCES,
            ENOMEM)
+FAULT_CALL(int, mkdirat, -1, (int dir, const char* path, mode_t mode), (dir, path, mode), EINTR,
+           EIO, ENOSPC, EACCES, ENOMEM)
 FAULT_CALL(int, rmdir, -1, (const char* path), (path), EIO, EACCES, ENOMEM)
 FAULT_CALL(int, flock, -1, (int fd, int operation), (fd, operation), EINTR, EAGAIN, ENOMEM)
 FAULT_CALL(int, fchmod, -1, (int fd, mode_t mode), (fd, mode), EINTR, EIO, EACCES)
+FAULT_CALL(int, fchmodat, -1, (int dir, const char* path, mode_t mode, int flags),
+           (dir, path, mode, flags), EINTR, EIO, EACCES)
 FAULT_CALL(int, fchown, -1, (int fd, uid_t uid, gid_t gid), (fd, uid, gid), EINTR, EIO, EACCES)
 
 FAULT_CALL(ssize_t, listxattr, -1, (const char* path, char* list, size_t size), (path, list, size),

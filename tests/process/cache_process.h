@@ -15,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "kelodrcore/file_lock.h"
 #include "support/test_cache.h"
 
 constexpr int kStale = 1100;  // seconds; above the time-out of MakeCache()
@@ -108,6 +109,14 @@ class CacheProcessTest : public CacheFixture {
   LogLine CannotUnlink(const std::string& reason) const {
     return Notice("cache.cpp", "UnsetUpdating",
                   "Failed to unlink [" + pidFile + "] with ret[-1](" + reason + ")");
+  }
+
+  // The lines of a cache that finds its lock file not to be opened.
+  std::vector<LogLine> CannotOpenLock(const std::string& reason) const {
+    const std::string file = KeloDRCore::FileLock::getLockFilePath(lockName);
+    return {Err("file_lock.cpp", "openLockedFile",
+                "Failed to open lock file[" + file + "], errno=" + reason),
+            Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + file + "]")};
   }
 
   // A child that has claimed the update and is fetching; it waits for `finish`, then gives "new".

@@ -3,6 +3,7 @@
 #include "process/cache_process.h"
 
 #include <fcntl.h>
+#include <gmock/gmock.h>
 #include <poll.h>
 #include <sys/file.h>
 #include <sys/syscall.h>
@@ -13,8 +14,10 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <memory>
 #include <set>
 #include <stdexcept>
+#include <thread>
 
 #include "kelodrcore/file_lock.h"
 #include "support/counting_generator.h"
@@ -240,16 +243,159 @@ TEST_F(CacheProcessTest, APidFileOfADeadOrReusedPidOrOfNobodyStopsNoUpdate) {
   }
 }
 
-TEST_F(CacheProcessTest, AProcessInThePidFileIsAnUpdaterEvenTheCaller) {
+TEST_F(CacheProcessTest, ALiveProcessInThePidFileIsAnUpdater) {
   WriteCacheFile("\"old\"", kStale);
   const TestCache cache = MakeCache(false);
-  for (const pid_t pid : {getppid(), getpid(), pid_t{1}}) {
+  for (const pid_t pid : {getppid(), pid_t{1}}) {
     WriteText(pidFile, std::to_string(pid));
     EXPECT_TRUE(cache.Update());
     EXPECT_EQ(cache.Read(), "old");
   }
   ExpectLog({});
   EXPECT_EQ(JoinAll(), 0);
+  std::filesystem::remove(pidFile);
+}
+
+TEST_F(CacheProcessTest, APidFileThatIsNotBelievedIsNoClaim) {
+  const std::string live = std::to_string(getppid());
+  WriteText(Path("target"), live);
+  const auto expectUpdate = [this] {
+    WriteCacheFile("\"old\"", kStale);
+    TestCache cache = MakeCache();
+    cache.FetchGives("new");
+    EXPECT_EQ(cache.Read(), "new");
+    ExpectLog({Starts(), Finishes()});
+  };
+  std::filesystem::create_symlink(Path("target"), pidFile);
+  expectUpdate();
+  EXPECT_EQ(ReadText(Path("target")), live);
+  if (geteuid() != 0) return;  // only root can make a stranger's file
+  WriteText(pidFile, live);
+  ASSERT_EQ(chown(pidFile.c_str(), 4711, 4711), 0);
+  expectUpdate();
+}
+
+// Its release could not remove it.
+TEST_F(CacheProcessTest, AClaimOfTheCallerThatIsLeftOverIsGivenUp) {
+  WriteText(pidFile, std::to_string(getpid()));
+  TestCache cache = MakeCache();
+  cache.FetchGives("new");
+  EXPECT_EQ(cache.Read(), "new");
+  ExpectLog({NoData(), UsesDefault(), Starts(), Finishes()});
+}
+
+TEST_F(CacheProcessTest, AClaimOfTheCallerThatIsLeftOverStopsNoRefresher) {
+  WriteCacheFile("\"old\"", kStale);
+  WriteText(pidFile, std::to_string(getpid()));
+  TestCache cache = MakeCache(false);
+  cache.FetchGives("new");
+  EXPECT_EQ(cache.Read(), "old");
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(cache.Read(), "new");
+}
+
+// --- A fetch that uses its own cache
+
+TEST_F(CacheProcessTest, AFetchReadsTheOldDataOfItsOwnCache) {
+  ASSERT_EQ(symlink(cacheDir.c_str(), Path("link").c_str()), 0);
+  WriteCacheFile("\"old\"", kStale);
+  for (const std::string& sameDir : {cacheDir, cacheDir + "/../cache/.", Path("link")}) {
+    TestCache cache = MakeCache();
+    cache.fetch = [&](Json::Value& out) {
+      const TestCache other(sameDir, "c", 1000, true, 0);
+      EXPECT_TRUE(other.Update());
+      EXPECT_EQ(other.Read(), "old");
+      out = "new";
+      return true;
+    };
+    EXPECT_TRUE(cache.Update());
+    EXPECT_EQ(cache.Read(), "new");
+    ExpectLog({Starts(), Finishes()});
+    WriteCacheFile("\"old\"", kStale);
+  }
+}
+
+TEST_F(CacheProcessTest, AFetchUpdatesAnotherCache) {
+  TestCache other(cacheDir, "other", 1000, true, 0);
+  other.FetchGives("other");
+  TestCache cache = MakeCache();
+  cache.fetch = [&](Json::Value& out) {
+    out = other.Read();
+    return true;
+  };
+  EXPECT_EQ(cache.Read(), "other");
+  EXPECT_EQ(other.Remove(), 0);
+  LogCapture::Clear();
+}
+
+// It waits as another process does.
+TEST_F(CacheProcessTest, AnotherThreadGetsTheDataOfTheFetch) {
+  WriteCacheFile("\"old\"", kStale);
+  TestCache cache = MakeCache();
+  std::thread reader;
+  cache.fetch = [&](Json::Value& out) {
+    reader = std::thread([this] { EXPECT_EQ(MakeCache().Read(), "new"); });
+    EXPECT_TRUE(WaitForLines(StartsWaiting()));
+    out = "new";
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  reader.join();
+  EXPECT_THAT(LogCapture::Take(), testing::UnorderedElementsAre(Starts(), StartsWaiting(),
+                                                                Finishes(), FinishesWaiting()));
+}
+
+TEST_F(CacheProcessTest, AChildOfAFetchFindsItsParentUpdating) {
+  WriteCacheFile("\"old\"", kStale);
+  TestCache cache = MakeCache();
+  cache.fetch = [&](Json::Value& out) {
+    EXPECT_EQ(RunInChild([this] { EXPECT_EQ(MakeCache(false).Read(), "old"); }), 0);
+    out = "new";
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(JoinAll(), 0);
+  LogCapture::Clear();
+}
+
+// --- A lock that cannot be opened
+
+TEST_F(CacheProcessTest, ALockThatCannotBeOpenedFailsTheUpdateAtOnce) {
+  const std::string lockFile = FileLock::getLockFilePath(lockName);
+  std::filesystem::create_directories(lockFile);
+  TestClock::SkipSleeps();
+  for (const bool required : {true, false}) {
+    WriteCacheFile("\"old\"", kStale);
+    EXPECT_FALSE(MakeCache(required).Update());
+    std::vector<LogLine> lines = CannotOpenLock("Is a directory");
+    ExpectLog(lines);
+    EXPECT_EQ(MakeCache(required).Read(), "old");
+    lines.push_back(ReadFailed());
+    ExpectLog(lines);
+    EXPECT_EQ(TestClock::TakeSleeps(), std::vector<unsigned int>{});
+  }
+  std::filesystem::remove(path);
+  TestCache cache = MakeCache();
+  cache.defaultValue = "default";
+  EXPECT_EQ(cache.Read(), "default");
+  LogCapture::Clear();
+  EXPECT_EQ(JoinAll(), 0);
+}
+
+TEST_F(CacheProcessTest, ALockThatCanNoLongerBeOpenedEndsTheWait) {
+  WriteCacheFile("\"old\"", kStale);
+  WriteText(pidFile, std::to_string(getppid()));
+  const std::string lockFile = FileLock::getLockFilePath(lockName);
+  TestClock::SkipSleeps([&] {
+    std::filesystem::remove(lockFile);
+    std::filesystem::create_directories(lockFile);
+  });
+  EXPECT_FALSE(MakeCache().Update());
+  std::vector<LogLine> lines = CannotOpenLock("Is a directory");
+  lines.insert(lines.begin(), StartsWaiting());
+  lines.push_back(FinishesWaiting());
+  ExpectLog(lines);
+  EXPECT_EQ(TestClock::TakeSleeps().size(), 1U);
   std::filesystem::remove(pidFile);
 }
 
@@ -416,8 +562,13 @@ TEST_F(CacheProcessTest, ARefresherRunsNoExitHandlerAndFlushesNoStream) {
   EXPECT_EQ(ReadText(exitFile), "once");
 }
 
+// The kernel takes the status of a refresher that ends before the process between it and the
+// caller, which ignores its children as well. So the test waits for the refresher's end itself: it
+// holds the other end of a pipe until then.
 TEST_F(CacheProcessTest, ACallerMayIgnoreItsChildren) {
   cacheDir = Path("new");
+  int life[2];
+  ASSERT_EQ(pipe2(life, O_CLOEXEC), 0);
   EXPECT_EQ(RunInChild([&] {
               signal(SIGCHLD, SIG_IGN);
               TestCache cache = MakeCache(false);
@@ -427,8 +578,39 @@ TEST_F(CacheProcessTest, ACallerMayIgnoreItsChildren) {
               EXPECT_EQ(cache.Read(), "old");
             }),
             0);
-  EXPECT_EQ(JoinAll(), 1);
+  close(life[1]);
+  char byte = 0;
+  EXPECT_EQ(read(life[0], &byte, 1), 0);
+  close(life[0]);
+  EXPECT_LE(JoinAll(), 1);
   EXPECT_EQ(MakeCache().Read(), "new");
+}
+
+TEST_F(CacheProcessTest, ARefresherKeepsNoLockOfItsCaller) {
+  WriteCacheFile("\"old\"", kStale);
+  const Event fetching;
+  const Event finish;
+  auto held = std::make_unique<FileLock>(path + ".held");
+  auto unused = std::make_unique<FileLock>(path + ".unused");
+  ASSERT_TRUE(held->lock(LOCK_EX | LOCK_NB, 0));
+  ASSERT_TRUE(unused->openLockedFile());
+  TestCache cache = MakeCache(false);
+  cache.fetch = [&](Json::Value& out) {
+    held->unlock();  // is the caller's to release
+    fetching.Cause();
+    out = "new";
+    return finish.Wait();
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_TRUE(fetching.Wait());
+  EXPECT_FALSE(FileLock(path + ".held").tryLock(LOCK_EX | LOCK_NB));
+  held.reset();
+  EXPECT_TRUE(FileLock(path + ".held").tryLock(LOCK_EX | LOCK_NB)) << "while the fetch runs";
+  EXPECT_TRUE(unused->lock(LOCK_EX | LOCK_NB, 0));
+  unused.reset();
+  EXPECT_TRUE(FileLock(path + ".unused").tryLock(LOCK_EX | LOCK_NB));
+  finish.Cause();
+  EXPECT_EQ(JoinAll(), 1);
 }
 
 TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {

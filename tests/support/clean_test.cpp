@@ -1,11 +1,8 @@
 #include "support/clean_test.h"
 
 #include <dirent.h>
-#include <linux/capability.h>
-#include <sched.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -15,40 +12,12 @@
 #include <fstream>
 #include <iterator>
 
+#include "support/mounts.h"
+
 namespace {
 
 const uid_t startUid = geteuid();
 const gid_t startGid = getegid();
-
-constexpr char kLockDir[] = "/tmp/.kelodr_lock";
-
-// An ordinary user may have mounts of its own in a user namespace, in which it keeps its ids.
-bool EnterOwnMounts() {
-  if (startUid == 0) {
-    if (unshare(CLONE_NEWNS) != 0) return false;
-  } else {
-    if (unshare(CLONE_NEWUSER | CLONE_NEWNS) != 0) return false;
-    const std::string uid = std::to_string(startUid);
-    const std::string gid = std::to_string(startGid);
-    WriteText("/proc/self/setgroups", "deny");
-    WriteText("/proc/self/uid_map", uid + " " + uid + " 1");
-    WriteText("/proc/self/gid_map", gid + " " + gid + " 1");
-  }
-  return mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0;
-}
-
-// An ordinary user again, after EnterOwnMounts().
-bool DropCapabilities() {
-  __user_cap_header_struct header = {_LINUX_CAPABILITY_VERSION_3, 0};
-  __user_cap_data_struct none[2] = {};
-  return syscall(SYS_capset, &header, none) == 0;
-}
-
-// Puts a directory of this process's own in the place of the lock directory of another user.
-bool HideLockDir() {
-  return EnterOwnMounts() && mount("tmpfs", kLockDir, "tmpfs", 0, "mode=0755,size=8m") == 0 &&
-         DropCapabilities();
-}
 
 }  // namespace
 
@@ -117,11 +86,6 @@ void RunWithOwnTmp(const std::string& size, const std::function<void()>& body) {
       })) {
     GTEST_SKIP() << "needs the right to mount a file system";
   }
-}
-
-bool CanLock() {
-  static const bool can = access(kLockDir, W_OK) == 0 || errno == ENOENT || HideLockDir();
-  return can;
 }
 
 bool RunWithProgram(const std::string& path, const std::string& file,

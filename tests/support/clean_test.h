@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "support/log_capture.h"
+#include "support/mounts.h"
 
 // The descriptors open in this process.
 std::set<int> OpenDescriptors();
@@ -33,10 +34,6 @@ bool RunWithOwnMounts(const std::function<void()>& body);
 
 // The same with an empty /tmp of `size`; skips the test when this process may not mount one.
 void RunWithOwnTmp(const std::string& size, const std::function<void()>& body);
-
-// Whether this process may make lock files; it gets a lock directory of its own where the one of
-// the machine is another user's.
-bool CanLock();
 
 // RunWithOwnMounts() with `file` in the place of the program at `path`.
 bool RunWithProgram(const std::string& path, const std::string& file,

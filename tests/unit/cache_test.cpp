@@ -318,6 +318,63 @@ TEST_F(CacheTest, MaxUpdateTimeIsThatOfTheFileOr0) {
   ExpectLog({});
 }
 
+// --- Documents that are not believed
+
+// Whatever stands at the path: it is as good as missing, and the next write replaces it.
+class UnbelievedCacheTest : public CacheTest {
+ protected:
+  void ExpectMissing() {
+    const TestCache cache = MakeCache(false);
+    EXPECT_TRUE(cache.IsTimeout());
+    EXPECT_EQ(cache.GetMaxUpdateTime(), 0);
+    EXPECT_EQ(cache.GetCachedData(), Json::Value());
+    ExpectLog({Debug("cache.cpp", "Load", "Failed to read data from cache [" + path + "]"),
+               UsesDefault()});
+    EXPECT_TRUE(cache.UpdateWithData("own"));
+    EXPECT_EQ(MakeCache().GetCachedData(), "own");
+    struct stat status {};
+    ASSERT_EQ(lstat(path.c_str(), &status), 0);
+    EXPECT_TRUE(S_ISREG(status.st_mode));
+    EXPECT_EQ(status.st_uid, geteuid());
+  }
+
+  static constexpr char kDocument[] = R"({"cached_data":"planted","max_updated_time":5})";
+};
+
+TEST_F(UnbelievedCacheTest, ALinkIsNotFollowed) {
+  WriteText(Path("target"), kDocument);
+  std::filesystem::create_symlink(Path("target"), path);
+  ExpectMissing();
+  EXPECT_EQ(ReadText(Path("target")), kDocument);
+}
+
+TEST_F(UnbelievedCacheTest, AQueueHoldsNobodyUp) {
+  ASSERT_EQ(mkfifo(path.c_str(), 0666), 0);
+  const TestCache cache = MakeCache();
+  EXPECT_TRUE(cache.IsTimeout());
+  EXPECT_FALSE(cache.Load());
+  EXPECT_EQ(cache.GetMaxUpdateTime(), 0);
+  ExpectLog({Debug("cache.cpp", "Load", "Failed to read data from cache [" + path + "]")});
+  std::filesystem::remove(path);
+}
+
+TEST_F(UnbelievedCacheTest, AStrangersDocumentIsNotTaken) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to make a stranger's file";
+  WriteCacheText(kDocument);
+  ASSERT_EQ(chown(path.c_str(), 4711, 4711), 0);
+  ExpectMissing();
+}
+
+TEST_F(UnbelievedCacheTest, TheDirectorysOwnerIsBelievedUnlessAllMayWriteThere) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to make a stranger's file";
+  WriteCacheText(kDocument);
+  ASSERT_EQ(chown(path.c_str(), 4711, 4711), 0);
+  ASSERT_EQ(chown(cacheDir.c_str(), 4711, 4711), 0);
+  EXPECT_EQ(MakeCache().GetCachedData(), "planted");
+  ASSERT_EQ(chmod(cacheDir.c_str(), 01777), 0);
+  ExpectMissing();
+}
+
 // --- The rest
 
 TEST_F(CacheTest, FreshDataIsRequiredAlwaysOrWhenTheDataIsNotValid) {

@@ -1,0 +1,14 @@
+// File systems that this process alone sees.
+
+#ifndef KELODRCORE_TESTS_SUPPORT_MOUNTS_H_
+#define KELODRCORE_TESTS_SUPPORT_MOUNTS_H_
+
+// Gives this process mounts of its own; an ordinary user gets them in a user namespace, in which it
+// keeps its ids. False when it may not have them.
+bool EnterOwnMounts();
+
+// Whether this process may make lock files; it gets a lock directory of its own where the one of
+// the machine is another user's.
+bool CanLock();
+
+#endif  // KELODRCORE_TESTS_SUPPORT_MOUNTS_H_
