@@ -190,7 +190,9 @@ extern "C" int __fprintf_chk(FILE* stream, int /*flag*/, const char* format, ...
 
 // No sweep waits, not for the disk either: only a loss of power would show the difference.
 extern "C" int usleep(useconds_t /*microseconds*/) { return 0; }
-extern "C" int fsync(int /*fd*/) { return Hits("fsync", {EINTR, EIO, ENOSPC}) ? -1 : 0; }
+extern "C" int fsync(int /*fd*/) {
+  return Intercepts("fsync") || Hits("fsync", {EINTR, EIO, ENOSPC}) ? -1 : 0;
+}
 extern "C" int fdatasync(int /*fd*/) { return Hits("fdatasync", {EINTR, EIO, ENOSPC}) ? -1 : 0; }
 
 // Memory. Each form of operator new is defined, and its delete, so that none meets another's.

@@ -234,4 +234,52 @@ TEST_F(InterceptedDocumentTest, TheTemporaryOfAnUnreadableFileCanBeOpenedByItsUs
   EXPECT_EQ(status.st_mode & 07777U, 0U);
 }
 
+// The power may fail at any time: the text is on the disk before it gets its name, whatever its
+// length, and the name is before the writer says so.
+TEST_F(InterceptedDocumentTest, TheWholeTextIsSyncedBeforeItIsPublished) {
+  for (const size_t length : {size_t{10}, size_t{3} << 20, size_t{9} << 20}) {
+    off_t synced = 0;
+    const Interception text("fsync", 1, [&] {
+      struct stat status = {};
+      EXPECT_EQ(stat(temporary.c_str(), &status), 0);
+      synced = status.st_size;
+      return kGoOn;
+    });
+    const Interception publish("renameat", 1, [&] {
+      EXPECT_EQ(synced, static_cast<off_t>(length + 2)) << "not on the disk yet";
+      return kGoOn;
+    });
+    const Interception name("fsync", 2, [&] {
+      EXPECT_TRUE(publish.HasRun());
+      EXPECT_EQ(access(temporary.c_str(), F_OK), -1);
+      return kGoOn;
+    });
+    EXPECT_TRUE(toFile(std::string(length, 'x'), path));
+    EXPECT_TRUE(name.HasRun()) << length;
+    unlink(path.c_str());
+  }
+}
+
+// The kernel has followed the link of the directory's owner when a stranger's takes its place.
+TEST_F(InterceptedDocumentTest, ALinkThatAStrangerSwapsInIsNotFollowed) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to give links away";
+  constexpr uid_t kStranger = 4321;
+  ASSERT_EQ(chmod(dir.c_str(), 01777), 0);
+  WriteText(Path("secret"), "\"old\"");
+  const auto swap = [&] {
+    EXPECT_EQ(unlink(path.c_str()), 0);
+    EXPECT_EQ(symlink("secret", path.c_str()), 0);
+    EXPECT_EQ(lchown(path.c_str(), kStranger, kStranger), 0);
+    return kGoOn;
+  };
+  for (int call = 1; call <= 2; ++call) {
+    WriteText(path, "\"old\"");
+    const Interception stranger("openat", call, swap);
+    ExpectNotWritten(EACCES);
+    EXPECT_TRUE(stranger.HasRun());
+    EXPECT_EQ(ReadText(Path("secret")), "\"old\"");
+    unlink(path.c_str());
+  }
+}
+
 }  // namespace
