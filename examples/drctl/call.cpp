@@ -13,6 +13,7 @@
 
 #include "api.h"
 #include "output.h"
+#include "paths.h"
 
 namespace drctl {
 
@@ -89,6 +90,7 @@ Json::Value AnswerOnce(Api& api, const std::string& file) {
 }  // namespace
 
 int Call(const Options& options) {
+  MakeDefaultDir(options.db);  // the directories below would make it readable by all
   Api api(options.db, options.cacheDir.empty() ? options.db + ".cache" : options.cacheDir,
           options.stateDir.empty() ? options.db + ".tasks" : options.stateDir, options.maxAge);
   if (options.cgi) {

@@ -54,9 +54,14 @@ std::string Reason(const Json::Value& message) {
 }  // namespace
 
 std::string Printable(std::string text) {
-  std::replace_if(
-      text.begin(), text.end(),
-      [](char c) { return static_cast<unsigned char>(c) < 0x20 || c == 0x7f; }, '?');
+  for (size_t i = 0; i < text.size(); ++i) {
+    const auto byte = static_cast<unsigned char>(text[i]);
+    const auto next = static_cast<unsigned char>(i + 1 < text.size() ? text[i + 1] : 0);
+    // U+0080 to U+009F are control characters too.
+    const bool isTwoBytes = byte == 0xc2 && next >= 0x80 && next <= 0x9f;
+    if (byte >= 0x20 && byte != 0x7f && !isTwoBytes) continue;
+    text.replace(i, isTwoBytes ? 2 : 1, "?");
+  }
   return text;
 }
 

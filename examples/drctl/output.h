@@ -38,7 +38,7 @@ std::string Printable(std::string text);
 
 void PrintJson(const Json::Value& value);
 
-// What a change has done: as a sentence for people, or as JSON.
+// Prints what a change has done: a sentence for people, or the counts as JSON.
 void PrintDone(const std::string& sentence, const Json::Value& counts, bool asJson);
 
 // A failure as a document of the form that `SqliteDB::GetErr` gives.

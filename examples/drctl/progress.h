@@ -1,4 +1,4 @@
-// A bar that shows how far a long operation is.
+// A bar that shows the progress of a long operation.
 
 #ifndef DRCTL_PROGRESS_H_
 #define DRCTL_PROGRESS_H_
@@ -16,7 +16,7 @@ class Progress {
   Progress(const Progress&) = delete;
   Progress& operator=(const Progress&) = delete;
 
-  // So many more steps are done.
+  // Counts further steps as done.
   void Add(size_t steps);
 
  private:

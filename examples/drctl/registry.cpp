@@ -18,7 +18,7 @@ namespace {
 
 constexpr unsigned int kRetries = 10;
 constexpr int kSqliteConstraint = 19;
-// So many rows are inserted between two looks at how far it is.
+// The rows that are inserted between two reports of the progress.
 constexpr std::ptrdiff_t kPortion = 1000;
 constexpr char kBadName[] = "the name cannot be looked for";
 
@@ -32,8 +32,10 @@ const SqliteTableHandler kVolumes("volume",
                                   "fs_type TEXT NOT NULL, size_mib INTEGER NOT NULL, "
                                   "free_mib INTEGER NOT NULL, scanned_at INTEGER NOT NULL");
 
-// The value of a filter in the type of its column; invalid when it does not fit.
+// The value of a filter in the type of its column; invalid when it does not fit. SQL cannot hold a
+// NUL byte.
 SqliteValue FilterValue(const Column& column, const std::string& text) {
+  if (text.find('\0') != std::string::npos) return {};
   if (!column.IsNumber()) return text;
   unsigned int number = 0;
   const char* const end = text.data() + text.size();

@@ -34,7 +34,7 @@ class Registry : public KeloDRCore::SqliteDB {
   Json::Value GetErr() const override;
   std::string GetErrCodeStr(int code) const override;
 
-  // Fails where there is no file yet: whoever lists one that is missing may have named a wrong one.
+  // Fails when there is no file: a user who lists a missing registry may have named a wrong file.
   bool CheckThere();
 
   // `node` holds name, address, port and state. Fails for a bad field or a name that is taken.

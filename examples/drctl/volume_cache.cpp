@@ -61,7 +61,7 @@ Json::Value VolumeCache::ReadVolumes(Source& source) {
   Json::Value volumes = Read();
   // Whoever loses the race for the claim is given what there was; the winner's data come.
   if (!isScanned && IsTimeout()) volumes = Read();
-  // Who can take no lock has no cache, but can see the mounts.
+  // A user who cannot take locks has no cache, but can still see the mounts.
   if (!IsValidData(volumes)) volumes = Scan();
   const long long fileTime = FileTime();
   if (isScanned) {

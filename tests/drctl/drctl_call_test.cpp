@@ -120,7 +120,8 @@ TEST_F(DrctlCallTest, WrongTypesInAnyParameterAreBadParameters) {
   }
   for (const char* const params :
        {R"({"limit":"x"})", R"({"offset":-1})", R"({"order":"name"})", R"({"filters":[1]})",
-        R"({"ascending":1})", R"({"order":["bogus"]})", R"({"filters":["a=b=c"]})"}) {
+        R"({"ascending":1})", R"({"order":["bogus"]})", R"({"filters":["a=b=c"]})",
+        R"({"filters":["name=a\u0000"]})"}) {
     ExpectError(Call("Node", "list", params), ERR::BAD_PARAMETER);
   }
   ExpectError(Call("Node", "set", R"({"name":"a","bogus":1})"), ERR::BAD_PARAMETER);

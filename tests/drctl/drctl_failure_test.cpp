@@ -4,8 +4,11 @@
 #include <kelodrcore/file_lock.h>
 #include <kelodrcore/response.h>
 #include <sys/file.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
+
+#include <functional>
 
 #include "drctl/locks.h"
 #include "drctl/program.h"
@@ -74,6 +77,25 @@ TEST_F(DrctlFailureTest, ATaskRunsOnWhereverItIsPolledFrom) {
     EXPECT_TRUE(reply.isSuccess()) << state;
     EXPECT_FALSE(reply.isPollFinish()) << state;
   }
+}
+
+// Runs `body` where nobody can make a lock; false when this process may not prepare that.
+bool RunWithoutLocks(const std::function<void()>& body) {
+  return RunWithOwnMounts([&] {
+    mkdir(kLockDir, 0755);
+    ASSERT_EQ(mount("none", kLockDir, "tmpfs", MS_RDONLY, nullptr), 0);
+    body();
+  });
+}
+
+TEST_F(DrctlFailureTest, AScanWithoutALockTellsTheReason) {
+  const bool isAllowed = RunWithoutLocks([&] {
+    const Outcome outcome = RunHere("call", R"({"api":"Volume","method":"scan","version":1})");
+    EXPECT_NE(outcome.out.find("the scan is not started: the lock of the task cannot be taken"),
+              std::string::npos)
+        << outcome.out;
+  });
+  if (!isAllowed) GTEST_SKIP() << "needs the right to mount";
 }
 
 TEST_F(DrctlFailureTest, TheLockOfAForgottenTaskIsRemoved) {

@@ -267,6 +267,13 @@ TEST_F(DrctlTest, TheTableHasHeadingsAndAlignedColumns) {
             "longer                longer.example         5566  online\n");
 }
 
+TEST_F(DrctlTest, NoControlCharacterReachesTheTerminal) {
+  AddNode("a\033[2J\xc2\x9b\x7f\xc3\xa9");
+  EXPECT_NE(Run({"node", "list"}).out.find("a?[2J??\xc3\xa9 "), std::string::npos);
+  EXPECT_EQ(Run({"node", "remove", "\033"}).err,
+            "drctl: cannot remove node '?': there is no node of that name (ERR_NODE_NOT_EXIST)\n");
+}
+
 TEST_F(DrctlTest, AnUnusableRegistryIsNamed) {
   const Outcome outcome = RunProgram(dir, {DRCTL, "--db", Path("no/such/dir.db"), "node", "add",
                                            "a", "--address", "b", "--port", "1"});
