@@ -31,25 +31,27 @@ void MoveInt(Json::Value& object, const char* key, int& field) {
 
 Request::Request() = default;
 
-Request::Request(const std::string& apiName, int apiVersion, const std::string& methodName,
-                 const Json::Value& parameters)
-    : version(apiVersion), api(apiName), method(methodName), params(parameters) {}
+Request::Request(const std::string& newApi, int newVersion, const std::string& newMethod,
+                 const Json::Value& newParams)
+    : version(newVersion), api(newApi), method(newMethod), params(newParams) {}
 
 Request::Request(const Json::Value& request) { setRequest(request); }
 
 Request::~Request() = default;
 
-void Request::setAPI(const std::string& value) { api = value; }
+void Request::setAPI(const std::string& newApi) { api = newApi; }
 
-void Request::setMethod(const std::string& value) { method = value; }
+void Request::setMethod(const std::string& newMethod) { method = newMethod; }
 
-void Request::setVersion(int value) { version = value; }
+void Request::setVersion(int newVersion) { version = newVersion; }
 
-void Request::setTimeout(int seconds) { timeout = seconds; }
+void Request::setTimeout(int newTimeout) { timeout = newTimeout; }
 
-void Request::setEncryptRequired(bool required) { encryptRequired = required; }
+void Request::setEncryptRequired(bool newEncryptRequired) { encryptRequired = newEncryptRequired; }
 
-void Request::setUploadFile(const UploadFileDescription& file) { uploadFile = file; }
+void Request::setUploadFile(const UploadFileDescription& newUploadFile) {
+  uploadFile = newUploadFile;
+}
 
 bool Request::isValid() const { return !api.empty() && !method.empty() && version >= 1; }
 

@@ -97,7 +97,7 @@ void InsertCommand::DumpParam(std::stringstream& stream) const {
 
 void InsertCommand::SetFieldValues(const SqliteValueList& list) { fieldValues = list; }
 
-void InsertCommand::SetReplacable(bool isReplacable) { replacable = isReplacable; }
+void InsertCommand::SetReplacable(bool newReplacable) { replacable = newReplacable; }
 
 bool InsertCommand::AddField(const std::string& field, const SqliteValue& value) {
   return SetField(fieldValues, field, value);
@@ -133,8 +133,8 @@ bool UpdateCommand::SetCondition(const std::string& text) {
   return true;
 }
 
-bool UpdateCommand::SetCondition(const SqliteCondition& sqliteCondition) {
-  return SetConditionText(*this, sqliteCondition);
+bool UpdateCommand::SetCondition(const SqliteCondition& newCondition) {
+  return SetConditionText(*this, newCondition);
 }
 
 SelectCommand::SelectCommand() = default;
@@ -189,9 +189,9 @@ void SelectCommand::SetOrderByASC() { orderByASC = true; }
 
 void SelectCommand::SetOrderByDESC() { orderByASC = false; }
 
-bool SelectCommand::SetLimit(int first, int count) {
-  if (first < 0 || count < 1) return false;
-  offset = first;
+bool SelectCommand::SetLimit(int newOffset, int count) {
+  if (newOffset < 0 || count < 1) return false;
+  offset = newOffset;
   limit = count;
   return true;
 }
@@ -211,8 +211,8 @@ bool SelectCommand::SetCondition(const std::string& text) {
   return true;
 }
 
-bool SelectCommand::SetCondition(const SqliteCondition& sqliteCondition) {
-  return SetConditionText(*this, sqliteCondition);
+bool SelectCommand::SetCondition(const SqliteCondition& newCondition) {
+  return SetConditionText(*this, newCondition);
 }
 
 DeleteCommand::DeleteCommand() = default;
@@ -242,8 +242,8 @@ bool DeleteCommand::SetCondition(const std::string& text) {
   return true;
 }
 
-bool DeleteCommand::SetCondition(const SqliteCondition& sqliteCondition) {
-  return SetConditionText(*this, sqliteCondition);
+bool DeleteCommand::SetCondition(const SqliteCondition& newCondition) {
+  return SetConditionText(*this, newCondition);
 }
 
 }  // namespace KeloDRCore

@@ -46,7 +46,7 @@ bool RequireKeyword(const SqliteInFamily& condition) {
 }  // namespace
 
 SqliteCondition::SqliteCondition() = default;
-SqliteCondition::SqliteCondition(const std::string& conditionText) : text(conditionText) {}
+SqliteCondition::SqliteCondition(const std::string& newText) : text(newText) {}
 
 bool SqliteCondition::IsValid() const { return !text.empty(); }
 
@@ -98,21 +98,21 @@ bool SqliteIsNull::SetValue(const std::string& lvalue) {
   return false;
 }
 
-SqliteInFamily::SqliteInFamily(const std::string& listKeyword) : keyword(listKeyword) {}
-SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+SqliteInFamily::SqliteInFamily(const std::string& newKeyword) : keyword(newKeyword) {}
+SqliteInFamily::SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                                const std::vector<SqliteValue>& values)
-    : keyword(listKeyword) {
+    : keyword(newKeyword) {
   SetValue(lvalue, values);
 }
-SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+SqliteInFamily::SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                                const std::string& value)
-    : keyword(listKeyword) {
+    : keyword(newKeyword) {
   SetValue(lvalue, value);
 }
 
-SqliteInFamily::SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+SqliteInFamily::SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                                std::initializer_list<SqliteValue> values)
-    : SqliteInFamily(listKeyword, lvalue, std::vector<SqliteValue>(values)) {}
+    : SqliteInFamily(newKeyword, lvalue, std::vector<SqliteValue>(values)) {}
 
 bool SqliteInFamily::IsValid() const { return keyword == kIn || keyword == kNotIn; }
 

@@ -4,8 +4,9 @@ namespace KeloDRCore {
 
 SqliteTableHandler::SqliteTableHandler() = default;
 
-SqliteTableHandler::SqliteTableHandler(const std::string& name, const std::string& columns)
-    : tableName(name), columnDefs(columns) {}
+SqliteTableHandler::SqliteTableHandler(const std::string& newTableName,
+                                       const std::string& newColumnDefs)
+    : tableName(newTableName), columnDefs(newColumnDefs) {}
 
 SqliteTableHandler::SqliteTableHandler(const SqliteTableHandler& other) = default;
 

@@ -35,10 +35,10 @@ class KELODR_EXPORT Request {
   /// required, no file.
   Request();
 
-  /// A call of these four parts; the rest is as by default. `parameters` is copied as it is:
+  /// A call of these four parts; the rest is as by default. `newParams` is copied as it is:
   /// reserved keys in it are kept, and `toJson` overwrites them.
-  Request(const std::string& apiName, int apiVersion, const std::string& methodName,
-          const Json::Value& parameters);
+  Request(const std::string& newApi, int newVersion, const std::string& newMethod,
+          const Json::Value& newParams);
 
   /// The defaults, then `setRequest(request)`. Implicit: a JSON call can stand for a `Request`.
   Request(const Json::Value& request);  // NOLINT(google-explicit-constructor)
@@ -47,12 +47,12 @@ class KELODR_EXPORT Request {
 
   /// Sets one field, unchecked: `isValid` is the check.
   /// @{
-  void setAPI(const std::string& value);
-  void setMethod(const std::string& value);
-  void setVersion(int value);
-  void setTimeout(int seconds);
-  void setEncryptRequired(bool required);
-  void setUploadFile(const UploadFileDescription& file);
+  void setAPI(const std::string& newApi);
+  void setMethod(const std::string& newMethod);
+  void setVersion(int newVersion);
+  void setTimeout(int newTimeout);  ///< in seconds
+  void setEncryptRequired(bool newEncryptRequired);
+  void setUploadFile(const UploadFileDescription& newUploadFile);
   /// @}
 
   /// The fields. A reference is valid until its field is next changed.

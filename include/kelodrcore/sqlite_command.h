@@ -91,7 +91,7 @@ class KELODR_EXPORT InsertCommand : public SqliteCommand {
   void SetFieldValues(const SqliteValueList& list);
 
   /// True makes the statement INSERT OR REPLACE INTO.
-  void SetReplacable(bool isReplacable);
+  void SetReplacable(bool newReplacable);
 
   /// Sets one field; an earlier value of that name is replaced. False for an empty name or a null
   /// text, with a line at ERR. T is `std::string`, `const char*`, `bool`, `int`, `unsigned int` or
@@ -136,7 +136,7 @@ class KELODR_EXPORT UpdateCommand : public SqliteCommand {
   bool SetCondition(const std::string& text);
 
   /// Sets the condition's text as above. False for an invalid condition, with a line at ERR.
-  bool SetCondition(const SqliteCondition& sqliteCondition);
+  bool SetCondition(const SqliteCondition& newCondition);
 
  private:
   bool AddField(const std::string& field, const SqliteValue& value);
@@ -172,9 +172,9 @@ class KELODR_EXPORT SelectCommand : public SqliteCommand {
   /// field. SQLite applies it to that field and sorts by the fields before it in ascending order.
   void SetOrderByDESC();
 
-  /// Skips `first` rows and reads at most `count`. False, with nothing changed, for a `first` below
-  /// 0 or a `count` below 1.
-  bool SetLimit(int first, int count);
+  /// Skips `newOffset` rows and reads at most `count`. False, with nothing changed, for a
+  /// `newOffset` below 0 or a `count` below 1.
+  bool SetLimit(int newOffset, int count);
 
   /// Reads at most `count` rows; the offset keeps its value. False for a `count` below 1.
   bool SetLimit(int count);
@@ -183,7 +183,7 @@ class KELODR_EXPORT SelectCommand : public SqliteCommand {
   bool SetCondition(const std::string& text);
 
   /// Sets the condition's text as above. False for an invalid condition, with a line at ERR.
-  bool SetCondition(const SqliteCondition& sqliteCondition);
+  bool SetCondition(const SqliteCondition& newCondition);
 
  private:
   bool selectAll = false;
@@ -212,7 +212,7 @@ class KELODR_EXPORT DeleteCommand : public SqliteCommand {
   bool SetCondition(const std::string& text);
 
   /// Sets the condition's text as above. False for an invalid condition, with a line at ERR.
-  bool SetCondition(const SqliteCondition& sqliteCondition);
+  bool SetCondition(const SqliteCondition& newCondition);
 
  private:
   bool deleteAll = false;

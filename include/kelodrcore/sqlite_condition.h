@@ -34,7 +34,7 @@ class KELODR_EXPORT SqliteCondition {
   SqliteCondition();
 
   /// The given text, unchanged and unchecked. Implicit: a text is a condition.
-  SqliteCondition(const std::string& conditionText);  // NOLINT(google-explicit-constructor)
+  SqliteCondition(const std::string& newText);  // NOLINT(google-explicit-constructor)
 
   /// True when there is a text.
   [[nodiscard]] virtual bool IsValid() const;
@@ -104,20 +104,20 @@ class KELODR_EXPORT SqliteIsNull : public SqliteCondition {
 class KELODR_EXPORT SqliteInFamily : public SqliteCondition {
  public:
   /// Sets the keyword only; any other than "IN" or "NOT IN" makes every setter fail.
-  explicit SqliteInFamily(const std::string& listKeyword);
+  explicit SqliteInFamily(const std::string& newKeyword);
 
   /// Sets the keyword, then calls `SetValue`.
   /// @{
-  SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+  SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                  const std::vector<SqliteValue>& values);
-  SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+  SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                  std::initializer_list<SqliteValue> values);
   template <typename T>
-  SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+  SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                  std::initializer_list<T> values)
-      : SqliteInFamily(listKeyword, lvalue,
-                       std::vector<SqliteValue>(values.begin(), values.end())) {}
-  SqliteInFamily(const std::string& listKeyword, const std::string& lvalue,
+      : SqliteInFamily(newKeyword, lvalue, std::vector<SqliteValue>(values.begin(), values.end())) {
+  }
+  SqliteInFamily(const std::string& newKeyword, const std::string& lvalue,
                  const std::string& value);
   /// @}
 

@@ -18,7 +18,7 @@ class KELODR_EXPORT SqliteTableHandler {
   SqliteTableHandler();
 
   /// Copies the two texts.
-  SqliteTableHandler(const std::string& name, const std::string& columns);
+  SqliteTableHandler(const std::string& newTableName, const std::string& newColumnDefs);
 
   /// Copies both fields.
   /// @{
