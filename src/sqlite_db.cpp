@@ -48,11 +48,11 @@ const char* ColumnText(sqlite3_stmt* stmt, int column) {
 }
 
 template <typename Payload>
-void AddField(SqliteValueList& record, const std::string& name, const Payload& payload) {
+void AddField(SqliteValueList& record, std::string name, const Payload& payload) {
   if (name.empty()) {
     record.AddValue(name, payload);  // refuses and logs
   } else {
-    ValueAccess::SetField(record, name, payload);
+    ValueAccess::SetField(record, std::move(name), payload);
   }
 }
 
@@ -60,16 +60,16 @@ SqliteValueList ParseRecord(sqlite3_stmt* stmt) {
   SqliteValueList record;
   const int columns = sqlite3_column_count(stmt);
   for (int column = 0; column < columns; ++column) {
-    const std::string name = ColumnName(stmt, column);
+    const char* const name = ColumnName(stmt, column);
     const int type = sqlite3_column_type(stmt, column);
     if (type == SQLITE_INTEGER) {
       AddField(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
     } else if (type == SQLITE_TEXT) {
       AddField(record, name, ColumnText(stmt, column));
     } else if (type == SQLITE_NULL) {
-      KELODR_LOG(WARN, __func__, "field [%s] has null value", name.c_str());
+      KELODR_LOG(WARN, __func__, "field [%s] has null value", name);
     } else {
-      KELODR_LOG(WARN, __func__, "Not supported type [%d] with field [%s]", type, name.c_str());
+      KELODR_LOG(WARN, __func__, "Not supported type [%d] with field [%s]", type, name);
     }
   }
   return record;
