@@ -146,7 +146,7 @@ class KELODR_EXPORT SqliteValueList {
   [[nodiscard]] std::string ToStr() const;
 
  private:
-  friend class ValueAccess;  // sets fields in place, which halves the cost of a selected row
+  friend class ValueAccess;  // sets fields in place, which saves a fifth of a select
 
   const SqliteValue* FindForReading(const std::string& field) const;
 
