@@ -7,6 +7,7 @@
 
 #include "attack/attack.h"
 #include "kelodrcore/file_lock.h"
+#include "support/test_cache.h"
 
 using KeloDRCore::FileLock;
 
@@ -226,6 +227,21 @@ TEST_F(LockAttackTest, SwappingTheLockDirectoryLeadsRootNowhere) {
     EXPECT_EQ(NamesIn(kHome), Names{});
     ExpectLocks("name");
     ExpectRootsDirectory(kTop);
+  });
+}
+
+TEST_F(LockAttackTest, ALockThatCannotBeOpenedDoesNotHoldUpACache) {
+  Attack([] {
+    const std::string path = InTop("/tmp/default_dr_cache.lock");
+    AsUser([&] {
+      std::filesystem::create_directories(InTop("tmp"));
+      MakeQueue(path);
+    });
+    TestCache cache("", "", 1000, true, 0);
+    cache.FetchGives("fresh");
+    alarm(10);
+    EXPECT_FALSE(cache.Update());
+    EXPECT_EQ(cache.Read(), Json::Value());
   });
 }
 
