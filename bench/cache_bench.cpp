@@ -17,7 +17,7 @@ void Measure(size_t size) {
     Require(cache.UpdateWithData(data) && cache.Read() == data, "the documents differ");
     for (auto _ : state) benchmark::DoNotOptimize(cache.Read());
   });
-  Register("Cache::Read", work, Baseline(1.2), [=](benchmark::State& state) {
+  Register("Cache::Read", work, Baseline(1.3), [=](benchmark::State& state) {
     const std::string path = ScratchPath(name + ".by_hand");
     WriteWhole(path, WriteWithJsonCpp(data));
     const CacheByHand cache(path, data);

@@ -18,7 +18,8 @@ CacheByHand::CacheByHand(const std::string& file, const Json::Value& document)
 
 bool CacheByHand::Look(time_t& modified) const {
   struct stat status;
-  if (access(path.c_str(), F_OK) != 0 || stat(path.c_str(), &status) != 0) return false;
+  if (access(path.c_str(), F_OK) != 0 || lstat(path.c_str(), &status) != 0) return false;
+  if (!S_ISREG(status.st_mode) || (status.st_uid != 0 && status.st_uid != geteuid())) return false;
   modified = status.st_mtime;
   return true;
 }
@@ -32,7 +33,7 @@ Json::Value CacheByHand::Read() const {
   return copy;
 }
 
-LockByHand::LockByHand(const std::string& lockDir) : dir(lockDir), path(dir + "/by_hand"), fd(-1) {
+LockByHand::LockByHand(const std::string& dir) : path(dir + "/by_hand") {
   mkdir(dir.c_str(), 0755);
   fd = open(path.c_str(), O_RDONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600);
   uid = geteuid();
@@ -49,9 +50,8 @@ bool LockByHand::IsAtPath() const {
 }
 
 bool LockByHand::Lock(int type, unsigned int timeout) {
-  struct stat parent = {};
   if (geteuid() != uid || getegid() != gid) return false;
-  if (stat(dir.c_str(), &parent) != 0 || !S_ISDIR(parent.st_mode) || !IsAtPath()) return false;
+  if (!IsAtPath()) return false;
   bool locked = flock(fd, type) == 0 && IsAtPath();
   for (unsigned int waited = 0; !locked && waited < timeout * 20; ++waited) {
     usleep(50000);

@@ -23,7 +23,8 @@ class DocumentCache : public KeloDRCore::Cache {
   bool IsValidData(const Json::Value& data) const override { return data.isArray(); }
 };
 
-// The system calls of a fresh read, and one copy of the document, which the file is taken to hold.
+// The system calls of a fresh read (is the file there, and believed, and how old?), and one copy of
+// the document, which the file is taken to hold.
 class CacheByHand {
  public:
   CacheByHand(const std::string& path, const Json::Value& document);
@@ -39,8 +40,7 @@ class CacheByHand {
 };
 
 // The system calls that a privileged lock on a named file takes: the ids are looked at on both
-// sides of either step, the directory and the file before the file is locked, the file again
-// behind it.
+// sides of either step, the file before it is locked and again behind that.
 class LockByHand {
  public:
   explicit LockByHand(const std::string& dir);
@@ -55,7 +55,6 @@ class LockByHand {
  private:
   bool IsAtPath() const;
 
-  std::string dir;
   std::string path;
   int fd;
   uid_t uid;

@@ -21,7 +21,7 @@ const Benchmarks registered([] {
       lock.unlock();
     }
   });
-  Register(operation, work, Baseline(1.2), [](benchmark::State& state) {
+  Register(operation, work, Baseline(1.3), [](benchmark::State& state) {
     LockByHand lock(ScratchPath("locks"));
     for (auto _ : state) {
       Require(lock.Lock(LOCK_EX | LOCK_NB, 0), "lock");

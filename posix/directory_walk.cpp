@@ -37,14 +37,12 @@ bool Secure(int directory) {
          Retry([&] { return fchmod(directory, kMode); }) == 0;
 }
 
-// After a failure to open it: whether what is no directory could be taken away. A file of root's is
-// no stranger's work, but for a hard link to one in the place of the first step.
-bool RemovePlanted(int parent, const Step& step) {
-  struct stat found = {};
+// After a failure to open it: whether what is no directory could be taken away. In the place of the
+// first step, even a file of root's may be a stranger's work: a hard link.
+bool ClearStep(int parent, const Step& step) {
   if ((errno != ENOTDIR && errno != ELOOP) || geteuid() != 0 || !step.isBelow) return false;
-  if (!StatAt(parent, step.name, AT_SYMLINK_NOFOLLOW, found)) return errno == ENOENT;
-  if (!step.isFirst && found.st_uid == 0) return false;
-  return Retry([&] { return unlinkat(parent, step.name.c_str(), 0); }) == 0;
+  if (!step.isFirst) return ClearPlanted(parent, step.name);
+  return Retry([&] { return unlinkat(parent, step.name.c_str(), 0); }) == 0 || errno == ENOENT;
 }
 
 // Its owner may have moved the directory away before it was secured.
@@ -71,7 +69,7 @@ Descriptor OpenStep(int parent, const Step& step, const std::string& path,
       if (IsAt(parent, step.name, opened.Get())) return opened;
     } else if (errno == ENOENT) {
       if (!Make(parent, step.name) && !make(step.path)) return {};
-    } else if (!RemovePlanted(parent, step)) {
+    } else if (!ClearStep(parent, step)) {
       // Below the first step the way is safe, and the whole directory is what cannot be made.
       make(step.isFirst ? step.path : path);
       return {};
@@ -81,6 +79,17 @@ Descriptor OpenStep(int parent, const Step& step, const std::string& path,
 }
 
 }  // namespace
+
+bool ClearPlanted(int directory, const std::string& name) {
+  struct stat found = {};
+  if (geteuid() != 0 || !StatAt(directory, name, AT_SYMLINK_NOFOLLOW, found)) return false;
+  if (found.st_uid == 0) return false;
+  if (!S_ISDIR(found.st_mode)) {
+    return Retry([&] { return unlinkat(directory, name.c_str(), 0); }) == 0;
+  }
+  const std::string aside = name + ".planted-" + std::to_string(found.st_ino);
+  return Retry([&] { return renameat(directory, name.c_str(), directory, aside.c_str()); }) == 0;
+}
 
 Descriptor OpenStepwise(const std::string& start, const std::string& path,
                         const MakeDirectory& make) {

@@ -27,6 +27,10 @@ using MakeDirectory = std::function<bool(const std::string& path)>;
 Descriptor OpenStepwise(const std::string& start, const std::string& path,
                         const MakeDirectory& make);
 
+// As root: takes away what another user has put at a name in the open directory. A directory, which
+// may hold anything, only gets another name.
+bool ClearPlanted(int directory, const std::string& name);
+
 }  // namespace KeloDRCore::Posix
 
 #endif  // KELODRCORE_POSIX_DIRECTORY_WALK_H_

@@ -37,6 +37,7 @@
 #include "kelodrcore/utils.h"
 #include "lock_fork.h"
 #include "log.h"
+#include "posix/directory_walk.h"
 #include "posix/file_io.h"
 #include "posix/trust.h"
 #include "privilege.h"
@@ -165,9 +166,12 @@ int RemovePidFile(const std::string& pidFile) {
   return ret;
 }
 
+// Everything but a directory is replaced by the call itself.
 bool CreatePidFile(const std::string& pidFile) {
   KELODR_PRIVILEGED();
-  return KLIBCProcPidFileCreate(pidFile.c_str()) == 0;
+  return KLIBCProcPidFileCreate(pidFile.c_str()) == 0 ||
+         (errno == EISDIR && Posix::ClearPlanted(AT_FDCWD, pidFile) &&
+          KLIBCProcPidFileCreate(pidFile.c_str()) == 0);
 }
 
 // The live process in a believed pid file, or 0.

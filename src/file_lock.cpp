@@ -80,9 +80,25 @@ Descriptor OpenLockFile(int directory, const std::string& name) {
   return file;
 }
 
+// Whether an open failed because of what stands at the name.
+bool IsWrongKind(int error) {
+  return error == ELOOP || error == EISDIR || error == ENXIO || error == EINVAL;
+}
+
+// The directory may have been a stranger's before it was made root's.
+Descriptor OpenOrReplace(int directory, const std::string& name) {
+  Descriptor file = OpenLockFile(directory, name);
+  const int error = errno;
+  if (!file.IsOpen() && IsWrongKind(error) && Posix::ClearPlanted(directory, name)) {
+    return OpenLockFile(directory, name);
+  }
+  errno = error;
+  return file;
+}
+
 int OpenRegistered(int directory, const std::string& name) {
   const std::lock_guard<std::mutex> guard(openFiles.mutex);
-  Descriptor file = OpenLockFile(directory, name);
+  Descriptor file = OpenOrReplace(directory, name);
   if (file.IsOpen()) openFiles.descriptors.push_back(file.Get());
   return file.Release();
 }

@@ -214,6 +214,34 @@ TEST_F(LockDirectoryTest, OfAnotherOrdinaryUserIsNotAccepted) {
 
 // --- what stands at a lock's name
 
+TEST_F(LockDirectoryTest, ALockFileThatAStrangerPlantedIsReplaced) {
+  const std::string at = std::string(kTop) + "/";
+  Attack(
+      [&] {
+        ASSERT_EQ(mkdir(kTop, 0777), 0);
+        std::filesystem::create_directories(at + "dir/full");
+        std::filesystem::create_directory(at + "empty");
+        std::filesystem::create_symlink("/tmp/elsewhere", at + "link");
+        ASSERT_EQ(mkfifo((at + "queue").c_str(), 0666), 0);
+        MakeSocket(at + "socket");
+      },
+      [&] {
+        for (const char* planted : {"dir", "empty", "link", "queue", "socket"})
+          ExpectLocks(planted);
+        EXPECT_FALSE(std::filesystem::exists("/tmp/elsewhere"));
+      });
+}
+
+// Its lock goes on.
+TEST_F(LockDirectoryTest, ALockFileOfAnotherUserIsShared) {
+  Attack([] { FileLock("lock").openLockedFile(); },
+         [] {
+           const ino_t before = StateOf(kTop + std::string("/lock")).st_ino;
+           ExpectLocks("lock");
+           EXPECT_EQ(StateOf(kTop + std::string("/lock")).st_ino, before);
+         });
+}
+
 TEST_F(LockDirectoryTest, ALockFileThatIsAQueueOrASocketIsRefusedAtOnce) {
   Attack([] {},
          [] {
