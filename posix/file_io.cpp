@@ -40,13 +40,6 @@ bool IsSameFile(const struct stat& one, const struct stat& other) {
   return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
-bool HasName(int fd, const std::string& path) {
-  struct stat open = {};
-  struct stat named = {};
-  return Stat(fd, open) && StatAt(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, named) &&
-         IsSameFile(open, named);
-}
-
 bool ReadAll(int fd, std::string& text, size_t limit) {
   // Files of /proc give a size of 0, and some of them their content to the first read only.
   constexpr size_t kSmallestRead = 4096;

@@ -35,10 +35,8 @@ bool StatAt(int directory, const std::string& path, int flags, struct stat& foun
 
 bool IsSameFile(const struct stat& one, const struct stat& other);
 
-// Whether `fd` is still the file that has this name; a link at the name is another file.
-bool HasName(int fd, const std::string& path);
-
-// Reads from the current position to the end, or up to `limit` bytes.
+// Reads from the current position to the end, or up to `limit` bytes. `text` is unspecified after a
+// failure.
 bool ReadAll(int fd, std::string& text, size_t limit = std::string::npos);
 
 bool WriteAll(int fd, std::string_view text);

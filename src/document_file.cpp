@@ -28,7 +28,6 @@
 
 #include <cerrno>
 #include <climits>
-#include <optional>
 #include <utility>
 
 #include "json_text.h"
@@ -105,15 +104,15 @@ bool MoveAway(int directory, const std::string& name) {
          errno == ENOENT;
 }
 
-bool IsDecoy(const struct stat& link, const struct stat& directory) {
+// As fs.protected_symlinks has it, whatever that switch says.
+bool IsStrangers(const struct stat& link, const struct stat& directory) {
   constexpr mode_t kShared = S_ISVTX | S_IWOTH;
   return (directory.st_mode & kShared) == kShared && link.st_uid != geteuid() &&
          link.st_uid != directory.st_uid;
 }
 
-// Where the link at `place` leads; nothing when no link is there. As fs.protected_symlinks has it,
-// and without it too, a stranger's link in a directory like /tmp is refused. What is asked is open:
-// nothing takes its place in between.
+// Where the link at `place` leads; nothing when no link is there. The link is open while it is
+// looked at and read: nothing takes its place in between.
 bool ReadLink(const Place& place, std::string& target) {
   target.clear();
   const Descriptor link = OpenAt(place.directory.Get(), place.name, O_PATH | O_NOFOLLOW);
@@ -122,7 +121,7 @@ bool ReadLink(const Place& place, std::string& target) {
   struct stat directory = {};
   if (!StatFile(link, found) || !StatFile(place.directory, directory)) return false;
   if (!S_ISLNK(found.st_mode)) return true;
-  if (IsDecoy(found, directory)) return Fail(EACCES);
+  if (IsStrangers(found, directory)) return Fail(EACCES);
   char buffer[PATH_MAX];
   const ssize_t size = Retry([&] { return readlinkat(link.Get(), "", buffer, sizeof buffer); });
   if (size < 0) return false;
@@ -264,7 +263,7 @@ Temporary::Try Temporary::RemoveFound(int attempt) const {
 
 Temporary::Try Temporary::RemoveLeftover() const {
   // Whatever takes its place before it is opened must neither be followed nor waited for.
-  const Descriptor opened = OpenAt(Directory(), name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK);
+  const Descriptor opened = OpenAt(Directory(), name, O_RDONLY | O_NOFOLLOW | Posix::kHarmless);
   if (!opened.IsOpen()) return errno == ENOENT ? Try::kAgain : Try::kFailed;
   const Try locked = Lock(opened);
   if (locked != Try::kDone) return locked;
