@@ -8,7 +8,7 @@ set -euo pipefail
 source "$(dirname "$0")/common.sh"
 inputs=${1:-100000}
 targets=("${@:2}")
-[ ${#targets[@]} -gt 0 ] || targets=(command key_value literal request response)
+[ ${#targets[@]} -gt 0 ] || targets=(bulk command key_value literal request response)
 takes_number INPUTS "$inputs"
 for target in "${targets[@]}"; do
   [ -f "fuzz/${target}_fuzz.cpp" ] || wrong_usage "there is no fuzz target '$target'"
