@@ -1,13 +1,15 @@
 #!/usr/bin/env python3
-"""Changes one condition, constant or call of src/ at a time and counts what the tests notice.
+"""Changes one condition, constant or call of the library at a time and counts what the tests notice.
 
-Each mutant of a source file is compiled and linked into a library of its own, which the test
-programs of the dev build (cmake --build --preset dev comes first) load instead of theirs. They run
-as root in namespaces of their own, where only /tmp can be written: a mutant may remove anything.
+All sources and headers of src/, posix/, platform/ and include/ are changed. Each mutant is compiled and linked into a
+library of its own, which the test programs of the dev build (scripts/build.sh dev comes first) load instead of
+theirs; a program that has a part of the mutant in itself is linked anew. The programs run as root in namespaces of
+their own, where only /tmp can be written: a mutant may remove anything.
 
-Results are kept in build/mutation/results.tsv by the text of the line: a stopped run goes on, and a
-changed line is measured anew. The order is random but always the same, so that any part of a run
-is a fair sample.
+A file is tested by the programs of its name: X.cpp and X.h by X_test, X_*_test, fault_X_test and so on.
+
+Results are kept in build/mutation/results.tsv by the text of the line: a stopped run goes on, and a changed line is
+measured anew. The order is random but always the same, so that any part of a run is a fair sample.
 """
 
 import argparse
@@ -25,34 +27,37 @@ import threading
 import time
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
-BUILD = ROOT / "build" / "dev"
-WORK = ROOT / "build" / "mutation"
+BUILDS = pathlib.Path(os.environ.get("KELODR_BUILD_DIR", ROOT / "build"))
+BUILD = BUILDS / "dev"
+WORK = BUILDS / "mutation"
 RESULTS = WORK / "results.tsv"
+FOLDERS = ["src", "posix", "platform", "include/kelodrcore"]
 
-# The test programs of each source file, the quickest first; the first that fails ends a mutant.
-TESTS = {
-    "cache": ["cache_test", "intercepted_cache_test", "cache_process_test", "fault_cache_test"],
-    "container": ["container_test"],
-    "document_file": ["intercepted_document_test", "json_value_test", "fault_json_test",
-                      "kill_file_test --gtest_filter=PowerLoss*:*ReachesTheDisk*"],
-    "err": ["err_test"],
-    "file": ["file_test", "key_value_test", "intercepted_file_test", "fault_file_test"],
-    "file_lock": ["file_lock_test", "fault_file_lock_test"],
-    "json_text": ["json_value_test", "intercepted_locale_test", "response_test"],
-    "json_value": ["json_value_test", "fault_json_test"],
-    "privilege": ["privilege_test", "file_test", "cache_test"],
-    "request": ["request_test"],
-    "response": ["response_test"],
-    "sqlite_command": ["sqlite_command_test", "sqlite_select_command_test", "layout_test"],
-    "sqlite_condition": ["sqlite_condition_test"],
-    "sqlite_db": ["sqlite_db_test", "sqlite_db_row_test", "sqlite_db_table_test",
-                  "sqlite_db_retry_test", "sqlite_db_process_test", "sqlite_db_memory_test",
-                  "fault_sqlite_db_test"],
-    "sqlite_table_handler": ["sqlite_table_handler_test"],
-    "sqlite_value": ["sqlite_value_list_test", "sqlite_db_row_test", "sqlite_value_test"],
-    "utils": ["utils_test", "fault_utils_test"],
-    "validator": ["utils_test"],
+# The names of further tests, for files of which no test, or not every one, has the name.
+MORE_NAMES = {
+    "descriptor": ["file", "file_lock", "json_value"],
+    "directory_walk": ["file_lock"],
+    "document_file": ["json_value", "json", "document", "file", "short_transfer"],
+    "file": ["key_value", "short_transfer"],
+    "file_io": ["file", "json_value", "platform"],
+    "json_text": ["json_value", "locale", "response"],
+    "json_value": ["json"],
+    "kelocore": ["platform"],
+    "kelocore_process": ["platform"],
+    "kelorandom": ["platform", "utils"],
+    "lock_fork": ["file_lock", "cache"],
+    "log": ["file_lock", "sqlite_value"],
+    "privilege": ["file", "cache"],
+    "retry": ["file", "file_lock", "platform"],
+    "sqlite_bulk": ["sqlite_transaction", "sqlite_db"],
+    "sqlite_command": ["sqlite_select_command", "layout"],
+    "sqlite_value": ["sqlite_db_row"],
+    "trust": ["json_value", "cache"],
+    "validator": ["utils"],
+    "value_access": ["sqlite_value"],
 }
+# Sweeps of kills take minutes; the other tests of those programs do not.
+KILL_FILTER = "--gtest_filter=-*Killed*"
 
 # The formatter puts blanks around binary operators and none around template brackets.
 # The call of a statement is removed as a whole; a string gets a byte more in front.
@@ -66,8 +71,7 @@ BOOLEAN = re.compile(r"\b(true|false)\b")
 CONDITION = re.compile(r"\b(?:if|while) \(")
 CALL = re.compile(r"^ +(?:(?:\(void\))?[\w:.>-]+\(.*\));$", re.M)
 STRING = re.compile(r'"(?:[^"\\\n]|\\.)*"')
-# The object of a source file that a test program has a copy of.
-COPY = re.compile(r"tests/CMakeFiles/\S+/__/src/(\w+)\.cpp\.o")
+OBJECT = re.compile(r"\S+\.o(?= )")
 # Every mount of the file system read-only but /tmp; a shell is process 1 there and takes orphans. A
 # program that ends before its last test, with whatever status, leaves the file.
 SANDBOX = ["unshare", "--mount", "--pid", "--fork", "--kill-child", "--mount-proc", "bash", "-c",
@@ -131,56 +135,127 @@ def mutants_of(path):
         column = start - (text.rfind("\n", 0, start) + 1)
         old = text[start:end].replace("\n", " ")
         shown = " ".join(new.split()) if new.startswith("!(") else new.strip()
-        key = f"{path.stem}\t{lines[line - 1].strip()}\t{column}\t{old.strip()} => {shown}"
+        key = f"{path.relative_to(ROOT)}\t{lines[line - 1].strip()}\t{column}\t{old.strip()} => {shown}"
         seen[key] += 1
         yield Mutant(path, line, start, end, new, re.sub(r" +", " ", f"{key}\t{seen[key]}"))
 
 
+def library_files():
+    return [path for folder in FOLDERS for path in sorted((ROOT / folder).iterdir())
+            if path.suffix in (".cpp", ".h")]
+
+
+def tests_of(path):
+    """The test programs of a file of the library."""
+    stems = {file.stem for file in library_files()}
+    programs = []
+    for source in sorted(ROOT.glob("tests/*/*_test.cpp")):
+        tested = re.sub(r"^(fault|intercepted|kill)_", "", source.stem) + "_"
+        owner = max((stem for stem in stems if tested.startswith(stem + "_")), key=len, default="")
+        names = [path.stem] + MORE_NAMES.get(path.stem, [])
+        if source.parent.name != "support" and any(
+                tested.startswith(name + "_") and len(owner) <= len(name) for name in names):
+            programs.append(source.stem)
+    return programs or sys.exit(f"mutate.py: {path.name} has no tests; MORE_NAMES can name them")
+
+
+class Commands:
+    """The commands of the dev build, and the files that each object is compiled from."""
+
+    def __init__(self):
+        self.compile, self.link, self.files = {}, {}, {}
+        for entry in json.loads(self.ninja("compdb")):
+            output, command = entry["output"], re.sub(r" && cd .*", "", entry["command"])
+            if output.endswith(".o") and entry["file"].endswith(".cpp"):
+                self.compile[output] = command
+            elif re.fullmatch(r"src/libkelodrcore\.so\.\d+\.[\d.]+|tests/\w+_test", output) and command:
+                self.link[output] = command
+        for part in self.ninja("deps").split("\n\n"):
+            head, *files = part.split("\n")
+            self.files[head.split(":")[0]] = {os.path.normpath(BUILD / file.strip()) for file in files}
+        self.library = next(output for output in self.link if output.startswith("src/"))
+
+    @staticmethod
+    def ninja(tool):
+        return subprocess.run(["ninja", "-C", str(BUILD), "-t", tool], check=True,
+                              capture_output=True, text=True).stdout
+
+    def objects_of(self, output, path):
+        """The objects of a library or program that the file is part of."""
+        objects = OBJECT.findall(self.link[output])
+        return [one for one in objects if str(path) in self.files.get(one, ())]
+
+
 class Worker:
-    """Builds and tests mutants in a directory of its own."""
+    """Builds and tests mutants in a directory of its own, on a mirror of the tree's sources."""
 
     def __init__(self, commands, number):
         self.dir = WORK / f"worker{number}"
-        self.dir.mkdir(parents=True, exist_ok=True)
+        self.mirror = self.dir / "mirror"
         self.commands = commands
-        self.linked = set()  # the test programs with a copy of what the mutant changes
+        self.linked = set()  # the test programs that are linked anew
+        shutil.rmtree(self.dir, ignore_errors=True)
+        for path in [*library_files(), *ROOT.glob("tests/*/*.cpp"), *ROOT.glob("tests/*/*.h")]:
+            place = self.mirror / path.relative_to(ROOT)
+            place.parent.mkdir(parents=True, exist_ok=True)
+            place.symlink_to(path)
 
     def run_mutant(self, mutant, limits):
         text = mutant.file.read_text()
-        source = self.dir / mutant.file.name
+        source = self.mirror / mutant.file.relative_to(ROOT)
+        source.unlink()
         source.write_text(text[:mutant.start] + mutant.new + text[mutant.end:])
-        if not self.build(mutant.file, source):
-            return "not compiled"
-        for test in TESTS[mutant.file.stem]:
-            outcome = self.run_test(test, limits[test])
-            if outcome != "passed":
-                return outcome
-        return "survived"
+        try:
+            tests = sorted(tests_of(mutant.file), key=limits.get)
+            if not self.build(mutant.file, tests):
+                return "not compiled"
+        finally:
+            source.unlink()
+            source.symlink_to(mutant.file)
+        outcomes = (self.run_test(test, limits[test]) for test in tests)
+        return next((outcome for outcome in outcomes if outcome != "passed"), "survived")
 
-    def build(self, original, source):
-        compiler, link, copies = self.commands
-        named, compile_command = compiler[original]
-        compile_command = compile_command.replace(named, str(source))
-        target = re.search(r" -o (\S+)", compile_command).group(1)
-        mutated = self.dir / "mutant.o"
-        compile_command = compile_command.replace(f" -o {target}", f" -o {mutated}")
-        compile_command = re.sub(r" -(Werror|MD|g)\b| -M[TF] \S+", "", compile_command)
-        library = self.dir / "libkelodrcore.so.1"
-        link_command = re.sub(r" -o \S+", f" -o {library}", link.replace(target, str(mutated)))
-        commands = [f"{compile_command} -w -I{ROOT}/src", link_command]
-        self.linked = set()
-        for program, copy, command in copies[original.stem]:
-            name = pathlib.Path(program).name
-            command = command.replace(copy, str(mutated))
-            commands.append(command.replace(f" -o {program}", f" -o {self.dir / name}"))
-            self.linked.add(name)
-        run = lambda command: subprocess.run(command, shell=True, cwd=BUILD, timeout=300,
-                                             capture_output=True).returncode == 0
-        return all(run(command) for command in commands)
+    def build(self, path, tests):
+        """Compiles what the file is part of, and links the library and those programs anew."""
+        library = self.commands.library
+        changed = {library: self.commands.objects_of(library, path)}
+        for test in tests:
+            objects = self.commands.objects_of(f"tests/{test}", path)
+            # The archives of posix/ and platform/ give a program only what is not among its objects.
+            objects += [one for one in changed[library] if not one.startswith("src/")]
+            if objects:
+                changed[f"tests/{test}"] = objects
+        self.linked = {pathlib.Path(output).name for output in changed}
+        return (all(self.compile(one) for one in {one for all_ in changed.values() for one in all_})
+                and all(self.link(output, objects) for output, objects in changed.items()))
 
-    def run_test(self, test, limit):
-        name, *arguments = test.split()
+    def object(self, name):
+        return self.dir / name.replace("/", "_")
+
+    def compile(self, name):
+        command = re.sub(r" -(Werror|MD|g)\b| -M[TF] \S+", "", self.commands.compile[name])
+        for folder in ["src", "posix", "platform", "include", "tests"]:
+            command = command.replace(f"{ROOT}/{folder}", f"{self.mirror}/{folder}")
+        command = command.replace(f"-I{ROOT} ", f"-I{self.mirror} ")
+        return self.run(command.replace(f" -o {name}", f" -o {self.object(name)}") + " -w")
+
+    def link(self, output, objects):
+        command = self.commands.link[output]
+        for name in objects:
+            mutated = str(self.object(name))
+            command = (command.replace(f" {name} ", f" {mutated} ") if f" {name} " in command
+                       else command.replace(" -o ", f" {mutated} -o ", 1))
+        name = "libkelodrcore.so.1" if output == self.commands.library else pathlib.Path(output).name
+        return self.run(command.replace(f" -o {output}", f" -o {self.dir / name}"))
+
+    @staticmethod
+    def run(command):
+        return subprocess.run(command, shell=True, cwd=BUILD, timeout=300,
+                              capture_output=True).returncode == 0
+
+    def run_test(self, name, limit):
         directory = self.dir if name in self.linked else BUILD / "tests"
+        arguments = [KILL_FILTER] if name.startswith("kill_") else []
         command = SANDBOX + [str(directory / name), *arguments, "--gtest_brief=1", "--gtest_fail_fast"]
         process = subprocess.Popen(command, stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
                                    stderr=subprocess.DEVNULL, start_new_session=True,
@@ -192,23 +267,6 @@ class Worker:
             process.kill()
             process.wait()
             return "timed out"
-
-
-def build_commands():
-    database = subprocess.run(["ninja", "-C", str(BUILD), "-t", "compdb"], check=True,
-                              capture_output=True, text=True).stdout
-    compiler, link, copies = {}, None, collections.defaultdict(list)
-    for entry in json.loads(database):
-        path = pathlib.Path(entry["directory"], entry["file"])
-        copy = COPY.search(entry["command"])
-        if copy and path.suffix != ".cpp":
-            command = re.sub(r" && cd .*", "", entry["command"])  # without looking for its tests
-            copies[copy.group(1)].append((entry["output"], copy.group(), command))
-        if "/kelodrcore.dir/" in entry["output"] and path.suffix == ".cpp":
-            compiler[path.resolve()] = entry["file"], entry["command"]
-        if re.fullmatch(r"src/libkelodrcore\.so\.\d+\.[\d.]+", entry["output"]):
-            link = entry["command"]
-    return compiler, link, copies
 
 
 def read_results():
@@ -233,9 +291,9 @@ def measured_limits(worker, programs):
 
 
 def run_all(mutants, minutes, jobs):
-    commands = build_commands()
+    commands = Commands()
     workers = [Worker(commands, number) for number in range(jobs)]
-    limits = measured_limits(workers[0], {p for m in mutants for p in TESTS[m.file.stem]})
+    limits = measured_limits(workers[0], {test for path in {m.file for m in mutants} for test in tests_of(path)})
     deadline = time.monotonic() + 60 * minutes
     lock = threading.Lock()
 
@@ -282,14 +340,14 @@ def main():
     parser = argparse.ArgumentParser(description=__doc__,
                                      formatter_class=argparse.RawDescriptionHelpFormatter)
     parser.add_argument("--minutes", type=float, default=60, help="stop after that long (60)")
-    parser.add_argument("--files", nargs="*", help="file names of src/ without .cpp; all without")
+    parser.add_argument("--files", nargs="*", help="files of the library by their names, without .cpp and .h; all without")
     parser.add_argument("--jobs", type=int, default=2, help="how many at once (2)")
     parser.add_argument("--retry", action="store_true", help="measure again what survived or timed out")
     parser.add_argument("--report", action="store_true", help="only show what was measured")
     arguments = parser.parse_args()
 
     WORK.mkdir(parents=True, exist_ok=True)
-    files = [ROOT / "src" / f"{name}.cpp" for name in arguments.files or TESTS]
+    files = [path for path in library_files() if not arguments.files or path.stem in arguments.files]
     mutants = [mutant for path in files for mutant in mutants_of(path)]
     if not arguments.report:
         results = read_results()

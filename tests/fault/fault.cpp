@@ -140,9 +140,6 @@ Suspension::~Suspension() { --suspensions; }
 
 }  // namespace Fault
 
-// For what is no call of the library's, at the end of a process (coverage_exit.cpp).
-extern "C" void KelodrSuspendFaults() { ++suspensions; }
-
 void FaultTest::SetUp() {
   CleanTest::SetUp();
   bystander = memfd_create("bystander", MFD_CLOEXEC);

@@ -20,7 +20,6 @@
 #include <thread>
 
 #include "kelodrcore/file_lock.h"
-#include "support/counting_generator.h"
 #include "support/process.h"
 #include "support/test_clock.h"
 

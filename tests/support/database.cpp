@@ -5,7 +5,7 @@
 #include <unistd.h>
 
 #include "kelodrcore/json_value.h"
-#include "support/sleep.h"
+#include "support/test_clock.h"
 
 namespace {
 

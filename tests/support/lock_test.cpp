@@ -9,7 +9,7 @@
 #include <filesystem>
 
 #include "kelodrcore/file_lock.h"
-#include "support/sleep.h"
+#include "support/test_clock.h"
 
 namespace LockCalls {
 

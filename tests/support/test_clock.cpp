@@ -1,19 +1,52 @@
 #include "support/test_clock.h"
 
-#include <optional>
-#include <utility>
+#include <dlfcn.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
-#include "support/sleep.h"
+#include <cstring>
+#include <utility>
 
 namespace {
 
 std::optional<time_t> fixedTime;
+SleepStandIn sleepStandIn;
 std::vector<unsigned int> sleeps;
+bool counting = false;
+unsigned int nextDraw = 0;
+
+// The `timespec` of calls without 64-bit times, whatever this program itself is compiled with.
+struct Length {
+  long seconds;
+  long nanoseconds;
+};
+
+std::optional<int> Ask(useconds_t microseconds) {
+  return sleepStandIn ? sleepStandIn(microseconds) : std::nullopt;
+}
+
+// What the stand-in answers to a sleep of a shared library.
+std::optional<int> AskFor(const void* caller, const Length* length) {
+  Dl_info calling = {};
+  Dl_info own = {};
+  const bool isOwn = dladdr(caller, &calling) != 0 && dladdr(&sleeps, &own) != 0 &&
+                     calling.dli_fbase == own.dli_fbase;
+  if (isOwn) return std::nullopt;
+  return Ask(static_cast<useconds_t>(length->seconds * 1000000 + length->nanoseconds / 1000));
+}
+
+template <typename Function>
+Function* Next(const char* call) {
+  return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, call));
+}
 
 }  // namespace
 
-// The linker lets this stand before the C library's.
-extern "C" time_t time(time_t* out) noexcept {
+// The linker lets these stand before the C library's. Their own names differ, so that the headers'
+// declarations, which vary with the size of times, do not matter.
+extern "C" {
+
+time_t time(time_t* out) noexcept {
   time_t now = 0;
   if (fixedTime) {
     now = *fixedTime;
@@ -25,6 +58,37 @@ extern "C" time_t time(time_t* out) noexcept {
   if (out != nullptr) *out = now;
   return now;
 }
+
+int usleep(useconds_t microseconds) {
+  if (const std::optional<int> answer = Ask(microseconds)) return *answer;
+  return Next<int(useconds_t)>("usleep")(microseconds);
+}
+
+int TestClock_nanosleep(const Length* length, Length* rest) __asm__("nanosleep");
+int TestClock_nanosleep(const Length* length, Length* rest) {
+  if (const auto answer = AskFor(__builtin_return_address(0), length)) return *answer;
+  return Next<int(const Length*, Length*)>("nanosleep")(length, rest);
+}
+
+int TestClock_clock_nanosleep(int clock, int flags, const Length* length,
+                              Length* rest) __asm__("clock_nanosleep");
+int TestClock_clock_nanosleep(int clock, int flags, const Length* length, Length* rest) {
+  if (flags == 0) {  // else the length is a point in time
+    if (const auto answer = AskFor(__builtin_return_address(0), length)) return *answer;
+  }
+  return Next<int(int, int, const Length*, Length*)>("clock_nanosleep")(clock, flags, length, rest);
+}
+
+ssize_t getrandom(void* data, size_t size, unsigned int flags) {
+  if (!counting || size != sizeof nextDraw) return syscall(SYS_getrandom, data, size, flags);
+  std::memcpy(data, &nextDraw, size);
+  ++nextDraw;
+  return static_cast<ssize_t>(size);
+}
+
+}  // extern "C"
+
+void ReplaceSleeps(SleepStandIn standIn) { sleepStandIn = std::move(standIn); }
 
 namespace TestClock {
 
@@ -47,3 +111,10 @@ void Reset() {
 }
 
 }  // namespace TestClock
+
+CountingGenerator::CountingGenerator() {
+  nextDraw = 0;
+  counting = true;
+}
+
+CountingGenerator::~CountingGenerator() { counting = false; }

@@ -10,7 +10,6 @@
 #include <filesystem>
 
 #include "kelodrcore/json_value.h"
-#include "support/counting_generator.h"
 #include "support/test_cache.h"
 #include "support/test_clock.h"
 

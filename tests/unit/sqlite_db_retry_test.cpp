@@ -7,8 +7,8 @@
 #include <set>
 
 #include "kelodrcore/sqlite_db.h"
-#include "support/counting_generator.h"
 #include "support/database.h"
+#include "support/test_clock.h"
 
 namespace {
 

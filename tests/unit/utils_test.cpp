@@ -13,7 +13,7 @@
 #include <vector>
 
 #include "support/clean_test.h"
-#include "support/sleep.h"
+#include "support/test_clock.h"
 
 namespace {
 
