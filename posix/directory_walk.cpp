@@ -59,6 +59,11 @@ bool Make(int parent, const std::string& name) {
          Retry([&] { return fchmodat(parent, name.c_str(), kMode, 0); }) == 0;
 }
 
+bool IsLink(int parent, const std::string& name) {
+  struct stat found = {};
+  return StatAt(parent, name, AT_SYMLINK_NOFOLLOW, found) && S_ISLNK(found.st_mode);
+}
+
 Descriptor OpenStep(int parent, const Step& step, const std::string& path,
                     const MakeDirectory& make) {
   for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
@@ -70,8 +75,9 @@ Descriptor OpenStep(int parent, const Step& step, const std::string& path,
     } else if (errno == ENOENT) {
       if (!Make(parent, step.name) && !make(step.path)) return {};
     } else if (!ClearStep(parent, step)) {
-      // Below the first step the way is safe, and the whole directory is what cannot be made.
-      make(step.isFirst ? step.path : path);
+      // Below the first step the way is safe, and the whole directory is what cannot be made. A
+      // link would be followed on the way to it.
+      make(step.isFirst || IsLink(parent, step.name) ? step.path : path);
       return {};
     }
   }
@@ -87,8 +93,7 @@ bool ClearPlanted(int directory, const std::string& name) {
   if (!S_ISDIR(found.st_mode)) {
     return Retry([&] { return unlinkat(directory, name.c_str(), 0); }) == 0;
   }
-  const std::string aside = name + ".planted-" + std::to_string(found.st_ino);
-  return Retry([&] { return renameat(directory, name.c_str(), directory, aside.c_str()); }) == 0;
+  return MoveAway(directory, name);
 }
 
 Descriptor OpenStepwise(const std::string& start, const std::string& path,

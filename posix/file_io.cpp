@@ -1,9 +1,11 @@
 #include "posix/file_io.h"
 
+#include <sys/random.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdio>
 
 #include "posix/retry.h"
 
@@ -38,6 +40,15 @@ bool StatAt(int directory, const std::string& path, int flags, struct stat& foun
 
 bool IsSameFile(const struct stat& one, const struct stat& other) {
   return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
+bool MoveAway(int directory, const std::string& path) {
+  unsigned long long random = 0;
+  if (Retry([&] { return getrandom(&random, sizeof random, 0); }) < 0) return false;
+  const std::string aside =
+      path.substr(0, path.rfind('/') + 1) + ".planted-" + std::to_string(random);
+  return Retry([&] { return renameat(directory, path.c_str(), directory, aside.c_str()); }) == 0 ||
+         errno == ENOENT;
 }
 
 bool ReadAll(int fd, std::string& text, size_t limit) {

@@ -35,6 +35,10 @@ bool StatAt(int directory, const std::string& path, int flags, struct stat& foun
 
 bool IsSameFile(const struct stat& one, const struct stat& other);
 
+// Gives what strangers may have put at `path` another name beside it, one that nobody can guess and
+// take first. True also when nothing is there.
+bool MoveAway(int directory, const std::string& path);
+
 // Reads from the current position to the end, or up to `limit` bytes. `text` is unspecified after a
 // failure.
 bool ReadAll(int fd, std::string& text, size_t limit = std::string::npos);

@@ -22,7 +22,6 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -49,6 +48,7 @@ constexpr size_t kMaxNameInTemporary = 100;  // some file systems allow 143 byte
 using Posix::Descriptor;
 using Posix::Fail;
 using Posix::IsSameFile;
+using Posix::MoveAway;
 using Posix::OpenAt;
 using Posix::Retry;
 using Posix::StatAt;
@@ -93,15 +93,6 @@ std::string TemporaryName(const std::string& name) {
     while (length > 1 && (static_cast<unsigned char>(name[length]) & 0xC0) == 0x80) --length;
   }
   return "." + name.substr(0, length) + ".kelodr-" + std::to_string(geteuid());
-}
-
-// To a name that is free: nobody can guess it and use it first.
-bool MoveAway(int directory, const std::string& name) {
-  unsigned long long random = 0;
-  if (Retry([&] { return getrandom(&random, sizeof random, 0); }) < 0) return false;
-  const std::string free = TemporaryName(name) + "-" + std::to_string(random);
-  return Retry([&] { return renameat(directory, name.c_str(), directory, free.c_str()); }) == 0 ||
-         errno == ENOENT;
 }
 
 // As fs.protected_symlinks has it, whatever that switch says.

@@ -139,6 +139,23 @@ TEST_F(CacheAttackTest, ALinkToAClaimOfRootsIsNoClaim) {
   });
 }
 
+TEST_F(CacheAttackTest, ADirectoryAtANameOfTheCacheIsNoLastingObstacle) {
+  for (const char* name : {kFallback, kFallbackPid}) {
+    Attack([&] {
+      AsUser([&] {
+        MakeDir(name, 0777, kUser);
+        WriteText(std::string(name) + "/file", "");
+        // What can be guessed of the name that it could get is taken as well.
+        const std::string aside = name + (".planted-" + std::to_string(LookAt(name).st_ino));
+        MakeDir(aside, 0777, kUser);
+        WriteText(aside + "/file", "");
+      });
+      TestCache cache = MakeCache();
+      ExpectRefreshed(cache, kFallback);
+    });
+  }
+}
+
 TEST_F(CacheAttackTest, AQueueAtTheDocumentsNameIsReplaced) {
   Attack([] {
     AsUser([] { MakeQueue(kFallback); });

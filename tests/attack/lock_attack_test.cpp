@@ -113,7 +113,16 @@ TEST_F(LockAttackTest, WhatIsPlantedOnTheWayIsReplaced) {
   });
 }
 
-TEST_F(LockAttackTest, WhatIsPlantedAtALocksNameIsNeitherFollowedNorWaitedFor) {
+TEST_F(LockAttackTest, ALinkOnTheWayIsNotFollowed) {
+  Attack([] {
+    MakeDir(kTop, 0755);
+    MakeLink(kSafeDir, InTop("link"));
+    ExpectNoDirectory("link/name");
+    ExpectNoDirectory("link/sub/name");
+  });
+}
+
+TEST_F(LockAttackTest, WhatIsPlantedAtALocksNameIsReplaced) {
   Attack([] {
     AsUser([] {
       MakeDir(kTop, 0755, kUser);
@@ -123,6 +132,19 @@ TEST_F(LockAttackTest, WhatIsPlantedAtALocksNameIsNeitherFollowedNorWaitedFor) {
       MakeDir(InTop("dir"), 0755, kUser);
     });
     for (const char* name : {"link", "dangling", "queue", "dir"}) {
+      ExpectLocks(name);
+      EXPECT_TRUE(S_ISREG(LookAt(InTop(name)).st_mode)) << name;
+    }
+  });
+}
+
+TEST_F(LockAttackTest, OnlyARegularFileIsALockFile) {
+  Attack([] {
+    MakeDir(kTop, 0755);
+    MakeLink(kSecret, InTop("link"));
+    MakeQueue(InTop("queue"));
+    MakeDir(InTop("dir"), 0755);
+    for (const char* name : {"link", "queue", "dir"}) {
       EXPECT_FALSE(FileLock(name).lock(kExclusive, 0)) << name;
     }
   });
@@ -232,11 +254,9 @@ TEST_F(LockAttackTest, SwappingTheLockDirectoryLeadsRootNowhere) {
 
 TEST_F(LockAttackTest, ALockThatCannotBeOpenedDoesNotHoldUpACache) {
   Attack([] {
-    const std::string path = InTop("/tmp/default_dr_cache.lock");
-    AsUser([&] {
-      std::filesystem::create_directories(InTop("tmp"));
-      MakeQueue(path);
-    });
+    MakeDir(kTop, 0755);
+    MakeDir(InTop("tmp"), 0755);
+    MakeQueue(InTop("tmp/default_dr_cache.lock"));
     TestCache cache("", "", 1000, true, 0);
     cache.FetchGives("fresh");
     alarm(10);
