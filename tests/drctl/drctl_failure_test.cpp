@@ -88,6 +88,16 @@ bool RunWithoutLocks(const std::function<void()>& body) {
   });
 }
 
+TEST_F(DrctlFailureTest, WhoCanTakeNoLockStillSeesTheMounts) {
+  const bool isAllowed = RunWithoutLocks([&] {
+    const Outcome outcome = RunHere("--verbose volume list --cached --cache-dir cache");
+    EXPECT_EQ(outcome.status, 0);
+    EXPECT_NE(outcome.out.find(" tmpfs "), std::string::npos) << outcome.out;
+    EXPECT_NE(outcome.err.find("answered from a fresh scan"), std::string::npos) << outcome.err;
+  });
+  if (!isAllowed) GTEST_SKIP() << "needs the right to mount";
+}
+
 TEST_F(DrctlFailureTest, AScanWithoutALockTellsTheReason) {
   const bool isAllowed = RunWithoutLocks([&] {
     const Outcome outcome = RunHere("call", R"({"api":"Volume","method":"scan","version":1})");
