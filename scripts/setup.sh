@@ -54,11 +54,22 @@ install_missing() {
 sudo apt-get install --no-install-recommends ${missing[*]}"
   fi
   echo "$script: installing ${missing[*]}"
-  if apt_install --simulate >/dev/null 2>&1 && apt_install; then
+  if apt_install --simulate >/dev/null 2>&1 && apt_install 2>/dev/null; then
     return
   fi
-  apt-get update --quiet --quiet
-  apt_install || fail "the packages could not be installed; is there a network? Missing: ${missing[*]}"
+  local log
+  log=$(mktemp)
+  if apt-get update --quiet --quiet 2>"$log" && apt_install 2>>"$log"; then
+    rm "$log"
+    return
+  fi
+  if grep --quiet 'Temporary failure resolving\|Could not connect\|Cannot initiate the connection' "$log"; then
+    rm "$log"
+    fail "the package servers cannot be reached; is there a network? Missing: ${missing[*]}"
+  fi
+  cat "$log" >&2
+  rm "$log"
+  fail "these packages could not be installed: ${missing[*]}"
 }
 
 [ $# -gt 0 ] || wrong_usage "name at least one group"

@@ -14,4 +14,4 @@ scripts/build.sh system-platform
 
 export LD_LIBRARY_PATH=$build/system-platform/src
 ldd "$build/dev/tests/err_test" | grep -q "$LD_LIBRARY_PATH/libkelodrcore"
-ctest --preset dev --test-dir "$build/dev" --parallel "$(nproc)" --label-regex '^(unit|process|fault)$'
+ctest --test-dir "$build/dev" --output-on-failure --no-tests=error --parallel "$(nproc)" --label-regex '^(unit|process|fault)$'
