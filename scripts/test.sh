@@ -58,7 +58,10 @@ if [ -z "$as" ]; then
   options=()
   case $preset in
     tsan) options=(--tests-regex '^ThreadsTest') ;;
-    i386-asan) export ASAN_OPTIONS=quarantine_size_mb=16 ;;
+    i386-asan)
+      export ASAN_OPTIONS=quarantine_size_mb=16
+      options=(--label-exclude '^kill$')
+      ;;
   esac
   exec ctest --test-dir "$build/$preset" --output-on-failure --no-tests=error \
     --parallel "$(nproc)" "${options[@]}"
