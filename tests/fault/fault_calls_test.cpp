@@ -18,8 +18,8 @@ namespace {
 const std::set<std::string> kHarmless = {
     // Memory and text.
     "free", "memchr", "memcmp", "memcpy", "memmove", "memset", "snprintf", "strchr", "strcmp",
-    "strerror", "strerror_r", "strlen", "strrchr", "strspn", "__isoc99_sscanf", "__snprintf_chk",
-    "__memcpy_chk", "__memmove_chk",
+    "strerror", "strerror_r", "strlen", "strrchr", "strspn", "__isoc99_sscanf", "__isoc23_sscanf",
+    "__snprintf_chk", "__memcpy_chk", "__memmove_chk",
     // Numbers.
     "fmod", "trunc", "difftime", "__difftime64", "__udivdi3", "__umoddi3", "__divdi3", "__moddi3",
     "__ctzdi2", "uselocale",
