@@ -248,9 +248,9 @@ void Claim::UnsetUpdating() {
   if (!Lock()) {
     KELODR_LOG(NOTICE, __func__, "Failed to lock to unset cache[%s]", path.c_str());
   }
-  if (ClaimantOf(pidFile) > 0) {
-    // Read again: what cannot be read now may be another's, and one's own is found by the next
-    // look.
+  // Nobody's only when two looks agree: one may fail, and the file may be another's.
+  if (ClaimantOf(pidFile) > 0 || ClaimantOf(pidFile) > 0) {
+    // What cannot be read now may be another's, and one's own is found by the next look.
     const int claimant = KLIBCReadPidFile(pidFile.c_str());
     if (claimant != getpid()) {
       KELODR_LOG(DEBUG, __func__, "Failed to unset updating cache [%s] since different pid[%d]",

@@ -80,4 +80,28 @@ TEST_F(InterceptedCacheTest, IsNotTriedAgainWhereThePidFileIsGone) {
   EXPECT_EQ(NamesIn(dir), (Names{"c.cached", "c.cached.pid"}));
 }
 
+// Whichever call fails while the claim is released.
+TEST_F(InterceptedCacheTest, TheClaimOfAnotherLiveProcessStays) {
+  const std::string pidFile = Path("c.cached.pid");
+  const std::string other = std::to_string(getppid());
+  for (const char* call : {"openat", "fstat", "read", "fstatat"}) {
+    bool hasRun = true;
+    for (int number = 1; hasRun; ++number) {
+      std::unique_ptr<Interception> failure;
+      cache->isValid = [&](const Json::Value& /*data*/) {
+        if (ReadText(pidFile).empty()) return false;  // before the claim
+        WriteText(pidFile, other);
+        failure = std::make_unique<Interception>(call, number, EIO);
+        return false;  // nothing is written: the release comes next
+      };
+      EXPECT_FALSE(cache->Update());
+      hasRun = failure->HasRun();
+      failure.reset();
+      EXPECT_EQ(ReadText(pidFile), other) << call << " " << number;
+      unlink(pidFile.c_str());
+      LogCapture::Clear();
+    }
+  }
+}
+
 }  // namespace
