@@ -236,11 +236,13 @@ TEST_F(DocumentAttackTest, APlantedTemporaryIsNoObstacle) {
   }
 }
 
-TEST_F(DocumentAttackTest, ALockOnAPlantedTemporaryIsNotWaitedFor) {
+TEST_F(DocumentAttackTest, LocksOnAPlantedTemporaryAndOnTheDirectoryAreNoObstacle) {
   Attack([] {
     const UserLoop user([] {
-      const int fd = open(kTemporary, O_RDWR | O_CREAT, 0666);
-      ASSERT_EQ(flock(fd, LOCK_EX), 0);
+      const int temporary = open(kTemporary, O_RDWR | O_CREAT, 0666);
+      const int directory = open("/tmp", O_RDONLY);
+      ASSERT_EQ(flock(temporary, LOCK_EX), 0);
+      ASSERT_EQ(flock(directory, LOCK_EX), 0);
       WriteText(HomePath("locked"), "");
       pause();
     });
