@@ -9,7 +9,11 @@ folder_of() {
   case $1 in
     posix/*) echo posix ;;
     kelodrcore/*) echo include ;;
-    *) find src platform -name "$1" -printf '%h\n' ;;
+    *)
+      for folder in src platform; do
+        if [ -e "$folder/$1" ]; then echo "$folder"; fi
+      done
+      ;;
   esac
 }
 
