@@ -1,5 +1,6 @@
 /// @file
-/// The handle on one SQLite database file, and its error holder.
+/// The handle on one SQLite database file, and its error holder. What reads as an oddity here is
+/// deliberate: programs and log readers rely on it.
 
 #ifndef KELODRCORE_SQLITE_DB_H_
 #define KELODRCORE_SQLITE_DB_H_
@@ -59,20 +60,20 @@ class KELODR_EXPORT ErrRecorder {
 /// 405 for a database that stayed busy or locked, the last two with "sqlite_errcode" and
 /// "sqlite_errmsg" in "err_msg" where SQLite refused. A statement, query or command that succeeds
 /// clears the error. Throws `std::bad_alloc`, what a subclass's `GetErrCodeStr` throws, and what
-/// the function given to `SelectEach` throws; nothing else.
+/// the function given to `SelectEach` throws, nothing else.
 ///
-/// Texts given as SQL are statements, table names, column definitions and conditions. They are run
-/// as they are: build none of them from data of others, for which `SqliteCondition` and the records
-/// are there. A text with a NUL byte would be cut there and mean something else: it fails with 401
-/// and a line at ERR, and nothing of it runs.
+/// Statements, table names, column definitions, field names and conditions given as text are SQL
+/// and run as they are. Before the call: none of them holds data that somebody else wrote; such
+/// data goes into a `SqliteValue`. A text with a NUL byte fails with 401 and a line at ERR, and
+/// does not run: SQLite would run only its start.
 ///
-/// A row that was acknowledged survives the end of the process. When the power fails, SQLite's
-/// default may roll the last acknowledged commit back; after `Exec("PRAGMA synchronous=EXTRA")` on
-/// this handle it is kept too, at the price of one more sync a commit.
+/// What an operation acknowledged survives the end of the process. When the power fails, SQLite's
+/// default may lose the last acknowledged commit; after `Exec("PRAGMA synchronous=EXTRA")` on an
+/// open handle it does not, for one more sync in each commit.
 ///
 /// One handle is used by one thread at a time; `const` operations write the error too. A handle
-/// that is open must not be used in the child after `fork`, not even closed or destroyed there: the
-/// child opens one of its own.
+/// that is open must not be used, closed or destroyed in the child of a `fork`: the child opens a
+/// handle of its own.
 class KELODR_EXPORT SqliteDB : public ErrRecorder {
  public:
   /// Stores the arguments; opens nothing. `label` stands in front of the lines that commands log.
@@ -86,7 +87,7 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
 
   /// Opens the connection if it is closed, creating a missing file, and sets the busy time-out of
   /// 1000 ms. False with a line at WARN when either fails; after a failed time-out the connection
-  /// stays open, deliberately. The error in `GetErr()` is not touched.
+  /// stays open. The error in `GetErr()` is not touched.
   bool Open();
 
   /// Closes the connection if it is open. A transaction that is open is rolled back.
@@ -95,13 +96,12 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// True when the database file exists.
   [[nodiscard]] bool IsExisted() const;
 
-  /// @name One attempt on the open connection.
-  /// No retry, and no line but for a NUL byte. A failure is recorded raw: SQLite's own result code
-  /// and message.
+  /// One attempt on the open connection. No retry, and no line but for a NUL byte. A
+  /// failure is recorded raw: SQLite's own result code and message.
   /// @{
 
-  /// Runs the statements and discards their rows. Success leaves the recorded error as it was,
-  /// deliberately. A transaction that a failed attempt began is rolled back.
+  /// Runs the statements and discards their rows. Success leaves the recorded error as it was.
+  /// A transaction that a failed attempt began is rolled back.
   bool DoExecSqliteCommand(const std::string& sql);
 
   /// Puts the first row into `record`, in place of what it held; with no row it succeeds and leaves
@@ -115,12 +115,12 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// Opens the database and runs the statements, discarding their rows. Fails with 401 for an empty
   /// text, without opening the file.
   ///
-  /// Each attempt runs the whole text. A transaction that it began is rolled back when it fails;
-  /// statements that it ran outside of one before it found the database locked run once more with
-  /// the next attempt. For several statements that belong together use `SqliteTransaction`.
+  /// Each attempt runs the whole text. A transaction that a failed attempt began is rolled back.
+  /// Statements that ran outside a transaction before the database was found locked run again with
+  /// the next attempt: use `SqliteTransaction` for statements that belong together.
   bool Exec(const std::string& sql);
 
-  /// @name Opens the database and reads the rows of a query.
+  /// Opens the database and reads the rows of a query.
   /// Integers and texts become fields under their column names; a NULL, a real or a blob is left
   /// out with a line at WARN. Fails with 401 for an empty text; when the file cannot be opened the
   /// recorded error stays as it was.
@@ -130,7 +130,7 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   bool SelectByCommand(const std::string& sql, SqliteValueList& record);
 
   /// Appends the rows to `records`, which is never emptied: rows of an attempt that failed stay,
-  /// deliberately, also when it is tried again.
+  /// also when it is tried again.
   bool SelectByCommand(const std::string& sql, std::vector<SqliteValueList>& records);
   /// @}
 
@@ -150,9 +150,9 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// counted, for instance because it is missing. Creates no table. The name is not escaped.
   bool GetCount(const SqliteTableHandler& table, int& count);
 
-  /// Creates the table if it is missing. Without column definitions this is a successful no-op,
-  /// deliberately. False with a line at ERR for an empty name, which leaves the recorded error as
-  /// it was, and for a refused statement.
+  /// Creates the table if it is missing. Without column definitions this is a successful no-op.
+  /// False with a line at ERR for an empty name, which leaves the recorded error as it was, and for
+  /// a refused statement.
   bool CreateTable(const SqliteTableHandler& table);
 
   /// Creates the command's table if it is missing, then runs the command and discards its rows.
@@ -176,9 +176,9 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   /// Deletes every row.
   bool DeleteAllRecords(const SqliteTableHandler& table);
 
-  /// @name Creates the command's table if it is missing, then reads the selected rows.
+  /// Creates the command's table if it is missing, then reads the selected rows.
   /// Fails with 401 for an invalid command. A missing file fails without a line and without
-  /// touching the recorded error, deliberately: nothing is selected.
+  /// touching the recorded error: nothing is selected.
   /// @{
 
   /// Reads the first row, as `SelectByCommand` does.
@@ -188,24 +188,25 @@ class KELODR_EXPORT SqliteDB : public ErrRecorder {
   bool SelectRecords(const SelectCommand& cmd, std::vector<SqliteValueList>& records);
 
   /// Hands the rows to `take` one by one, in memory that does not grow with their number. `take`
-  /// answers false to stop, which is a success. Once a row was handed over, the statement is not
-  /// tried again. What `take` throws passes, after the statement has been released.
+  /// answers false to stop, which is a success. The statement is not tried again once a row has
+  /// been handed over. What `take` throws passes after the statement is released.
   ///
-  /// The rows are read while `take` runs: other connections cannot commit a change until it is done
-  /// (with `PRAGMA journal_mode=WAL` they can), and `take` must not close this handle.
+  /// Before the call: `take` holds a function. It may use this handle, but not close it. Other
+  /// connections cannot commit while it runs, unless the database is in WAL mode.
   bool SelectEach(const SelectCommand& cmd,
                   const std::function<bool(const SqliteValueList& record)>& take);
   /// @}
 
-  /// @name Creates the table if it is missing, then inserts all records or none.
-  /// They are one transaction, or inside an open one a savepoint, which is tried again as a whole
-  /// while the database is busy or locked. Values are bound, not rendered: an integer of 64 bits is
-  /// stored whole. Logs the first record's statement with "?" for the values, and the success, at
-  /// INFO; a failure at ERR.
+  /// Creates the table if it is missing, then inserts all records or none.
+  /// The records are one transaction, or a savepoint inside an open one, which is tried again as a
+  /// whole while the database is busy or locked. Values are bound, not rendered: integers of 64
+  /// bits and texts with NUL bytes are stored whole, though reading such a text ends at the NUL.
+  /// Logs the first record's statement, with "?" for the values, and the success at INFO; a failure
+  /// at ERR.
   ///
-  /// Fails with 401, storing nothing, for an empty table name, an empty record, and an unsigned
-  /// integer above 63 bits. No records are a success that touches nothing, the file and the
-  /// recorded error included.
+  /// Fails with 401 and stores nothing for an empty table name, an empty record, or an unsigned
+  /// integer above 63 bits. No records are a success that does not touch the file or the recorded
+  /// error.
   /// @{
 
   /// A row that breaks a constraint fails them all.

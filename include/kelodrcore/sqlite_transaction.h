@@ -9,13 +9,13 @@
 
 namespace KeloDRCore {
 
-/// A write transaction on one handle: what the handle does while it is open is kept by `Commit`, or
-/// undone by `Rollback`, by the destructor, and by the end of the process.
+/// A write transaction on one handle. `Commit` keeps what the handle did since it began;
+/// `Rollback`, the destructor and the end of the process undo it.
 ///
-/// The handle outlives the transaction. Closing the handle ends the transaction without keeping
-/// anything. So do some failures of SQLite, for instance a full disk: ask `IsOpen` after one.
-/// Statements of one's own that begin or end a transaction on the handle do not go together with
-/// it.
+/// The handle outlives the transaction. Closing the handle ends it and keeps nothing, and so do
+/// some failures of SQLite, for instance a full disk: statements after such a failure are outside
+/// the transaction, so ask `IsOpen` first. Before the call: no text of the caller's begins or ends
+/// a transaction on the handle meanwhile.
 class KELODR_EXPORT SqliteTransaction {
  public:
   /// Opens the database if it is closed, creating a missing file, and begins the transaction with
