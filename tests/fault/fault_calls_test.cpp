@@ -24,11 +24,12 @@ const std::set<std::string> kHarmless = {
     "fmod", "trunc", "difftime", "__difftime64", "__udivdi3", "__umoddi3", "__divdi3", "__moddi3",
     "__ctzdi2", "uselocale",
     // The process itself.
-    "_exit", "abort", "closefrom", "environ", "__environ", "getegid", "geteuid", "getpid", "kill",
-    "pthread_mutex_lock", "pthread_mutex_unlock", "pthread_sigmask", "setsid", "sigemptyset",
-    "sigfillset", "signal", "posix_spawnattr_destroy", "posix_spawnattr_setflags",
-    "posix_spawnattr_setsigdefault", "posix_spawnattr_setsigmask", "__errno_location",
-    "__stack_chk_fail", "__tls_get_addr", "___tls_get_addr",
+    "_exit", "abort", "alarm", "closefrom", "environ", "__environ", "getegid", "geteuid", "getpid",
+    "kill", "pthread_mutex_lock", "pthread_mutex_unlock", "pthread_self", "pthread_sigmask",
+    "setlogmask", "setsid", "sigaction", "sigaddset", "sigemptyset", "sigfillset", "signal",
+    "posix_spawnattr_destroy", "posix_spawnattr_setflags", "posix_spawnattr_setsigdefault",
+    "posix_spawnattr_setsigmask", "__errno_location", "__stack_chk_fail", "__tls_get_addr",
+    "___tls_get_addr", "localtime_r",
     // Streams that are there already.
     "clearerr", "ferror", "fileno"};
 
