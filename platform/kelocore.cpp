@@ -38,9 +38,9 @@ bool ReadStart(const char* path, size_t limit, std::string& text) try {
 }
 
 struct ProcStat {
-  char state;
-  int threads;
-  uint64_t startTime;  // clock ticks since boot
+  char state = 0;
+  int threads = 0;
+  uint64_t startTime = 0;  // clock ticks since boot
 };
 
 // Reads what proc(5) lists as fields 3, 20 and 22. The name, field 2, may hold any byte, brackets

@@ -119,6 +119,7 @@ TEST_F(LogCrowdTest, NoRefresherHangsOrLeavesAClaimBehind) {
   for (int i = 0; i < kCaches; ++i) ASSERT_TRUE(MakeCache(i, false).UpdateWithData("old"));
   std::atomic<bool> done{false};
   std::vector<std::thread> threads;
+  threads.reserve(kThreads);
   for (int i = 0; i < kThreads; ++i) {
     threads.emplace_back([this, i, &done] { LogAndInsert(i, done); });
   }
