@@ -29,10 +29,13 @@ bool IsBelieved(const struct stat& file, const std::string& path) {
          (StatAt(AT_FDCWD, DirectoryOf(path), 0, directory) && IsOfDirectory(file, directory));
 }
 
-bool IsBelieved(const struct stat& file, int directory) {
-  if (!S_ISREG(file.st_mode)) return false;
+bool IsOwnerBelieved(const struct stat& file, int directory) {
   struct stat found = {};
   return IsOwn(file) || (Stat(directory, found) && IsOfDirectory(file, found));
+}
+
+bool IsBelieved(const struct stat& file, int directory) {
+  return S_ISREG(file.st_mode) && IsOwnerBelieved(file, directory);
 }
 
 bool StatBelieved(const std::string& path, struct stat& found) {

@@ -18,6 +18,9 @@ namespace KeloDRCore::Posix {
 bool IsBelieved(const struct stat& file, const std::string& path);
 bool IsBelieved(const struct stat& file, int directory);
 
+// The same question about the owner of what need not be a regular file.
+bool IsOwnerBelieved(const struct stat& file, int directory);
+
 // The state of the believed file at `path`. False with errno set when it is missing (ENOENT), a
 // link or anything else that is not a regular file (EINVAL), or a stranger's (EACCES).
 bool StatBelieved(const std::string& path, struct stat& found);

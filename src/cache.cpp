@@ -238,10 +238,12 @@ bool Claim::SetUpdating() {
   return true;
 }
 
-bool Claim::Lock() try {
-  return lock.Take(LOCK_EX, kReleaseTimeout) == CacheLock::Outcome::kTaken;
-} catch (const std::bad_alloc&) {
-  return false;
+bool Claim::Lock() {
+  try {
+    return lock.Take(LOCK_EX, kReleaseTimeout) == CacheLock::Outcome::kTaken;
+  } catch (const std::bad_alloc&) {
+    return false;
+  }
 }
 
 void Claim::UnsetUpdating() {

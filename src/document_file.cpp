@@ -125,9 +125,8 @@ bool ClearName(const Place& place) {
   struct stat found = {};
   const int directory = place.directory.Get();
   if (!StatAt(directory, place.name, AT_SYMLINK_NOFOLLOW, found)) return errno == ENOENT;
-  if (!S_ISDIR(found.st_mode)) return true;
-  found.st_mode = S_IFREG;
-  return Posix::IsBelieved(found, directory) || MoveAway(directory, place.name);
+  return !S_ISDIR(found.st_mode) || Posix::IsOwnerBelieved(found, directory) ||
+         MoveAway(directory, place.name);
 }
 
 // The place at the end of the links that begin with `path`, or of `path` itself.
