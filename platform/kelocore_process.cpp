@@ -17,41 +17,23 @@
 
 #include "kelocore.h"
 #include "posix/descriptor.h"
+#include "posix/pipe.h"
 #include "posix/retry.h"
 
 namespace {
 
+using KeloDRCore::Posix::AboveStandardStreams;
 using KeloDRCore::Posix::Descriptor;
+using KeloDRCore::Posix::kFirstFreeDescriptor;
+using KeloDRCore::Posix::Pipe;
+using KeloDRCore::Posix::Receive;
 using KeloDRCore::Posix::Retry;
-
-constexpr int kFirstFreeDescriptor = STDERR_FILENO + 1;
-
-// The same file above the standard streams, which a caller may have closed: what is put on one of
-// their numbers later must not hit it.
-Descriptor AboveStandardStreams(Descriptor descriptor) {
-  if (!descriptor.IsOpen() || descriptor.Get() >= kFirstFreeDescriptor) return descriptor;
-  return Descriptor(fcntl(descriptor.Get(), F_DUPFD_CLOEXEC, kFirstFreeDescriptor));
-}
+using KeloDRCore::Posix::Send;
 
 Descriptor OpenNull() {
   return AboveStandardStreams(
       Descriptor(Retry([] { return open("/dev/null", O_RDWR | O_CLOEXEC); })));
 }
-
-struct Pipe {
-  Descriptor readEnd;
-  Descriptor writeEnd;
-
-  bool Open() {
-    int ends[2];
-    if (pipe2(ends, O_CLOEXEC) != 0) return false;
-    Descriptor first(ends[0]);
-    Descriptor second(ends[1]);
-    readEnd = AboveStandardStreams(std::move(first));
-    writeEnd = AboveStandardStreams(std::move(second));
-    return readEnd.IsOpen() && writeEnd.IsOpen();
-  }
-};
 
 // Blocks every signal while it lives, so that no handler of the caller runs in a helper process.
 class SignalBlock {
@@ -68,15 +50,6 @@ class SignalBlock {
  private:
   sigset_t before;
 };
-
-// A number that one process reports to another; far below PIPE_BUF, so it goes as a whole.
-bool Send(int fd, int number) {
-  return Retry([&] { return write(fd, &number, sizeof number); }) == sizeof number;
-}
-
-bool Receive(int fd, int* number) {
-  return Retry([&] { return read(fd, number, sizeof *number); }) == sizeof *number;
-}
 
 // Waits until the child is gone; who takes its status (this call, the kernel where SIGCHLD is
 // ignored, or a handler of the caller) does not matter.

@@ -18,6 +18,7 @@
 #include "log.h"
 #include "posix/directory_walk.h"
 #include "posix/file_io.h"
+#include "posix/pipe.h"
 #include "posix/retry.h"
 #include "privilege.h"
 
@@ -114,11 +115,20 @@ void CloseRegistered(int fd) {
 
 int ForkWithoutLocks(int flags) {
   const std::lock_guard<std::mutex> guard(openFiles.mutex);
+  Posix::Pipe told;
+  if (!told.Open()) return -1;
   const int pid = KLIBCProcForkEx(flags);
+  if (pid > 0) {
+    // Until the child has let go: a lock that the caller closes next is free at once.
+    told.writeEnd.Close();
+    int done = 0;
+    Posix::Receive(told.readEnd.Get(), &done);
+  }
   if (pid != 0) return pid;
   for (const int fd : openFiles.descriptors) {
     Posix::Retry([&] { return dup3(STDIN_FILENO, fd, O_CLOEXEC); });
   }
+  Posix::Send(told.writeEnd.Get(), 0);
   return 0;
 }
 

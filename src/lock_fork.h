@@ -6,7 +6,7 @@
 namespace KeloDRCore {
 
 // KLIBCProcForkEx with `flags` that put the standard streams on /dev/null. In the child every open
-// FileLock leads there too: the locks are the caller's alone.
+// FileLock leads there too: on return to the caller, the locks are the caller's alone.
 int ForkWithoutLocks(int flags);
 
 }  // namespace KeloDRCore

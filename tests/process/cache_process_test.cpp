@@ -624,6 +624,25 @@ TEST_F(CacheProcessTest, ARefresherKeepsNoLockOfItsCaller) {
   EXPECT_EQ(JoinAll(), 1);
 }
 
+// Nothing waits for the refresher here: each round is one chance to be quicker than it.
+TEST_F(CacheProcessTest, ALockThatIsClosedAfterTheForkIsFreeAtOnce) {
+  constexpr int kRounds = 20;
+  for (int round = 0; round < kRounds; ++round) {
+    WriteCacheFile("\"old\"", kStale);
+    auto held = std::make_unique<FileLock>(path + ".held");
+    ASSERT_TRUE(held->lock(LOCK_EX | LOCK_NB, 0));
+    TestCache cache = MakeCache(false);
+    cache.fetch = [](Json::Value& out) {
+      out = "new";
+      return true;
+    };
+    EXPECT_TRUE(cache.Update());
+    held.reset();
+    EXPECT_TRUE(FileLock(path + ".held").tryLock(LOCK_EX | LOCK_NB));
+    EXPECT_EQ(JoinAll(), 1);
+  }
+}
+
 TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {
   WriteCacheFile("\"old\"", kStale);
   LogCapture::MirrorTo("");
