@@ -116,7 +116,11 @@ class Basics {
  private:
   static void OfCode(int code) {
     Do("ERR::ToString", [&](auto /*side*/) {
-      return Trace::IsModel() ? Model::NameOf(code) : KeloDRCore::ERR::ToString(code);
+      std::string names;
+      for (int i = code; i < code + 20; ++i) {
+        names += (Trace::IsModel() ? Model::NameOf(i) : KeloDRCore::ERR::ToString(i)) + " ";
+      }
+      return names;
     });
   }
 

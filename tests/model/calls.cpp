@@ -23,6 +23,7 @@ std::map<std::string, int> counts;  // of the calls of each kind in this operati
 std::optional<int> injected;        // the code of the last call, if it was replaced
 std::set<void*> texts;              // messages that are to be freed
 int depth = 0;                      // above 0 within a call: what SQLite does itself is no event
+std::vector<sqlite3*> holders;      // other connections
 sqlite3* last[2];                   // the connections opened last
 
 struct Inside {
@@ -48,6 +49,12 @@ bool Fails(const char* kind) {
 // What the faults put in place of SQLite's message.
 std::string Message() { return "injected " + std::to_string(*injected); }
 
+// The model's file for a file of the library.
+std::string OfTwin(const std::string& path) {
+  const size_t at = path.find("/own/");
+  return at == std::string::npos ? path : std::string(path).replace(at, 5, "/twin/");
+}
+
 }  // namespace
 
 void Begin() {
@@ -55,10 +62,29 @@ void Begin() {
   injected.reset();
 }
 
-std::string Place(const std::string& path) {
-  const size_t at = path.find("/own/");
-  return at == std::string::npos || !Trace::IsModel() ? path
-                                                      : std::string(path).replace(at, 5, "/twin/");
+std::string Place(const std::string& path) { return Trace::IsModel() ? OfTwin(path) : path; }
+
+void Hold(const std::string& path) {
+  const Inside inside;
+  for (const std::string& place : {path, OfTwin(path)}) {
+    if (access(place.c_str(), F_OK) != 0) continue;
+    sqlite3* holder = nullptr;
+    sqlite3_open(place.c_str(), &holder);
+    sqlite3_exec(holder, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr);
+    holders.push_back(holder);
+  }
+}
+
+void LetGo() {
+  const Inside inside;
+  for (sqlite3* const holder : holders) sqlite3_close(holder);
+  holders.clear();
+}
+
+void Sleep(unsigned int microseconds) {
+  if (depth > 0) return;
+  const bool isExpected = microseconds >= 1000000 && microseconds <= 2000000;
+  Trace::Add("pause of " + (isExpected ? "1000 to 2000 ms" : std::to_string(microseconds) + " us"));
 }
 
 std::string DumpDatabase() {
@@ -187,6 +213,10 @@ int sqlite3_close(sqlite3* connection) {
   if (last[Trace::IsModel() ? 1 : 0] == connection) last[Trace::IsModel() ? 1 : 0] = nullptr;
   return real(connection);
 }
+
+// What is written here outlives nothing: the disk is not waited for.
+int fsync(int /*fd*/) { return 0; }
+int fdatasync(int /*fd*/) { return 0; }
 
 // The effective ids are those of a play: no right is needed to change them, and none is gained.
 

@@ -392,6 +392,7 @@ class Database {
   void Step() {
     if (db.library == nullptr || Draw::Once(isUsual ? 60 : 10)) Renew();
     if (Draw::Once(2)) DrawFault();
+    if (Draw::Once(12)) Calls::Hold(dir + "/own/db");
     Table table;
     switch (Draw::Below(11)) {
       case 0:
@@ -414,6 +415,7 @@ class Database {
         OfCommand();
     }
     Calls::fault = {};
+    Calls::LetGo();
     if (Draw::Once(30)) {
       Do("what the database holds", [](auto /*side*/) { return Calls::DumpDatabase(); });
     }

@@ -213,7 +213,8 @@ class Files {
                                                     "--1",
                                                     "\v\f",
                                                     std::string("\0", 1)};
-    std::string line;
+    static const std::vector<std::string> starts = {"", "", "a=", "b=", " a ="};
+    std::string line = Draw::Of(starts);
     for (size_t i = Draw::Below(6); i > 0; --i) line += Draw::Of(pieces);
     return line;
   }

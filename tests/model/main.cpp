@@ -30,14 +30,6 @@ std::string MakeDirectory() {
   return mkdtemp(pattern.data()) != nullptr ? pattern : "";
 }
 
-// No sleep takes time. Short ones are SQLite's own, while another connection has the lock.
-std::optional<int> Sleep(useconds_t length) {
-  const bool isExpected = length >= 1000000 && length <= 2000000;
-  Trace::Add(isExpected ? "pause of 1000 to 2000 ms"
-                        : "pause of " + std::to_string(length) + " us");
-  return 0;
-}
-
 void Run(unsigned long count, const std::string& dir) {
   Values values;
   Conditions conditions;
@@ -96,7 +88,10 @@ int main(int argc, char** argv) {
   const std::string dir = MakeDirectory();
   if (dir.empty()) return 2;
   umask(022);
-  ReplaceSleeps(Sleep);
+  ReplaceSleeps([](useconds_t length) {
+    Calls::Sleep(length);
+    return 0;
+  });
   Draw::Seed(settings["seed"]);
   printf("seed %lu\n", settings["seed"]);
   const auto start = std::chrono::steady_clock::now();

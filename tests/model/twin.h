@@ -124,6 +124,13 @@ struct Ids {
 };
 extern Ids ids;  // what this process takes for its effective ids
 
+// Lets another connection hold the database at `path`, of both sides, until it lets go of it.
+void Hold(const std::string& path);
+void LetGo();
+
+// In place of a sleep: it takes no time, and is an event unless it is SQLite's own.
+void Sleep(unsigned int microseconds);
+
 void Begin();                                // an operation of one side
 std::string Place(const std::string& path);  // where the file of this side is: each has its own
 std::string DumpDatabase();                  // what the connection opened last holds

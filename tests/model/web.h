@@ -175,7 +175,7 @@ class Web {
 
  private:
   void OfRequest() {
-    const Json::Value document = Draw::Document();
+    const Json::Value document = Draw::Once(2) ? Draw::Document() : Call();
     const std::string text = Draw::Text();
     const std::string key = Draw::Once(3) ? "version" : Draw::Name();
     const int number = static_cast<int>(Draw::Below(7)) - 2;
@@ -252,6 +252,14 @@ class Web {
     return text;
   }
 
+  static Json::Value Call() {
+    Json::Value call = Draw::Document(1);
+    if (!call.isObject()) call = Json::objectValue;
+    for (const char* key : {"api", "method", "version"}) {
+      if (!Draw::Once(4)) call[key] = Draw::Document(0);
+    }
+    return call;
+  }
   static Json::Value Reply() {
     Json::Value reply;
     reply["success"] = !Draw::Once(3);
