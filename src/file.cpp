@@ -16,8 +16,8 @@
 #include <type_traits>
 #include <utility>
 
+#include "json_text.h"
 #include "kelocore.h"
-#include "kelodrcore/json_value.h"
 #include "log.h"
 #include "posix/descriptor.h"
 #include "posix/file_io.h"
@@ -66,7 +66,7 @@ std::string AsArgument(const std::string& path) {
 enum class WriteResult { kDone, kWriteFailed, kFlushFailed, kSyncFailed };
 
 WriteResult WriteAndSync(FILE* stream, int fd, const Json::Value& value) {
-  if (fprintf(stream, "%s", JsonValue::toString(value).c_str()) < 0) {
+  if (fprintf(stream, "%s", WriteJson(value).c_str()) < 0) {
     return WriteResult::kWriteFailed;
   }
   if (fflush(stream) != 0) return WriteResult::kFlushFailed;
@@ -91,9 +91,9 @@ bool Read(const std::string& path, Json::Value& value) {
     return false;
   }
   std::string text;
-  if (!ReadToEnd(file, text)) return false;
+  if (!IsRegularFile(file.Get()) || !Posix::ReadAll(file.Get(), text)) return false;
   text.erase(std::remove(text.begin(), text.end(), '\n'), text.end());
-  return JsonValue::fromString(value, text);
+  return ParseJson(value, text, Origin::kFile);
 }
 
 bool Read(int fd, Json::Value& value) {
@@ -103,7 +103,7 @@ bool Read(int fd, Json::Value& value) {
     return false;
   }
   std::string text;
-  return Posix::ReadAll(fd, text) && JsonValue::fromString(value, JoinPieces(text));
+  return Posix::ReadAll(fd, text) && ParseJson(value, JoinPieces(text), Origin::kFile);
 }
 
 bool Write(const std::string& path, const Json::Value& value) {
@@ -118,7 +118,7 @@ bool Write(const std::string& path, const Json::Value& value) {
   }
   const WriteResult result = WriteAndSync(stream.get(), fileno(stream.get()), value);
   if (result == WriteResult::kWriteFailed) {
-    KELODR_LOG(ERR, __func__, "Failed to write [%s] to [%s].", JsonValue::toString(value).c_str(),
+    KELODR_LOG(ERR, __func__, "Failed to write [%s] to [%s].", WriteJson(value).c_str(),
                path.c_str());
   } else if (result == WriteResult::kFlushFailed) {
     KELODR_LOG(ERR, __func__, "Failed to flush file[%s]", path.c_str());
@@ -136,8 +136,7 @@ bool Write(int fd, const Json::Value& value) {
   }
   const WriteResult result = WriteAndSync(stream.get(), fd, value);
   if (result == WriteResult::kWriteFailed) {
-    KELODR_LOG(ERR, __func__, "Failed to write [%s] to fd[%d]", JsonValue::toString(value).c_str(),
-               fd);
+    KELODR_LOG(ERR, __func__, "Failed to write [%s] to fd[%d]", WriteJson(value).c_str(), fd);
   } else if (result == WriteResult::kFlushFailed) {
     KELODR_LOG(ERR, __func__, "%s", "Failed to flush file");
   } else if (result == WriteResult::kSyncFailed) {

@@ -25,16 +25,18 @@ namespace KeloDRCore::File {
 ///
 /// A missing file is deliberately a success that leaves `value` alone: callers treat it as the
 /// absence of a document. False, with `value` unchanged, for an empty path, a file that cannot be
-/// opened, a file that cannot be read to its end (not logged) and text that is not one JSON
-/// document (not logged). A FIFO is not waited for: without data it is not a document.
+/// opened and, not logged, for what is not a regular file, a file that cannot be read to its end
+/// and text that is not one JSON document. Documents nest up to 1,010 levels, as for
+/// `JsonValue::fromFile`.
 KELODR_EXPORT bool Read(const std::string& path, Json::Value& value);
 
 /// Reads the JSON document from the current position of `fd` to its end into `value`. Closes `fd`,
 /// whatever the result, unless it was not a descriptor open for reading.
 ///
 /// Newlines are kept. A NUL byte deliberately hides the rest of its piece; a piece is at most one
-/// line and 1023 bytes. A signal does not end the reading. False, with `value` unchanged, for a
-/// descriptor that cannot be read to its end and for text that is not one JSON document.
+/// line and 1023 bytes. A signal does not end the reading. Documents nest up to 1,010 levels.
+/// False, with `value` unchanged, for a descriptor that cannot be read to its end and for text that
+/// is not one JSON document.
 KELODR_EXPORT bool Read(int fd, Json::Value& value);
 
 /// Writes `value` as JSON text to `path`, created (with the permissions that the umask leaves) or

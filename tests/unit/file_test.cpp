@@ -1,6 +1,7 @@
 #include "kelodrcore/file.h"
 
 #include <fcntl.h>
+#include <sys/ioctl.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -156,6 +157,33 @@ TEST_F(FileTest, ReadDoesNotWaitForAQueue) {
   EXPECT_FALSE(File::Read(Path("queue"), value));
   EXPECT_EQ(value, Json::Value("kept"));
   close(writer);
+}
+
+// A link to /dev/zero would be read until the memory runs out.
+TEST_F(FileTest, ReadOfADocumentRefusesWhatIsNotARegularFile) {
+  ASSERT_EQ(mkfifo(Path("queue").c_str(), 0600), 0);
+  const int queue = open(Path("queue").c_str(), O_RDWR | O_CLOEXEC);
+  ASSERT_EQ(write(queue, "{}", 2), 2);
+  Json::Value value("kept");
+  EXPECT_FALSE(File::Read(Path("queue"), value));
+  int unread = 0;
+  EXPECT_EQ(ioctl(queue, FIONREAD, &unread), 0);
+  EXPECT_EQ(unread, 2) << "bytes of somebody else's queue";
+  EXPECT_EQ(value, Json::Value("kept"));
+  close(queue);
+}
+
+TEST_F(FileTest, WhatIsReadCanBePutIntoAnotherDocumentWrittenAndReadBack) {
+  Json::Value written;
+  ASSERT_TRUE(
+      JsonValue::fromString(written["a"]["b"], std::string(1000, '[') + std::string(1000, ']')));
+  ASSERT_TRUE(File::Write(Path("a"), written));
+  Json::Value value;
+  EXPECT_TRUE(File::Read(Path("a"), value));
+  EXPECT_EQ(value, written);
+  value.clear();
+  EXPECT_TRUE(File::Read(open(Path("a").c_str(), O_RDONLY | O_CLOEXEC), value));
+  EXPECT_EQ(value, written);
 }
 
 // A terminal of one's own would end the daemon by ^C.
