@@ -278,6 +278,7 @@ class Files {
       if (isBracketed) shown += " " + Show(error);
       struct stat status {};
       if (stat(path.c_str(), &status) == 0) shown += " " + Show(status.st_mode & 07777U);
+      chmod(path.c_str(), 0700);  // so that anybody can remove it
       std::filesystem::remove_all(dir + "/made");
       std::filesystem::remove_all(dir + "/two words");
       return shown;
