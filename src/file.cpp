@@ -6,14 +6,12 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <cstdio>
 #include <ios>
 #include <limits>
 #include <locale>
 #include <memory>
 #include <string_view>
-#include <type_traits>
 #include <utility>
 
 #include "json_text.h"
@@ -187,8 +185,6 @@ constexpr char kSeparator[] = "=";
 // White space of the classic locale.
 bool IsSpace(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
 
-bool IsDigit(char c) { return c >= '0' && c <= '9'; }
-
 std::string_view SkipSpace(std::string_view text) {
   const auto* const begin = std::find_if_not(text.begin(), text.end(), IsSpace);
   return text.substr(static_cast<size_t>(begin - text.begin()));
@@ -200,49 +196,37 @@ void Extract(std::string_view text, std::string& out) {
   if (!rest.empty()) out.assign(rest.begin(), std::find_if(rest.begin(), rest.end(), IsSpace));
 }
 
-// The same for numbers, by the standard facet reading straight from the text.
-class NumberReader : private std::num_get<char, const char*> {
+// What turns the text of a value into text or a number: the standard facet reads numbers straight
+// from it.
+class ValueReader : private std::num_get<char, const char*> {
  public:
-  NumberReader() : format(nullptr) { format.imbue(std::locale::classic()); }
+  ValueReader() : format(nullptr) { format.imbue(std::locale::classic()); }
+
+  void Extract(std::string_view text, std::string& out) const { File::Extract(text, out); }
+
+  void Extract(std::string_view text, double& out) { Get(SkipSpace(text), out); }
 
   void Extract(std::string_view text, int& out) {
-    const auto wide = Get<long>(SkipSpace(text));
+    long wide = 0;
+    Get(SkipSpace(text), wide);
     constexpr long kMin = std::numeric_limits<int>::min();
     constexpr long kMax = std::numeric_limits<int>::max();
     out = static_cast<int>(std::clamp(wide, kMin, kMax));
   }
 
-  void Extract(std::string_view text, double& out) {
-    const std::string_view rest = SkipSpace(text);
-    // A plain number is one to both and read faster; the facet knows what the rest means.
-    const char* const end = rest.data() + rest.size();
-    const auto [stop, error] = std::from_chars(rest.data(), end, out);
-    const bool plain = error == std::errc() && IsDigit(stop[-1]) && (stop == end || IsSpace(*stop));
-    if (!plain) out = Get<double>(rest);
-  }
-
  private:
   template <typename Number>
-  Number Get(std::string_view text) {
-    Number number = 0;
+  void Get(std::string_view text, Number& number) {
     std::ios_base::iostate ignored = std::ios_base::goodbit;
     if (!text.empty()) get(text.data(), text.data() + text.size(), format, ignored, number);
-    return number;
   }
 
   std::basic_ios<char> format;  // where the facet looks for flags and locale
 };
 
-// What turns the text of a value into a `V`.
-struct WordReader {
-  static void Extract(std::string_view text, std::string& out) { File::Extract(text, out); }
-};
-template <typename V>
-using ReaderOf = std::conditional_t<std::is_arithmetic_v<V>, NumberReader, WordReader>;
-
 // `key` and `value` come in empty or 0.
 template <typename V>
-bool parseLineKeyValue(const std::string& line, ReaderOf<V>& reader, std::string& key, V& value) {
+bool parseLineKeyValue(const std::string& line, ValueReader& reader, std::string& key, V& value) {
   if (line.empty()) {
     KELODR_LOG(WARN, __func__, "%s", "Bad Parameter.");
     return false;
@@ -287,7 +271,7 @@ int Read(const std::string& path, std::map<K, V>& map) {
     return -1;
   }
   std::map<K, V> entries;  // apart from `map`, of which `path` may be a part
-  ReaderOf<V> reader;
+  ValueReader reader;
   for (size_t start = 0; start < text.size();) {
     const size_t end = std::min(text.find('\n', start), text.size());
     const std::string line = text.substr(start, end - start);
