@@ -443,7 +443,7 @@ bool SqliteDB::PrepareSelect(const SelectCommand& cmd, const char* function) {
     KELODR_LOG(ERR, function, "invalid select command [%s]", cmd.ToStr().c_str());
     return false;
   }
-  if (!IsExisted()) return false;
+  if (!IsExisted() || RefuseNul(cmd.GetCommand(), "SelectByCommand")) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   if (!CreateTable(cmd.GetTable())) {
     KELODR_LOG(ERR, function, "%s", "Failed to create table");

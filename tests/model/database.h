@@ -350,7 +350,7 @@ class SqliteDB : public ErrRecorder {
       SetErr(401);
       return Failed(function, "invalid select command [%s]", command.ToStr());
     }
-    if (!IsExisted()) return false;
+    if (!IsExisted() || HasNul(command.GetCommand(), "SelectByCommand")) return false;
     SetErr(404);
     return CreateTable(command.GetTable()) || Failed(function, "Failed to create table");
   }

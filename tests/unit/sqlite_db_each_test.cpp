@@ -121,6 +121,20 @@ TEST_F(SqliteDBEachTest, ANulByteInTheConditionIsRefused) {
   ExpectLog({Err(kFile, "SelectByCommand", "NUL byte in command [SELECT  * FROM t WHERE n = 1]")});
 }
 
+TEST_F(SqliteDBEachTest, ANulByteInTheConditionLeavesTheTableUnmade) {
+  SelectCommand command = SelectAll(SqliteTableHandler("missing", "n"));
+  command.SetCondition(std::string("n = 1\0 OR 1", 11));
+  SqliteValueList row;
+  EXPECT_FALSE(Each(command));
+  EXPECT_FALSE(db->SelectRecord(command, row));
+  EXPECT_FALSE(db->SelectRecords(command, records));
+  EXPECT_EQ(db->GetErr(), Error(401));
+  const LogLine refused =
+      Err(kFile, "SelectByCommand", "NUL byte in command [SELECT  * FROM missing WHERE n = 1]");
+  ExpectLog({refused, refused, refused});
+  EXPECT_FALSE(db->IsTableExisted("missing"));
+}
+
 TEST_F(SqliteDBEachTest, IsTriedAgainWhileNoRowWasHandedOver) {
   for (const int code : {5, 6}) {
     records.clear();
