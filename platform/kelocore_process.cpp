@@ -17,6 +17,7 @@
 
 #include "kelocore.h"
 #include "posix/descriptor.h"
+#include "posix/fork_mutex.h"
 #include "posix/pipe.h"
 #include "posix/retry.h"
 
@@ -24,6 +25,7 @@ namespace {
 
 using KeloDRCore::Posix::AboveStandardStreams;
 using KeloDRCore::Posix::Descriptor;
+using KeloDRCore::Posix::forkMutex;
 using KeloDRCore::Posix::kFirstFreeDescriptor;
 using KeloDRCore::Posix::Pipe;
 using KeloDRCore::Posix::Receive;
@@ -166,17 +168,16 @@ struct Running {
   std::unique_ptr<Running> next;
 };
 
-std::mutex runningMutex;
 std::unique_ptr<Running>* const running = new std::unique_ptr<Running>;  // outlives every user
 
 void Remember(std::unique_ptr<Running> entry) {
-  const std::lock_guard<std::mutex> guard(runningMutex);
+  const std::lock_guard<std::mutex> guard(forkMutex);
   entry->next = std::move(*running);
   *running = std::move(entry);
 }
 
 std::unique_ptr<Running> Forget(const FILE* stream) {
-  const std::lock_guard<std::mutex> guard(runningMutex);
+  const std::lock_guard<std::mutex> guard(forkMutex);
   std::unique_ptr<Running>* link = running;
   while (*link && (*link)->stream != stream) link = &(*link)->next;
   std::unique_ptr<Running> found = std::move(*link);

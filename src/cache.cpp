@@ -39,6 +39,7 @@
 #include "log.h"
 #include "posix/directory_walk.h"
 #include "posix/file_io.h"
+#include "posix/fork_mutex.h"
 #include "posix/trust.h"
 #include "privilege.h"
 
@@ -127,18 +128,13 @@ class Claim {
   enum class By { kAnyThread, kThisThread };
   static bool IsMadeBy(By who, const std::string& path);
 
-  // KLIBCProcForkEx for a child that makes a claim of its own.
-  static int ForkRefresher();
-
  private:
   void UnsetUpdating();
   bool Lock();
   void Enlist();
   void Delist();
 
-  // The claims of this process.
-  static std::mutex mutex;
-  static Claim* first;
+  static Claim* first;  // of the claims of this process, under Posix::forkMutex
 
   // What the release needs is made before the claim: it must not fail for want of memory.
   const std::string& path;
@@ -151,7 +147,6 @@ class Claim {
   Claim* next = nullptr;
 };
 
-std::mutex Claim::mutex;
 Claim* Claim::first = nullptr;
 
 std::string PidFile(const std::string& path) { return path + ".pid"; }
@@ -272,13 +267,13 @@ void Claim::UnsetUpdating() {
 }
 
 void Claim::Enlist() {
-  const std::lock_guard<std::mutex> guard(mutex);
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
   next = std::exchange(first, this);
   isHeld = true;
 }
 
 void Claim::Delist() {
-  const std::lock_guard<std::mutex> guard(mutex);
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
   Claim** link = &first;
   while (*link != this) link = &(*link)->next;
   *link = next;
@@ -286,19 +281,13 @@ void Claim::Delist() {
 
 bool Claim::IsMadeBy(By who, const std::string& path) {
   const Identity identity(path);
-  const std::lock_guard<std::mutex> guard(mutex);
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
   for (const Claim* claim = first; claim != nullptr; claim = claim->next) {
     // Claims of a process that forked this one are not its own.
     if (claim->pid != getpid() || !(claim->identity == identity)) continue;
     if (who == By::kAnyThread || claim->thread == std::this_thread::get_id()) return true;
   }
   return false;
-}
-
-// The mutex is the child's own then, whatever other threads do.
-int Claim::ForkRefresher() {
-  const std::lock_guard<std::mutex> guard(mutex);
-  return ForkWithoutLocks(kDetached);
 }
 
 // For a forked child. If another thread was inside syslog at the fork, the locks of the log and of
@@ -420,7 +409,7 @@ bool Cache::Update() const {
 }
 
 bool Cache::UpdateInBackground() const {
-  const int pid = Claim::ForkRefresher();
+  const int pid = ForkWithoutLocks(kDetached);
   if (pid < 0) {
     KELODR_LOG(WARN, "Update", "Failed to fork(). errno=[%d/%m]", errno);
     return false;

@@ -18,6 +18,7 @@
 #include "log.h"
 #include "posix/directory_walk.h"
 #include "posix/file_io.h"
+#include "posix/fork_mutex.h"
 #include "posix/pipe.h"
 #include "posix/retry.h"
 #include "privilege.h"
@@ -42,11 +43,7 @@ constexpr int kReplacedLimit = 10;
 
 // The open lock files of this process. They are opened, closed and forked under the mutex, so that
 // a child knows all that it has.
-struct OpenFiles {
-  std::mutex mutex;
-  std::vector<int> descriptors;
-};
-OpenFiles& openFiles = *new OpenFiles;  // outlives every user
+std::vector<int>& openFiles = *new std::vector<int>;  // outlives every user
 
 // Whether `fd` is still the lock file at `path`: a cleaner of /tmp removes or replaces files that
 // are open, and then newcomers lock another one.
@@ -98,23 +95,21 @@ Descriptor OpenOrReplace(int directory, const std::string& name) {
 }
 
 int OpenRegistered(int directory, const std::string& name) {
-  const std::lock_guard<std::mutex> guard(openFiles.mutex);
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
   Descriptor file = OpenOrReplace(directory, name);
-  if (file.IsOpen()) openFiles.descriptors.push_back(file.Get());
+  if (file.IsOpen()) openFiles.push_back(file.Get());
   return file.Release();
 }
 
 void CloseRegistered(int fd) {
-  const std::lock_guard<std::mutex> guard(openFiles.mutex);
-  auto& descriptors = openFiles.descriptors;
-  descriptors.erase(std::find(descriptors.begin(), descriptors.end(), fd));
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
+  openFiles.erase(std::find(openFiles.begin(), openFiles.end(), fd));
   close(fd);
 }
 
 }  // namespace
 
 int ForkWithoutLocks(int flags) {
-  const std::lock_guard<std::mutex> guard(openFiles.mutex);
   Posix::Pipe told;
   if (!told.Open()) return -1;
   const int pid = KLIBCProcForkEx(flags);
@@ -125,7 +120,7 @@ int ForkWithoutLocks(int flags) {
     Posix::Receive(told.readEnd.Get(), &done);
   }
   if (pid != 0) return pid;
-  for (const int fd : openFiles.descriptors) {
+  for (const int fd : openFiles) {
     Posix::Retry([&] { return dup3(STDIN_FILENO, fd, O_CLOEXEC); });
   }
   Posix::Send(told.writeEnd.Get(), 0);

@@ -1,6 +1,7 @@
 // Different threads use different objects at once. ThreadSanitizer judges it: scripts/test.sh tsan.
 
 #include <sys/file.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -203,6 +204,31 @@ TEST_F(ThreadsTest, MayUseEverythingAtOnce) {
                 [this](int thread) { UseLock("lock" + std::to_string(thread)); },
                 [this](int thread) { UseDatabase(Own("base", thread), thread); },
                 [this](int thread) { UseCache(thread); }, UseMessages, UseUtilities});
+}
+
+// A program with threads may fork, and its child has none of them to wait for.
+TEST_F(ThreadsTest, AChildThatIsForkedBesideThreadsOpensItsLocks) {
+  constexpr int kChildren = 50;
+  constexpr unsigned int kLongest = 20;  // seconds, where a child needs milliseconds
+  std::atomic<bool> done{false};
+  std::vector<std::thread> threads;
+  for (int number = 0; number < 2; ++number) {
+    threads.emplace_back([this, &done, number] {
+      while (!done) FileLock(Path("lock" + std::to_string(number))).openLockedFile();
+    });
+  }
+  int status = 0;
+  for (int child = 0; child < kChildren && status == 0; ++child) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+      alarm(kLongest);
+      _exit(FileLock(Path("child")).openLockedFile() ? 0 : 1);
+    }
+    EXPECT_EQ(waitpid(pid, &status, 0), pid);
+  }
+  EXPECT_EQ(status, 0);
+  done = true;
+  for (std::thread& thread : threads) thread.join();
 }
 
 }  // namespace
