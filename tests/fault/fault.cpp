@@ -14,6 +14,8 @@
 #include <iostream>
 #include <new>
 
+#include "fault/interception.h"
+
 namespace {
 
 // Shared with forked children, so that their calls are part of one count.
@@ -111,7 +113,8 @@ std::vector<std::string> FailedCalls() {
 }
 
 bool Outcome::Failed(const std::string& call) const {
-  return std::find(failed.begin(), failed.end(), call) != failed.end();
+  return std::any_of(failed.begin(), failed.end(),
+                     [&](const std::string& name) { return PlainName(name) == call; });
 }
 
 bool Hits(const char* call, std::initializer_list<int> errors) {

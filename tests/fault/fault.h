@@ -79,6 +79,7 @@ struct Outcome {
   std::vector<std::string> failed;  // the calls that failed, see FailedCalls()
   std::vector<LogLine> log;         // everything logged
 
+  // `call` is a name as in the manual page, whatever it is called for large files and late dates.
   bool Failed(const std::string& call) const;
   // Failed, and not just because of a signal, after which most calls are made again.
   bool FailedForGood(const std::string& call) const;

@@ -89,8 +89,7 @@ void CacheFaultTest::CheckState(const Outcome& outcome) const {
   Document();
   FileLock lock(path + ".lock");
   EXPECT_TRUE(lock.tryLock(LOCK_EX | LOCK_NB));
-  const bool pidFileUnread = outcome.Failed("openat") || outcome.Failed("openat64") ||
-                             outcome.Failed("fstat") || outcome.Failed("fstat64") ||
+  const bool pidFileUnread = outcome.Failed("openat") || outcome.Failed("fstat") ||
                              outcome.Failed("read") || outcome.Failed("new");
   const bool pidFileKept =
       pidFileUnread ||

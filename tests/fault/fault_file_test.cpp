@@ -93,7 +93,7 @@ TEST_F(FileFaultTest, ReadGivesTheWholeDocumentOrLeavesTheValue) {
     std::vector<LogLine> expected;
     if (outcome.Failed("access")) {
       expected = {Debug("file.cpp", "Read", "file[" + path + "] is not existed")};
-    } else if (outcome.FailedForGood("openat64")) {
+    } else if (outcome.FailedForGood("openat")) {
       expected = {Failure("Read", "File[" + path + "] is not opened.")};
     }
     if (outcome.error != Fault::kNoMemory) {
@@ -129,7 +129,7 @@ TEST_F(FileFaultTest, WriteSaysWhichStepFailed) {
   const auto run = [&] { return File::Write(path, 12345); };
   const auto check = [&](const Outcome& outcome) {
     const LogLine notOpened = Failure("Write", "Failed to open file [" + path + "]");
-    if (outcome.FailedForGood("fopen64") || outcome.log == std::vector<LogLine>{notOpened}) {
+    if (outcome.FailedForGood("fopen") || outcome.log == std::vector<LogLine>{notOpened}) {
       EXPECT_FALSE(outcome.succeeded);
       EXPECT_EQ(outcome.log, std::vector<LogLine>{notOpened});
       EXPECT_EQ(ReadText(path), kOld);

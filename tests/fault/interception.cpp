@@ -13,7 +13,8 @@ namespace {
 
 std::array<Interception*, 8> waiting{};
 
-// "fstatat64" and "__fstatat64_time64" are "fstatat".
+}  // namespace
+
 std::string_view PlainName(std::string_view name) {
   const auto isEnd = [&](std::string_view end) {
     return name.size() > end.size() && name.substr(name.size() - end.size()) == end;
@@ -24,8 +25,6 @@ std::string_view PlainName(std::string_view name) {
   }
   return name;
 }
-
-}  // namespace
 
 Interception::Interception(std::string callName, int callNumber, std::function<int()> toRun)
     : call(std::move(callName)), number(callNumber), action(std::move(toRun)) {

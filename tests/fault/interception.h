@@ -40,6 +40,9 @@ class Interception {
   const std::function<int()> action;
 };
 
+// "fstatat64" and "__fstatat64_time64" are "fstatat".
+std::string_view PlainName(std::string_view name);
+
 // Runs the action that waits for this call, if any. Whether the call is to fail; errno is set then.
 bool Intercepts(std::string_view call);
 
