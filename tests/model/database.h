@@ -62,6 +62,11 @@ class SqliteDB : public ErrRecorder {
     dbHandle = nullptr;
   }
 
+  bool IsInTransaction() const {
+    return dbHandle != nullptr && sqlite3_get_autocommit(dbHandle) == 0;
+  }
+  void RollBack() { sqlite3_exec(dbHandle, "ROLLBACK", nullptr, nullptr, nullptr); }
+
   bool IsExisted() const { return std::filesystem::exists(Calls::Place(dbPath)); }
 
   bool DoExecSqliteCommand(const std::string& sql) {
@@ -267,14 +272,12 @@ class SqliteDB : public ErrRecorder {
   }
 
   bool ExecOnce(const std::string& sql) {
-    const bool wasFree = sqlite3_get_autocommit(dbHandle) != 0;
+    const bool wasFree = !IsInTransaction();
     char* text = nullptr;
     const int code = sqlite3_exec(dbHandle, sql.c_str(), nullptr, nullptr, &text);
     if (code != SQLITE_OK) SetDBErr(code, text);
     if (text != nullptr) sqlite3_free(text);
-    if (code != SQLITE_OK && wasFree && sqlite3_get_autocommit(dbHandle) == 0) {
-      sqlite3_exec(dbHandle, "ROLLBACK", nullptr, nullptr, nullptr);
-    }
+    if (code != SQLITE_OK && wasFree && IsInTransaction()) RollBack();
     return code == SQLITE_OK;
   }
 
@@ -366,6 +369,26 @@ class SqliteDB : public ErrRecorder {
   std::string logLabel;
 };
 
+class Transaction {
+ public:
+  explicit Transaction(SqliteDB& db) : handle(db), isBegun(db.Exec("BEGIN IMMEDIATE")) {}
+  Transaction(const Transaction&) = delete;
+  Transaction& operator=(const Transaction&) = delete;
+  ~Transaction() { Rollback(); }
+  bool IsOpen() const { return isBegun && handle.IsInTransaction(); }
+  bool Commit() {
+    isBegun = !handle.Exec("COMMIT");
+    return !isBegun;
+  }
+  void Rollback() {
+    if (IsOpen()) handle.RollBack();
+  }
+
+ private:
+  SqliteDB& handle;
+  bool isBegun;
+};
+
 }  // namespace Model
 
 // Handles that name their codes, if they are told to.
@@ -410,6 +433,9 @@ class Database {
         break;
       case 5:
         OfDeletes();
+        break;
+      case 6:
+        OfTransaction();
         break;
       default:
         OfCommand();
@@ -581,6 +607,30 @@ class Database {
     Do("copy the recorder", [&](auto side) {
       *side(other) = *side(db);
       return Show(side(other)->GetErr());
+    });
+  }
+
+  static KeloDRCore::SqliteTransaction Begin(Library /*side*/, KeloDRCore::SqliteDB& handle) {
+    return KeloDRCore::SqliteTransaction(handle);
+  }
+  static Model::Transaction Begin(Modelled /*side*/, Model::SqliteDB& handle) {
+    return Model::Transaction(handle);
+  }
+
+  void OfTransaction() {
+    const size_t end = Draw::Below(4);
+    Do("a transaction that ends by " + std::to_string(end), [&](auto side) {
+      std::string shown;
+      {
+        auto transaction = Begin(side, *side(db));
+        shown = Show(transaction.IsOpen(), side(db)->GetErr());
+        side(db)->InsertRecord(side(commands.insert));
+        if (end == 0) side(db)->Close();
+        if (end == 1) transaction.Rollback();
+        if (end == 2 && transaction.IsOpen()) shown += Show(transaction.Commit());
+        shown += Show(transaction.IsOpen(), side(db)->GetErr());
+      }
+      return shown + Show(side(db)->GetErr()) + Calls::DumpDatabase();
     });
   }
 

@@ -163,6 +163,8 @@ class Files {
   void Step() {
     switch (Draw::Below(20)) {
       case 0:
+      case 10:
+      case 11:
         return OfDirectory();
       case 1:
         return OfWord();
