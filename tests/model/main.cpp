@@ -85,8 +85,9 @@ int main(int argc, char** argv) {
     }
     found->second = strtoul(argument.c_str() + end + 1, nullptr, 10);
   }
-  const std::string dir = MakeDirectory();
+  static const std::string dir = MakeDirectory();
   if (dir.empty()) return 2;
+  atexit([] { std::filesystem::remove_all(dir); });
   umask(022);
   ReplaceSleeps([](useconds_t length) {
     Calls::Sleep(length);
@@ -97,6 +98,5 @@ int main(int argc, char** argv) {
   const auto start = std::chrono::steady_clock::now();
   Run(settings["count"], dir);
   const std::chrono::duration<double> length = std::chrono::steady_clock::now() - start;
-  std::filesystem::remove_all(dir);
   printf("%lu operations, %.1f s: no difference\n", Trace::Count(), length.count());
 }
