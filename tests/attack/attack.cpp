@@ -48,18 +48,17 @@ void AsUser(const std::function<void()>& body) {
   EXPECT_EQ(status, 0);
 }
 
-UserLoop::UserLoop(const std::function<void()>& step) : user(fork()) {
-  if (user != 0) return;
-  BecomeUser();
-  prctl(PR_SET_PDEATHSIG, SIGKILL);
-  while (!testing::Test::HasFailure()) step();
-  _exit(1);
-}
+UserLoop::UserLoop(const std::function<void()>& step)
+    : user(StartChild([&] {
+        BecomeUser();
+        prctl(PR_SET_PDEATHSIG, SIGKILL);
+        while (!testing::Test::HasFailure()) step();
+        return 1;
+      })) {}
 
 UserLoop::~UserLoop() {
   kill(user, SIGKILL);
-  int status = 0;
-  EXPECT_EQ(waitpid(user, &status, 0), user);
+  const int status = JoinChild(user);
   EXPECT_TRUE(WIFSIGNALED(status)) << status;
 }
 

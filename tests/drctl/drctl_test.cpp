@@ -485,17 +485,15 @@ TEST_F(DrctlCacheTest, AStaleFileIsScannedAgain) {
 TEST_F(DrctlCacheTest, OfTwentyProcessesAtOnceOneScans) {
   std::vector<pid_t> children;
   for (int i = 0; i < 20; ++i) {
-    children.push_back(fork());
-    if (children.back() != 0) continue;
-    const Outcome outcome = ListCached();
-    WriteText(Path("answer-" + std::to_string(i)), outcome.err);
-    _exit(outcome.status);
+    children.push_back(StartChild([&] {
+      const Outcome outcome = ListCached();
+      WriteText(Path("answer-" + std::to_string(i)), outcome.err);
+      return outcome.status;
+    }));
   }
   std::string answers;
   for (size_t i = 0; i < children.size(); ++i) {
-    int status = -1;
-    ASSERT_EQ(waitpid(children[i], &status, 0), children[i]);
-    EXPECT_EQ(status, 0);
+    EXPECT_EQ(JoinChild(children[i]), 0);
     answers += ReadText(Path("answer-" + std::to_string(i)));
   }
   EXPECT_EQ(CountOf(answers, "answered from a fresh scan"), 1) << answers;

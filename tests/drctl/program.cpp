@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <atomic>
-#include <cerrno>
 #include <cstdlib>
 
 #include "support/clean_test.h"
@@ -45,11 +44,8 @@ Outcome RunProgram(const std::string& dir, const std::vector<std::string>& argum
   const std::string streams =
       dir + "/.run-" + std::to_string(getpid()) + "-" + std::to_string(++runs);
   WriteText(streams + ".in", input);
-  const pid_t child = fork();
-  if (child == 0) Become(arguments, streams, environment);
-  int status = -1;
-  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
-  }
+  const int status =
+      JoinChild(StartChild([&]() -> int { Become(arguments, streams, environment); }));
   unlink((streams + ".in").c_str());
   return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, TakeText(streams + ".out"),
           TakeText(streams + ".err")};

@@ -7,8 +7,6 @@
 #ifndef KELODRCORE_TESTS_FAULT_FAULT_H_
 #define KELODRCORE_TESTS_FAULT_FAULT_H_
 
-#include <dlfcn.h>
-
 #include <climits>
 #include <functional>
 #include <initializer_list>
@@ -54,12 +52,6 @@ std::vector<std::string> FailedCalls();
 bool Hits(const char* call, std::initializer_list<int> errors);
 
 bool IsSuspended();
-
-// The definition of a call that stands behind this program's own.
-template <typename Function>
-Function* Next(const char* call) {
-  return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, call));
-}
 
 // Calls made while it lives neither count nor fail.
 class Suspension {

@@ -21,11 +21,11 @@
 
 #include "fault/fault.h"
 #include "fault/interception.h"
+#include "support/next.h"
 
 using Fault::Hits;
 using Fault::Intercepts;
 using Fault::kNoMemory;
-using Fault::Next;
 
 namespace {
 
@@ -189,7 +189,19 @@ extern "C" int __fprintf_chk(FILE* stream, int /*flag*/, const char* format, ...
 }
 
 // No sweep waits, not for the disk either: only a loss of power would show the difference.
-extern "C" int usleep(useconds_t /*microseconds*/) { return 0; }
+#define FAULT_SLEEP(name)                          \
+  extern "C" int Fault_##name(...) __asm__(#name); \
+  extern "C" int Fault_##name(...) { return 0; }
+
+FAULT_SLEEP(sleep)
+FAULT_SLEEP(usleep)
+FAULT_SLEEP(nanosleep)
+FAULT_SLEEP(clock_nanosleep)
+#if __SIZEOF_LONG__ == 4
+FAULT_SLEEP(__nanosleep64)
+FAULT_SLEEP(__clock_nanosleep_time64)
+#endif
+
 extern "C" int fsync(int /*fd*/) {
   return Intercepts("fsync") || Hits("fsync", {EINTR, EIO, ENOSPC}) ? -1 : 0;
 }

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <ctime>
 #include <set>
 #include <sstream>
 #include <string>
@@ -152,6 +153,19 @@ TEST_F(FaultCallsTest, AFullDiskTakesAHalfAndThenNothing) {
   EXPECT_EQ(Fault::Disarm(), 2);
   close(fd);
   EXPECT_EQ(ReadText(Path("file")), "abcd");
+}
+
+// One version of SQLite waits by usleep, another by nanosleep or clock_nanosleep.
+TEST_F(FaultCallsTest, NoSleepTakesTime) {
+  constexpr timespec kHour = {3600, 0};
+  EXPECT_EQ(RunInChild([&] {
+              alarm(5);
+              EXPECT_EQ(usleep(999999), 0);
+              EXPECT_EQ(sleep(3600), 0U);
+              EXPECT_EQ(nanosleep(&kHour, nullptr), 0);
+              EXPECT_EQ(clock_nanosleep(CLOCK_MONOTONIC, 0, &kHour, nullptr), 0);
+            }),
+            0);
 }
 
 // Their reports are a few bytes long, and those go as a whole.

@@ -9,10 +9,10 @@
 
 #include "fault/fault.h"
 #include "fault/interception.h"
+#include "support/next.h"
 
 using Fault::Hits;
 using Fault::Intercepts;
-using Fault::Next;
 
 namespace {
 

@@ -32,7 +32,7 @@ class CacheCrowdTest : public CacheProcessTest {
     EXPECT_EQ(pipe2(gate, O_CLOEXEC), 0);
     std::set<pid_t> readers;
     for (int i = 0; i < 64; ++i) {
-      readers.insert(Start([&] {
+      readers.insert(StartChild([&] {
         close(gate[1]);
         char byte = 0;
         EXPECT_EQ(read(gate[0], &byte, 1), 0);  // until the gate is closed
@@ -155,14 +155,14 @@ TEST_F(CacheCrowdTest, ManyWaitersGoOnWhenTheUpdaterIsKilledEvenAsAZombie) {
   EXPECT_TRUE(WaitForLines(StartsWaiting(), kWaiters));
   EXPECT_EQ(CountInMirror(FinishesWaiting()), 0U);
   kill(updater, SIGKILL);
-  for (const pid_t waiter : waiters) EXPECT_EQ(Join(waiter), 0);
+  for (const pid_t waiter : waiters) EXPECT_EQ(JoinChild(waiter), 0);
   EXPECT_EQ(CountInMirror(FinishesWaiting()), kWaiters);
 
   TestCache next = MakeCache();
   next.FetchGives("next");
   EXPECT_EQ(next.Read(), "next");
   ExpectLog({Starts(), Finishes()});
-  EXPECT_TRUE(WIFSIGNALED(Join(updater)));
+  EXPECT_TRUE(WIFSIGNALED(JoinChild(updater)));
 }
 
 TEST_F(CacheCrowdTest, ReadersSeeWholeDocumentsThrough5000Rewrites) {
@@ -177,7 +177,7 @@ TEST_F(CacheCrowdTest, ReadersSeeWholeDocumentsThrough5000Rewrites) {
   ASSERT_TRUE(MakeCache().UpdateWithData(document(0)));
   const std::string done = Path("done");
   // Newcomers load the file each time; their numbers never go back.
-  const pid_t newcomers = Start([&] {
+  const pid_t newcomers = StartChild([&] {
     int last = 0;
     while (!std::filesystem::exists(done)) {
       const Json::Value data = MakeCache(false).Read();
@@ -187,7 +187,7 @@ TEST_F(CacheCrowdTest, ReadersSeeWholeDocumentsThrough5000Rewrites) {
     return last > 0 ? 0 : 2;
   });
   // A resident answers from memory in between.
-  const pid_t resident = Start([&] {
+  const pid_t resident = StartChild([&] {
     const TestCache cache = MakeCache(false);
     while (!std::filesystem::exists(done)) {
       const Json::Value data = cache.Read();
@@ -198,8 +198,8 @@ TEST_F(CacheCrowdTest, ReadersSeeWholeDocumentsThrough5000Rewrites) {
   const TestCache writer = MakeCache();
   for (int i = 1; i <= kRewrites; ++i) EXPECT_TRUE(writer.UpdateWithData(document(i)));
   WriteText(done, "");
-  EXPECT_EQ(Join(newcomers), 0);
-  EXPECT_EQ(Join(resident), 0);
+  EXPECT_EQ(JoinChild(newcomers), 0);
+  EXPECT_EQ(JoinChild(resident), 0);
   EXPECT_EQ(LogCapture::ReadMirror(mirror), std::vector<LogLine>{});
 }
 

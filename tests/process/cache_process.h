@@ -58,24 +58,6 @@ class CacheProcessTest : public CacheFixture {
     EXPECT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 0), 0);
   }
 
-  // Runs `body` in a child, whose exit status is what it returns, or 99 when it failed an
-  // expectation.
-  static pid_t Start(const std::function<int()>& body) {
-    fflush(nullptr);
-    const pid_t child = fork();
-    if (child != 0) return child;
-    const int status = body();
-    fflush(nullptr);
-    _exit(testing::Test::HasFailure() ? 99 : status);
-  }
-
-  // The wait status.
-  static int Join(pid_t child) {
-    int status = -1;
-    EXPECT_EQ(waitpid(child, &status, 0), child);
-    return status;
-  }
-
   // Waits for every child, refreshers too; how many there were. Each must have exited with 0.
   static int JoinAll() {
     int count = 0;
@@ -122,7 +104,7 @@ class CacheProcessTest : public CacheFixture {
   // A child that has claimed the update and is fetching; it waits for `finish`, then gives "new".
   pid_t StartUpdater(const Event& finish) const {
     const Event fetching;
-    const pid_t updater = Start([&] {
+    const pid_t updater = StartChild([&] {
       TestCache cache = MakeCache();
       cache.fetch = [&](Json::Value& out) {
         fetching.Cause();
@@ -138,7 +120,7 @@ class CacheProcessTest : public CacheFixture {
 
   // A child that updates with required data, fetches nothing and ends with this data in memory.
   pid_t StartWaiter(const Json::Value& expected) const {
-    return Start([&] {
+    return StartChild([&] {
       TestCache cache = MakeCache();
       cache.fetch = [](Json::Value&) {
         ADD_FAILURE() << "fetched";

@@ -6,7 +6,6 @@
 #include <gmock/gmock.h>
 #include <poll.h>
 #include <sys/file.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -20,25 +19,13 @@
 #include <thread>
 
 #include "kelodrcore/file_lock.h"
+#include "support/lock_test.h"
 #include "support/process.h"
 #include "support/test_clock.h"
 
 namespace {
 
 using KeloDRCore::FileLock;
-
-// Called before each flock of this process.
-std::function<void()> onFlock;
-
-}  // namespace
-
-// Stands before the C library's.
-extern "C" int flock(int fd, int operation) noexcept {
-  if (onFlock) onFlock();
-  return static_cast<int>(syscall(SYS_flock, fd, operation));
-}
-
-namespace {
 
 // --- The claim
 
@@ -118,11 +105,11 @@ TEST_F(CacheProcessTest, NoClaimWhenAnotherProcessWasQuicker) {
 
 TEST_F(CacheProcessTest, NoClaimAndNoLineWhenAnotherProcessClaimedSinceTheFirstLook) {
   int locks = 0;
-  onFlock = [&] {
+  LockCalls::beforeFlock = [&](int) {
     if (++locks == 2) WriteText(pidFile, std::to_string(getppid()));
   };
   EXPECT_FALSE(MakeCache().Update());
-  onFlock = nullptr;
+  LockCalls::beforeFlock = nullptr;
   EXPECT_EQ(locks, 2);
   ExpectLog({});
   std::filesystem::remove(pidFile);
@@ -180,8 +167,8 @@ TEST_F(CacheProcessTest, TheClaimOfAnotherProcessIsNotReleased) {
 }
 
 TEST_F(CacheProcessTest, TheClaimOfADeadProcessIsRemoved) {
-  const pid_t dead = Start([] { return 0; });
-  EXPECT_EQ(Join(dead), 0);
+  const pid_t dead = StartChild([] { return 0; });
+  EXPECT_EQ(JoinChild(dead), 0);
   TestCache cache = MakeCache();
   cache.fetch = [&](Json::Value& out) {
     WriteText(pidFile, std::to_string(dead));
@@ -241,8 +228,8 @@ TEST_F(CacheProcessTest, ASubclassThatRequiresNoFreshDataLetsARefresherFetch) {
 // --- Who counts as an updater
 
 TEST_F(CacheProcessTest, APidFileOfADeadOrReusedPidOrOfNobodyStopsNoUpdate) {
-  const pid_t dead = Start([] { return 0; });
-  EXPECT_EQ(Join(dead), 0);
+  const pid_t dead = StartChild([] { return 0; });
+  EXPECT_EQ(JoinChild(dead), 0);
   for (const std::string& text :
        {std::to_string(dead), std::to_string(getppid()) + "\n1\n", std::string("0"),
         std::string("-1"), std::string("x"), std::string()}) {
@@ -431,8 +418,8 @@ TEST_F(CacheProcessTest, AWaiterGetsTheFreshData) {
   const pid_t waiter = StartWaiter("new");
   EXPECT_TRUE(WaitForLines(StartsWaiting()));
   finish.Cause();
-  EXPECT_EQ(Join(waiter), 0);
-  EXPECT_EQ(Join(updater), 0);
+  EXPECT_EQ(JoinChild(waiter), 0);
+  EXPECT_EQ(JoinChild(updater), 0);
   EXPECT_EQ(LogCapture::ReadMirror(mirror).back(), FinishesWaiting());
 }
 
@@ -443,9 +430,9 @@ TEST_F(CacheProcessTest, AWaiterGoesOnOnceTheFileIsFreshWhoeverUpdates) {
   const pid_t waiter = StartWaiter("other");
   EXPECT_TRUE(WaitForLines(StartsWaiting()));
   WriteCacheFile("\"other\"");
-  EXPECT_EQ(Join(waiter), 0);
+  EXPECT_EQ(JoinChild(waiter), 0);
   finish.Cause();
-  EXPECT_EQ(Join(updater), 0);
+  EXPECT_EQ(JoinChild(updater), 0);
 }
 
 TEST_F(CacheProcessTest, AReaderThatNeedsNoFreshDataDoesNotWait) {
@@ -647,7 +634,7 @@ TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {
   WriteCacheFile("\"old\"", kStale);
   LogCapture::MirrorTo("");
   constexpr int kDone = 7;  // a status that only the end of the child's body gives
-  const pid_t child = Start([&] {
+  const pid_t child = StartChild([&] {
     const TestCache cache = MakeCache(false);
     const std::set<int> open = OpenDescriptors();
     rlim_t limit = 0;
@@ -664,7 +651,7 @@ TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {
     ExpectLog({failed, ReadFailed()});
     return kDone;
   });
-  const int status = Join(child);
+  const int status = JoinChild(child);
   EXPECT_TRUE(WIFEXITED(status));
   EXPECT_EQ(WEXITSTATUS(status), kDone);
 }

@@ -1,6 +1,5 @@
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -166,16 +165,14 @@ TEST_F(FileLockProcessTest, WithoutNonBlockTheKernelWaits) {
   const pid_t waiter = getpid();
   std::unique_ptr<FileLock> held(new FileLock(name));
   ASSERT_TRUE(held->lock(LOCK_EX | LOCK_NB, 0));
-  fflush(nullptr);
-  const pid_t child = fork();
-  if (child == 0) {
+  const pid_t child = StartChild([&] {
     // Ends, as the last that has the lock, when the waiter sleeps in the kernel.
     char byte = 0;
     bool done = read(go[0], &byte, 1) == 1;
     const std::string stat = "/proc/" + std::to_string(waiter) + "/stat";
     while (ReadText(stat).find(") S ") == std::string::npos) sched_yield();
-    _exit(done ? 0 : 1);
-  }
+    return done ? 0 : 1;
+  });
   held.reset();
   FileLock lock(name);
   LockCalls::Forget();
@@ -184,9 +181,7 @@ TEST_F(FileLockProcessTest, WithoutNonBlockTheKernelWaits) {
   LockCalls::beforeFlock = nullptr;
   EXPECT_EQ(flocks, 1);
   EXPECT_FALSE(IsFree());
-  int status = -1;
-  EXPECT_EQ(waitpid(child, &status, 0), child);
-  EXPECT_EQ(status, 0);
+  EXPECT_EQ(JoinChild(child), 0);
   close(go[0]);
   close(go[1]);
 }
@@ -220,15 +215,13 @@ TEST_F(FileLockProcessTest, AProgramThatIsExecutedDoesNotHoldTheLock) {
   ASSERT_TRUE(lock->lock(LOCK_EX | LOCK_NB, 0));
   int done[2];
   ASSERT_EQ(pipe(done), 0);
-  fflush(nullptr);
-  const pid_t child = fork();
-  if (child == 0) {
+  const pid_t child = StartChild([&] {
     close(done[0]);
     // Answers when it runs, and then only waits.
     const std::string script = "echo >&" + std::to_string(done[1]) + "; exec sleep 1000";
     execl("/bin/sh", "sh", "-c", script.c_str(), nullptr);
-    _exit(1);
-  }
+    return 1;
+  });
   close(done[1]);
   char byte = 0;
   EXPECT_EQ(read(done[0], &byte, 1), 1);
@@ -236,7 +229,7 @@ TEST_F(FileLockProcessTest, AProgramThatIsExecutedDoesNotHoldTheLock) {
   delete lock;
   EXPECT_TRUE(IsFree());
   kill(child, SIGKILL);
-  EXPECT_EQ(waitpid(child, nullptr, 0), child);
+  JoinChild(child);
 }
 
 TEST_F(FileLockProcessTest, OneOfManyIsInsideAtATime) {
@@ -244,23 +237,20 @@ TEST_F(FileLockProcessTest, OneOfManyIsInsideAtATime) {
   WriteText(Path("number"), "0");
   constexpr int kProcesses = 6;
   constexpr int kRounds = 40;
-  fflush(nullptr);
+  std::vector<pid_t> children;
   for (int i = 0; i < kProcesses; ++i) {
-    if (fork() != 0) continue;
-    FileLock lock(name);
-    bool ok = true;
-    for (int round = 0; round < kRounds; ++round) {
-      ok = lock.lock(LOCK_EX, 0) && ok;
-      WriteText(Path("number"), std::to_string(std::stoi(ReadText(Path("number"))) + 1));
-      lock.unlock();
-    }
-    _exit(ok ? 0 : 1);
+    children.push_back(StartChild([&] {
+      FileLock lock(name);
+      bool ok = true;
+      for (int round = 0; round < kRounds; ++round) {
+        ok = lock.lock(LOCK_EX, 0) && ok;
+        WriteText(Path("number"), std::to_string(std::stoi(ReadText(Path("number"))) + 1));
+        lock.unlock();
+      }
+      return ok ? 0 : 1;
+    }));
   }
-  for (int i = 0; i < kProcesses; ++i) {
-    int status = -1;
-    EXPECT_GT(wait(&status), 0);
-    EXPECT_EQ(status, 0);
-  }
+  for (const pid_t child : children) EXPECT_EQ(JoinChild(child), 0);
   EXPECT_EQ(ReadText(Path("number")), std::to_string(kProcesses * kRounds));
 }
 

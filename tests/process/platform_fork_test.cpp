@@ -208,8 +208,7 @@ TEST_F(ForkTest, KeepsTheSignalMaskOnBothSides) {
 TEST_F(ForkTest, DoesNotHoldTheOutputOfTheCallerOpen) {
   Channel output;
   Channel down;
-  const pid_t handler = fork();
-  if (handler == 0) {
+  const pid_t handler = StartChild([&] {
     dup2(output.Writer(), STDOUT_FILENO);
     output.CloseWriter();
     down.CloseWriter();
@@ -217,11 +216,11 @@ TEST_F(ForkTest, DoesNotHoldTheOutputOfTheCallerOpen) {
       down.Receive();
       up.Send(1);
     }
-    _exit(0);
-  }
+    return 0;
+  });
   output.CloseWriter();
   EXPECT_EQ(output.Receive(), -1);
-  EXPECT_EQ(waitpid(handler, nullptr, 0), handler);
+  EXPECT_EQ(JoinChild(handler), 0);
   EXPECT_EQ(wait4(-1, nullptr, WNOHANG, nullptr), 0) << "the detached child is to be running still";
   down.CloseWriter();
   EXPECT_EQ(up.Receive(), 1);

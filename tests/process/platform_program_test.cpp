@@ -111,10 +111,7 @@ TEST_F(ExecTest, LearnsTheStatusWhereAHandlerReapsEverything) {
 TEST_F(ExecTest, LeavesOtherChildrenToTheKernelWhereSigchldIsIgnored) {
   EXPECT_EQ(RunInChild([] {
               Handle(SIGCHLD, SIG_IGN, 0);
-              const pid_t other = fork();
-              if (other == 0) {
-                for (;;) pause();
-              }
+              const pid_t other = StartChild(pause);
               EXPECT_EQ(Shell("kill -KILL $0; for i in $(seq 1000); do kill -0 $0 2>/dev/null || "
                               "exit 0; sleep 0.01; done; exit 1",
                               std::to_string(other).c_str()),
@@ -124,12 +121,9 @@ TEST_F(ExecTest, LeavesOtherChildrenToTheKernelWhereSigchldIsIgnored) {
 }
 
 TEST_F(ExecTest, LeavesOtherChildrenToTheCaller) {
-  const pid_t other = fork();
-  if (other == 0) _exit(7);
+  const pid_t other = StartChild([] { return 7; });
   EXPECT_EQ(Shell("exit 0"), 0);
-  int status = -1;
-  ASSERT_EQ(waitpid(other, &status, 0), other);
-  EXPECT_EQ(WEXITSTATUS(status), 7);
+  EXPECT_EQ(JoinChild(other), W_EXITCODE(7, 0));
 }
 
 TEST_F(ExecTest, WaitsThroughAStormOfSignals) {

@@ -4,7 +4,6 @@
 #include <gmock/gmock.h>
 #include <sqlite3.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -20,51 +19,12 @@ using testing::IsEmpty;
 
 const Json::Value kBusy = Error(405, 5, "database is locked");
 
-// A child process that holds an exclusive lock on a database from construction until Release().
-class LockHolder {
- public:
-  explicit LockHolder(const std::string& path) {
-    if (pipe2(locked, O_CLOEXEC) != 0 || pipe2(release, O_CLOEXEC) != 0) abort();
-    child = fork();
-    if (child == 0) Hold(path.c_str());
-    close(locked[1]);
-    close(release[0]);
-    char byte = 0;
-    EXPECT_EQ(read(locked[0], &byte, 1), 1) << "the other process got no lock";
-    close(locked[0]);
-  }
-
-  ~LockHolder() { Release(); }
-
-  void Release() {
-    if (child <= 0) return;
-    close(release[1]);
-    int status = -1;
-    waitpid(child, &status, 0);
-    EXPECT_EQ(status, 0);
-    child = -1;
-  }
-
- private:
-  [[noreturn]] void Hold(const char* path) {
-    close(locked[0]);
-    close(release[1]);
-    sqlite3* db = nullptr;
-    if (sqlite3_open(path, &db) != SQLITE_OK ||
-        sqlite3_exec(db, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr) != SQLITE_OK ||
-        write(locked[1], "", 1) != 1) {
-      _exit(1);
-    }
-    char byte = 0;
-    const bool isEnd = read(release[0], &byte, 1) == 0;
-    sqlite3_close(db);
-    _exit(isEnd ? 0 : 1);
-  }
-
-  int locked[2];
-  int release[2];
-  pid_t child;
-};
+// For a Holder: takes an exclusive lock that ends with the process.
+bool LockExclusively(const std::string& path) {
+  sqlite3* db = nullptr;
+  return sqlite3_open(path.c_str(), &db) == SQLITE_OK &&
+         sqlite3_exec(db, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr) == SQLITE_OK;
+}
 
 class SqliteDBProcessTest : public DatabaseTest {
  protected:
@@ -78,7 +38,7 @@ class SqliteDBProcessTest : public DatabaseTest {
 };
 
 TEST_F(SqliteDBProcessTest, EachAttemptReallyWaitsOneSecond) {
-  const LockHolder holder(path);
+  const Holder holder([this] { return LockExclusively(path); });
   Pauses::Start();
   const auto start = std::chrono::steady_clock::now();
   EXPECT_FALSE(db->Exec("INSERT INTO t VALUES (2)"));
@@ -90,7 +50,7 @@ TEST_F(SqliteDBProcessTest, EachAttemptReallyWaitsOneSecond) {
 }
 
 TEST_F(SqliteDBProcessTest, ALockForGoodEndsOnePastTheLimit) {
-  const LockHolder holder(path);
+  const Holder holder([this] { return LockExclusively(path); });
   for (const unsigned int limit : {0U, 1U, 3U}) {
     SqliteDB patient(path, limit, "");
     const auto expectWaits = [&] {
@@ -115,8 +75,8 @@ TEST_F(SqliteDBProcessTest, ALockForGoodEndsOnePastTheLimit) {
 
 TEST_F(SqliteDBProcessTest, ALockReleasedInTheFirstPauseIsSurvived) {
   SqliteDB patient(path, 1, "");
-  LockHolder holder(path);
-  Pauses::Start([&] { holder.Release(); }, SkipSleep);
+  Holder holder([this] { return LockExclusively(path); });
+  Pauses::Start([&] { holder.Kill(); }, SkipSleep);
   EXPECT_TRUE(patient.Exec("INSERT INTO t VALUES (2)"));
   EXPECT_EQ(patient.GetErr(), Error(0));
   EXPECT_EQ(Pauses::SqliteWait(), 1000U);
@@ -127,9 +87,9 @@ TEST_F(SqliteDBProcessTest, ALockReleasedInTheFirstPauseIsSurvived) {
 
 TEST_F(SqliteDBProcessTest, ALockReleasedInTheLastPauseIsSurvived) {
   SqliteDB patient(path, 3, "");
-  LockHolder holder(path);
+  Holder holder([this] { return LockExclusively(path); });
   const auto releaseInThird = [&] {
-    if (Pauses::Lengths().size() == 3) holder.Release();
+    if (Pauses::Lengths().size() == 3) holder.Kill();
   };
   Pauses::Start(releaseInThird, SkipSleep);
   EXPECT_TRUE(patient.SelectByCommand("SELECT n FROM t", records));
@@ -138,8 +98,8 @@ TEST_F(SqliteDBProcessTest, ALockReleasedInTheLastPauseIsSurvived) {
 }
 
 TEST_F(SqliteDBProcessTest, ALockReleasedWithinTheBusyTimeoutIsNoRetry) {
-  LockHolder holder(path);
-  Pauses::Start(nullptr, [&] { holder.Release(); });
+  Holder holder([this] { return LockExclusively(path); });
+  Pauses::Start(nullptr, [&] { holder.Kill(); });
   EXPECT_TRUE(db->Exec("INSERT INTO t VALUES (2)"));
   EXPECT_GT(Pauses::SqliteWait(), 0U);
   Pauses::ExpectCount(0);
@@ -164,7 +124,7 @@ TEST_F(SqliteDBProcessTest, ALockedTableOfASharedCacheIsRetriedAsLocked) {
 }
 
 TEST_F(SqliteDBProcessTest, AnInsertOnALockedFileFailsAtTheTable) {
-  const LockHolder holder(path);
+  const Holder holder([this] { return LockExclusively(path); });
   Pauses::Start(nullptr, SkipSleep);
   EXPECT_FALSE(db->InsertRecord(InsertOf(SqliteTableHandler("t", "n"), "n", 2)));
   EXPECT_EQ(db->GetErr(), kBusy);
@@ -176,10 +136,8 @@ TEST_F(SqliteDBProcessTest, AnInsertOnALockedFileFailsAtTheTable) {
              Err(kFile, "Exec", "Failed to create table [t]")});
 }
 
-// A child that inserts 200 rows of its own once `gate` reaches its end.
-pid_t StartWriter(const std::string& path, int number, const int (&gate)[2]) {
-  const pid_t child = fork();
-  if (child != 0) return child;
+// Inserts 200 rows of its own once `gate` reaches its end.
+int WriteRows(const std::string& path, int number, const int (&gate)[2]) {
   close(gate[1]);
   char byte = 0;
   bool isGood = read(gate[0], &byte, 1) == 0;
@@ -193,21 +151,19 @@ pid_t StartWriter(const std::string& path, int number, const int (&gate)[2]) {
       isGood = db.InsertRecord(insert) && isGood;
     }
   }
-  _exit(isGood ? 0 : 1);
+  return isGood ? 0 : 1;
 }
 
 TEST_F(SqliteDBProcessTest, EightWritersLoseNoRow) {
   int gate[2];
   ASSERT_EQ(pipe2(gate, O_CLOEXEC), 0);
   std::vector<pid_t> writers;
-  for (int number = 0; number < 8; ++number) writers.push_back(StartWriter(path, number, gate));
+  for (int number = 0; number < 8; ++number) {
+    writers.push_back(StartChild([&] { return WriteRows(path, number, gate); }));
+  }
   close(gate[0]);
   close(gate[1]);
-  for (const pid_t writer : writers) {
-    int status = -1;
-    EXPECT_EQ(waitpid(writer, &status, 0), writer);
-    EXPECT_EQ(status, 0);
-  }
+  for (const pid_t writer : writers) EXPECT_EQ(JoinChild(writer), 0);
   int count = 0;
   EXPECT_TRUE(db->GetCount(SqliteTableHandler("shared", ""), count));
   EXPECT_EQ(count, 1600);
@@ -216,10 +172,8 @@ TEST_F(SqliteDBProcessTest, EightWritersLoseNoRow) {
       IsEmpty());
 }
 
-// A child that inserts 20 times 10 rows at once.
-pid_t StartBulkWriter(const std::string& path, int number) {
-  const pid_t child = fork();
-  if (child != 0) return child;
+// Inserts 20 times 10 rows at once.
+int WriteManyRows(const std::string& path, int number) {
   bool isGood = true;
   {
     SqliteDB db(path, 1000, "writer");
@@ -234,7 +188,7 @@ pid_t StartBulkWriter(const std::string& path, int number) {
       isGood = db.InsertRecords(table, rows) && isGood;
     }
   }
-  _exit(isGood ? 0 : 1);
+  return isGood ? 0 : 1;
 }
 
 TEST_F(SqliteDBProcessTest, WritersOfManyRecordsLoseNoneAndShowNoHalf) {
@@ -242,17 +196,15 @@ TEST_F(SqliteDBProcessTest, WritersOfManyRecordsLoseNoneAndShowNoHalf) {
       SqliteTableHandler("shared", "writer INTEGER, n INTEGER, UNIQUE (writer, n)")));
   db = std::make_unique<SqliteDB>(path, 1000, "reader");
   std::vector<pid_t> writers;
-  for (int number = 0; number < 4; ++number) writers.push_back(StartBulkWriter(path, number));
+  for (int number = 0; number < 4; ++number) {
+    writers.push_back(StartChild([&] { return WriteManyRows(path, number); }));
+  }
   int count = 0;
   while (count < 800) {
     ASSERT_TRUE(db->GetCount(SqliteTableHandler("shared", ""), count));
     ASSERT_EQ(count % 10, 0);
   }
-  for (const pid_t writer : writers) {
-    int status = -1;
-    EXPECT_EQ(waitpid(writer, &status, 0), writer);
-    EXPECT_EQ(status, 0);
-  }
+  for (const pid_t writer : writers) EXPECT_EQ(JoinChild(writer), 0);
   LogCapture::Clear();
 }
 

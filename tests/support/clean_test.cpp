@@ -51,33 +51,24 @@ void WriteText(const std::string& path, const std::string& text) {
   std::ofstream(path, std::ios::binary) << text;
 }
 
-int RunInChild(const std::function<void()>& body) {
-  constexpr int kPassed = 96;  // a body that ends its process itself cannot pass by chance
-  constexpr int kEndedEarly = 97;
-  fflush(nullptr);
-  const pid_t child = fork();
-  if (child == 0) {
-    body();
-    fflush(nullptr);
-    _exit(testing::Test::HasFailure() ? 99 : kPassed);
-  }
-  int status = -1;
-  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
-  }
-  if (status == W_EXITCODE(kPassed, 0)) return 0;
-  return status == 0 ? W_EXITCODE(kEndedEarly, 0) : status;
-}
+namespace {
 
-bool RunWithOwnMounts(const std::function<void()>& body) {
+// False when `enter` says that this process may not do what it is for.
+bool RunInside(bool (*enter)(), const std::function<void()>& body) {
   constexpr int kNotAllowed = 77;
   const int status = RunInChild([&] {
-    if (!EnterOwnMounts()) _exit(kNotAllowed);
+    if (!enter()) _exit(kNotAllowed);
     body();
   });
   if (WIFEXITED(status) && WEXITSTATUS(status) == kNotAllowed) return false;
   EXPECT_EQ(status, 0);
   return true;
 }
+
+}  // namespace
+
+bool RunWithOwnMounts(const std::function<void()>& body) { return RunInside(EnterOwnMounts, body); }
+bool RunAsRoot(const std::function<void()>& body) { return RunInside(BecomeRoot, body); }
 
 void RunWithOwnTmp(const std::string& size, const std::function<void()>& body) {
   if (!RunWithOwnMounts([&] {

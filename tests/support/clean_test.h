@@ -11,6 +11,7 @@
 #include <string>
 #include <vector>
 
+#include "support/child.h"
 #include "support/log_capture.h"
 #include "support/mounts.h"
 
@@ -23,16 +24,16 @@ std::vector<std::string> NamesIn(const std::string& dir);
 std::string ReadText(const std::string& path);
 void WriteText(const std::string& path, const std::string& text);
 
-// Runs `body` in a forked child and returns its wait status: 0 when it returned and no expectation
-// of it failed; never 0 when it ended the process itself. Failed expectations of the child are
-// printed by the child.
-int RunInChild(const std::function<void()>& body);
-
 // Runs `body` in a child whose mounts are its own, and expects it to pass; false when this process
 // may not do that. What `body` mounts is seen by nobody else and gone with the child.
 bool RunWithOwnMounts(const std::function<void()>& body);
 
-// The same with an empty /tmp of `size`; skips the test when this process may not mount one.
+// Runs `body` as root in a child, which for an ordinary user is root in a user namespace; false
+// when this process may not do that.
+bool RunAsRoot(const std::function<void()>& body);
+
+// RunWithOwnMounts() with an empty /tmp of `size`; skips the test when this process may not mount
+// one.
 void RunWithOwnTmp(const std::string& size, const std::function<void()>& body);
 
 // RunWithOwnMounts() with `file` in the place of the program at `path`.

@@ -2,10 +2,8 @@
 
 #include <fcntl.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
-#include <csignal>
 #include <filesystem>
 
 #include "kelodrcore/file_lock.h"
@@ -81,28 +79,4 @@ std::vector<LogLine> LockTest::CannotOpen(const std::string& file, const std::st
 bool LockTest::Hold(int type) const {
   static KeloDRCore::FileLock lock;
   return lock.setLockFile(name) && lock.lock(type, 0);
-}
-
-Holder::Holder(const std::function<bool()>& body) {
-  int ready[2];
-  EXPECT_EQ(pipe2(ready, O_CLOEXEC), 0);
-  fflush(nullptr);
-  pid = fork();
-  if (pid == 0) {
-    const char answer = body() ? 'y' : 'n';
-    if (write(ready[1], &answer, 1) != 1) _exit(1);
-    while (true) pause();
-  }
-  close(ready[1]);
-  char answer = 0;
-  EXPECT_EQ(read(ready[0], &answer, 1), 1);
-  EXPECT_EQ(answer, 'y') << "the child could not do its part";
-  close(ready[0]);
-}
-
-void Holder::Kill() {
-  if (pid <= 0) return;
-  kill(pid, SIGKILL);
-  waitpid(pid, nullptr, 0);
-  pid = -1;
 }

@@ -51,19 +51,4 @@ class LockTest : public CleanTest {
   std::string path;
 };
 
-// A child that runs `body`, which tells whether it could do its part, and then lives until it is
-// killed.
-class Holder {
- public:
-  explicit Holder(const std::function<bool()>& body);
-  ~Holder() { Kill(); }
-  Holder(const Holder&) = delete;
-  Holder& operator=(const Holder&) = delete;
-
-  void Kill();
-
- private:
-  pid_t pid;
-};
-
 #endif  // KELODRCORE_TESTS_SUPPORT_LOCK_TEST_H_

@@ -26,21 +26,26 @@ bool HideLockDir() {
          DropCapabilities();
 }
 
+// A user namespace with one user, who is called `uid` there, and whatever else `flags` say.
+bool EnterUserNamespace(int flags, uid_t uid, gid_t gid) {
+  const uid_t outerUid = getuid();
+  const gid_t outerGid = getgid();
+  if (unshare(CLONE_NEWUSER | flags) != 0) return false;
+  std::ofstream("/proc/self/setgroups") << "deny";
+  std::ofstream("/proc/self/uid_map") << uid << " " << outerUid << " 1";
+  std::ofstream("/proc/self/gid_map") << gid << " " << outerGid << " 1";
+  return getuid() == uid;
+}
+
 }  // namespace
 
 bool EnterOwnMounts() {
-  const uid_t uid = geteuid();
-  const gid_t gid = getegid();
-  if (uid == 0) {
-    if (unshare(CLONE_NEWNS) != 0) return false;
-  } else {
-    if (unshare(CLONE_NEWUSER | CLONE_NEWNS) != 0) return false;
-    std::ofstream("/proc/self/setgroups") << "deny";
-    std::ofstream("/proc/self/uid_map") << uid << " " << uid << " 1";
-    std::ofstream("/proc/self/gid_map") << gid << " " << gid << " 1";
-  }
-  return mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0;
+  const bool isAllowed = getuid() == 0 ? unshare(CLONE_NEWNS) == 0
+                                       : EnterUserNamespace(CLONE_NEWNS, getuid(), getgid());
+  return isAllowed && mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0;
 }
+
+bool BecomeRoot() { return getuid() == 0 || EnterUserNamespace(0, 0, 0); }
 
 bool CanLock() {
   static const bool can = access(kLockDir, W_OK) == 0 || errno == ENOENT || HideLockDir();

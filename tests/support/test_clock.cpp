@@ -7,6 +7,8 @@
 #include <cstring>
 #include <utility>
 
+#include "support/next.h"
+
 namespace {
 
 std::optional<time_t> fixedTime;
@@ -33,11 +35,6 @@ std::optional<int> AskFor(const void* caller, const Length* length) {
                      calling.dli_fbase == own.dli_fbase;
   if (isOwn) return std::nullopt;
   return Ask(static_cast<useconds_t>(length->seconds * 1000000 + length->nanoseconds / 1000));
-}
-
-template <typename Function>
-Function* Next(const char* call) {
-  return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, call));
 }
 
 }  // namespace

@@ -17,6 +17,8 @@
 #include <map>
 #include <optional>
 
+#include "support/child.h"
+
 namespace Tracer {
 namespace {
 
@@ -51,14 +53,12 @@ class Tree {
 
  private:
   static pid_t Start(const std::function<void()>& body) {
-    fflush(nullptr);
-    const pid_t child = fork();
-    if (child == 0) {
+    const pid_t child = StartChild([&]() -> int {
       ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
       raise(SIGSTOP);
       body();
       _exit(0);
-    }
+    });
     int status = 0;
     EXPECT_EQ(waitpid(child, &status, 0), child);
     EXPECT_EQ(ptrace(PTRACE_SETOPTIONS, child, nullptr, kOptions), 0);

@@ -5,7 +5,6 @@
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -296,10 +295,8 @@ TEST_F(FileTest, ASignalDoesNotCutADescriptorShort) {
   int ends[2];
   ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
 
-  fflush(nullptr);
   const pid_t parent = getpid();
-  const pid_t child = fork();
-  if (child == 0) {
+  const pid_t child = StartChild([&] {
     const auto interrupt = [&] {
       const int handled = *signalsHandled;
       while (!IsAsleep(parent)) sched_yield();
@@ -312,16 +309,13 @@ TEST_F(FileTest, ASignalDoesNotCutADescriptorShort) {
     interrupt();
     written = write(ends[1], "1}", 2) == 2 && written;
     interrupt();
-    _exit(written ? 0 : 1);
-  }
+    return written ? 0 : 1;
+  });
   close(ends[1]);
   Json::Value value;
   EXPECT_TRUE(File::Read(ends[0], value));
   EXPECT_EQ(value, Parse(R"({"a":1})"));
-  int status = -1;
-  while (waitpid(child, &status, 0) < 0 && errno == EINTR) {
-  }
-  EXPECT_EQ(status, 0);
+  EXPECT_EQ(JoinChild(child), 0);
   EXPECT_EQ(*signalsHandled, 4);
   sigaction(SIGUSR1, &before, nullptr);
   munmap(shared, 4096);

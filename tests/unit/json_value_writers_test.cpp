@@ -82,19 +82,16 @@ TEST_F(JsonValueFileTest, TheTemporaryOfALivingWriterIsWaitedFor) {
   WriteText(Path(TemporaryOf("a")), "half");
   const int held = open(Path(TemporaryOf("a")).c_str(), O_RDONLY | O_CLOEXEC);
   ASSERT_EQ(flock(held, LOCK_EX), 0);
-  const pid_t writer = fork();
-  if (writer == 0) {
+  const pid_t writer = StartChild([&] {
     close(held);
-    _exit(toFile(Document("x"), Path("a")) ? 0 : 1);
-  }
+    return toFile(Document("x"), Path("a")) ? 0 : 1;
+  });
   WaitUntilClosed(Path(TemporaryOf("a")), 3);
   EXPECT_EQ(ReadText(Path(TemporaryOf("a"))), "half");
   EXPECT_EQ(NamesIn(dir), Names{TemporaryOf("a")});
   ASSERT_EQ(rename(Path(TemporaryOf("a")).c_str(), Path("a").c_str()), 0);
-  int status = -1;
-  ASSERT_EQ(waitpid(writer, &status, 0), writer);
+  EXPECT_EQ(JoinChild(writer), 0);
   close(held);
-  EXPECT_EQ(status, 0);
   ExpectDocument(Path("a"), Document("x"));
 }
 
@@ -201,17 +198,15 @@ TEST_P(Writers, DoNotDisturbEachOtherAndReadersSeeWholeDocuments) {
   auto* const reads = new (memory) std::atomic<int>(0);
   std::set<pid_t> writers;
   for (int writer = 1; writer <= GetParam(); ++writer) {
-    const pid_t child = fork();
-    if (child == 0) {
+    writers.insert(StartChild([&] {
       prctl(PR_SET_PDEATHSIG, SIGKILL);  // it would wait for ever
       for (int n = 1; n <= kEach; ++n) {
         const int seen = *reads;
-        if (!toFile(Numbered(writer, n), Path("a"))) _exit(1);
+        if (!toFile(Numbered(writer, n), Path("a"))) return 1;
         while (*reads == seen) sched_yield();  // some reads come between two writes
       }
-      _exit(0);
-    }
-    writers.insert(child);
+      return 0;
+    }));
   }
   while (!writers.empty()) {
     Json::Value value;

@@ -314,11 +314,7 @@ TEST_F(ProcAliveTest, IsZeroForWhatIsNoPid) {
 }
 
 TEST_F(ProcAliveTest, TurnsZeroWithTheZombie) {
-  const pid_t child = fork();
-  if (child == 0) {
-    pause();
-    _exit(0);
-  }
+  const pid_t child = StartChild(pause);
   EXPECT_EQ(KLIBCProcAlive(child), 1);
   kill(child, SIGKILL);
   siginfo_t info;
@@ -329,11 +325,7 @@ TEST_F(ProcAliveTest, TurnsZeroWithTheZombie) {
 }
 
 TEST_F(ProcAliveTest, IsOneForAStoppedProcess) {
-  const pid_t child = fork();
-  if (child == 0) {
-    pause();
-    _exit(0);
-  }
+  const pid_t child = StartChild(pause);
   kill(child, SIGSTOP);
   ASSERT_EQ(waitpid(child, nullptr, WUNTRACED), child);
   EXPECT_EQ(KLIBCProcAlive(child), 1);
@@ -409,24 +401,22 @@ TEST_F(ProcStatTest, ADeadProcessIsNotAlive) {
 TEST_F(ProcAliveTest, IsOneWhileAnyThreadRuns) {
   int release[2];
   ASSERT_EQ(pipe(release), 0);
-  const pid_t child = fork();
-  if (child == 0) {
+  const pid_t child = StartChild([&]() -> int {
     close(release[1]);
     std::thread([&] {
       char byte;
       _exit(read(release[0], &byte, 1) == 0 ? 0 : 1);
     }).detach();
     syscall(SYS_exit, 0);  // this thread alone; pthread_exit unwinds into the test runner
-  }
+    return 1;
+  });
   close(release[0]);
   while (ReadText("/proc/" + std::to_string(child) + "/stat").find(") Z ") == std::string::npos) {
     std::this_thread::yield();
   }
   EXPECT_EQ(KLIBCProcAlive(child), 1);
   close(release[1]);
-  int status = -1;
-  ASSERT_EQ(waitpid(child, &status, 0), child);
-  EXPECT_EQ(status, 0);
+  EXPECT_EQ(JoinChild(child), 0);
 }
 
 unsigned int Draw(unsigned int min, unsigned int max) {
