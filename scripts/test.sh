@@ -6,9 +6,9 @@
 # The presets are in CMakePresets.json; "dev" without one. --as, which needs root, runs the tests with fewer rights:
 #   user        as an ordinary user, with a /tmp of its own where this system allows mounts
 #   container   as root with the rights that containers usually give: no mounts, no right to trace others
-# Both leave out the tests of the package, which write to the build tree, and those in which root mounts a root directory
-# of its own to be attacked there; the user's run also leaves out those of changed ids and of root's directories. They
-# list the skipped tests, and fail when more than 40 are skipped.
+# Both leave out the attacks on root, for which root mounts a /tmp of its own, and the tests of the package, which write
+# to the build tree. They end with the names of the tests that were skipped and that were left out, and fail when more
+# than 40 were skipped.
 set -euo pipefail
 source "$(dirname "$0")/common.sh"
 
@@ -22,8 +22,8 @@ while [ $# -gt 0 ]; do
   shift || wrong_usage "--as needs 'user' or 'container'"
 done
 most_skipped=40
-left_out='Package|LockDirectoryTest|[A-Za-z]*AttackTest'
-[ "$as" != user ] || left_out+='|PrivilegeTest|FileDirRootTest'
+need_mounts='^[A-Za-z]*AttackTest\.'
+write_to_build='^Package\.'
 user=(setpriv --reuid=1000 --regid=1000 --clear-groups)
 container=(setpriv --inh-caps=-all --bounding-set="-all,+chown,+dac_override,+fowner,+fsetid,+kill,+setgid,+setuid,\
 +setpcap,+net_bind_service,+net_raw,+sys_chroot,+mknod,+audit_write,+setfcap")
@@ -47,8 +47,19 @@ run_as() {
   "$@" test -r CMakePresets.json -a -x "$build/$preset" || fail "this user cannot read the tree"
   echo "subdirs(\"$build/$preset\")" >"$notes/CTestTestfile.cmake"
   "$@" ctest --test-dir "$notes" --parallel "$(nproc)" --output-on-failure --no-tests=error \
-    --exclude-regex "^($left_out)\." | tee "$notes/output"
+    --exclude-regex "$need_mounts|$write_to_build" | tee "$notes/output"
 }
+
+# list_names WHAT: the names from the standard input, with their number.
+list_names() {
+  local names=()
+  mapfile -t names
+  printf '%s: %d tests %s\n' "$script" ${#names[@]} "$1"
+  printf '  %s\n' "${names[@]}"
+}
+
+# names_of REGEX: the tests that ctest finds by it.
+names_of() { ctest --test-dir "$notes" --show-only --tests-regex "$1" | sed -n 's/^ *Test *#[0-9]*: //p'; }
 
 case $as in
   '') ;;
@@ -77,11 +88,13 @@ if [ "$as" = container ]; then
   run_as "${container[@]}" || status=$?
 elif unshare --mount true 2>/dev/null; then
   export -f with_own_tmp run_as fail
-  export build preset notes script left_out
+  export build preset notes script need_mounts write_to_build
   unshare --mount bash -euo pipefail -c 'with_own_tmp run_as "$@"' bash "${user[@]}" || status=$?
 else
   run_as "${user[@]}" || status=$?
 fi
-skipped=$(grep -c '(Skipped)$' "$notes/output" || true)
-echo "$script: $skipped tests skipped, which are listed above; at most $most_skipped may be"
-((status == 0 && skipped <= most_skipped))
+sed -n 's/^\t *[0-9]* - \(.*\) (Skipped)$/\1/p' "$notes/output" >"$notes/skipped"
+list_names "skipped, at most $most_skipped may be" <"$notes/skipped"
+names_of "$need_mounts" | list_names 'left out because they need mounts of root'
+names_of "$write_to_build" | list_names 'left out because they write to the build tree'
+((status == 0 && $(wc -l <"$notes/skipped") <= most_skipped))

@@ -39,17 +39,17 @@ class LockDirectoryTest : public LockTest {
     ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
     ASSERT_EQ(mkdir(Path("tmp").c_str(), 0755), 0);
     ASSERT_EQ(chmod(Path("tmp").c_str(), 01777), 0);
-    EXPECT_EQ(RunInChild([&] {
-                ASSERT_EQ(chroot(dir.c_str()), 0);
-                ASSERT_EQ(chdir("/"), 0);
-                body();
-              }),
-              0);
+    const bool isAllowed = RunAsRoot([&] {
+      ASSERT_EQ(chroot(dir.c_str()), 0);
+      ASSERT_EQ(chdir("/"), 0);
+      body();
+    });
+    if (!isAllowed) GTEST_SKIP() << "needs root, or a user namespace";
   }
 
   // Runs `body` as root, where `stranger` has planted something before.
   void Attack(const std::function<void()>& stranger, const std::function<void()>& body) const {
-    if (!IsRoot()) GTEST_SKIP() << "needs root, who is attacked";
+    if (!IsRoot()) GTEST_SKIP() << "needs root, and another user who attacks";
     RunWithOwnRoot([&] {
       EXPECT_EQ(RunInChild([&] {
                   BecomeUser(kStranger);
@@ -85,7 +85,6 @@ class LockDirectoryTest : public LockTest {
 };
 
 TEST_F(LockDirectoryTest, IsMadeWithMode0755WhateverTheUmask) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root to change the root directory";
   for (const mode_t mask : {0, 022, 077, 0777}) {
     RunWithOwnRoot([mask] {
       const mode_t before = umask(mask);
@@ -100,7 +99,6 @@ TEST_F(LockDirectoryTest, IsMadeWithMode0755WhateverTheUmask) {
 }
 
 TEST_F(LockDirectoryTest, IsFoundWhereTmpIsALink) {
-  if (!IsRoot()) GTEST_SKIP() << "needs root to change the root directory";
   RunWithOwnRoot([] {
     ASSERT_EQ(rename("/tmp", "/other"), 0);
     ASSERT_EQ(symlink("other", "/tmp"), 0);
@@ -118,13 +116,12 @@ TEST_F(LockDirectoryTest, OfAnotherUserBecomesRoots) {
 }
 
 TEST_F(LockDirectoryTest, ThatOthersMayWriteToIsClosedToThem) {
-  Attack([] {},
-         [] {
-           ASSERT_EQ(mkdir(kTop, 0755), 0);
-           ASSERT_EQ(chmod(kTop, 0777), 0);
-           ExpectLocks("lock");
-           ExpectRootsDirectory(kTop);
-         });
+  RunWithOwnRoot([] {
+    ASSERT_EQ(mkdir(kTop, 0755), 0);
+    ASSERT_EQ(chmod(kTop, 0777), 0);
+    ExpectLocks("lock");
+    ExpectRootsDirectory(kTop);
+  });
 }
 
 TEST_F(LockDirectoryTest, IsPutInThePlaceOfAFileALinkOrAQueue) {
@@ -163,20 +160,19 @@ TEST_F(LockDirectoryTest, HasNoStepThatAStrangerPlanted) {
 }
 
 TEST_F(LockDirectoryTest, OfRootsKeepsRootsLinksAndFilesAndFails) {
-  Attack([] {},
-         [] {
-           ASSERT_EQ(mkdir(kTop, 0755), 0);
-           ASSERT_EQ(symlink("/tmp", (kTop + std::string("/link")).c_str()), 0);
-           FileLock lock("link/lock");
-           EXPECT_FALSE(lock.lock(kExclusive, 0));
-           const std::string parent = kTop + std::string("/link");
-           ExpectLog({Err("file_lock.cpp", "checkLockDir",
-                          "Failed to create lock dir [" + parent + "] in local host"),
-                      Err("file_lock.cpp", "openLockedFile",
-                          "Failed to check lock dir of lock file [" + parent + "/lock]."),
-                      Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + parent + "/lock]")});
-           EXPECT_EQ(ModeOf(parent), mode_t(S_IFLNK | 0777));
-         });
+  RunWithOwnRoot([] {
+    ASSERT_EQ(mkdir(kTop, 0755), 0);
+    ASSERT_EQ(symlink("/tmp", (kTop + std::string("/link")).c_str()), 0);
+    FileLock lock("link/lock");
+    EXPECT_FALSE(lock.lock(kExclusive, 0));
+    const std::string parent = kTop + std::string("/link");
+    ExpectLog({Err("file_lock.cpp", "checkLockDir",
+                   "Failed to create lock dir [" + parent + "] in local host"),
+               Err("file_lock.cpp", "openLockedFile",
+                   "Failed to check lock dir of lock file [" + parent + "/lock]."),
+               Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + parent + "/lock]")});
+    EXPECT_EQ(ModeOf(parent), mode_t(S_IFLNK | 0777));
+  });
 }
 
 TEST_F(LockDirectoryTest, LeavesDirectoriesOutsideAlone) {
@@ -248,18 +244,17 @@ TEST_F(LockDirectoryTest, ALockFileOfAnotherUserIsShared) {
 }
 
 TEST_F(LockDirectoryTest, ALockFileThatIsAQueueOrASocketIsRefusedAtOnce) {
-  Attack([] {},
-         [] {
-           ASSERT_EQ(mkdir(kTop, 0755), 0);
-           const std::string queue = kTop + std::string("/queue");
-           ASSERT_EQ(mkfifo(queue.c_str(), 0666), 0);
-           EXPECT_FALSE(FileLock("queue").lock(kExclusive, 5));
-           ExpectLog(CannotOpen(queue, "Invalid argument"));
-           const std::string socket = kTop + std::string("/socket");
-           MakeSocket(socket);
-           EXPECT_FALSE(FileLock("socket").lock(kExclusive, 5));
-           ExpectLog(CannotOpen(socket, "No such device or address"));
-         });
+  RunWithOwnRoot([] {
+    ASSERT_EQ(mkdir(kTop, 0755), 0);
+    const std::string queue = kTop + std::string("/queue");
+    ASSERT_EQ(mkfifo(queue.c_str(), 0666), 0);
+    EXPECT_FALSE(FileLock("queue").lock(kExclusive, 5));
+    ExpectLog(CannotOpen(queue, "Invalid argument"));
+    const std::string socket = kTop + std::string("/socket");
+    MakeSocket(socket);
+    EXPECT_FALSE(FileLock("socket").lock(kExclusive, 5));
+    ExpectLog(CannotOpen(socket, "No such device or address"));
+  });
 }
 
 }  // namespace

@@ -2,7 +2,6 @@
 
 #include <linux/capability.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -13,6 +12,7 @@
 #include <vector>
 
 #include "support/clean_test.h"
+#include "unit/root_ids/root_ids.h"
 
 namespace {
 
@@ -35,16 +35,6 @@ constexpr Ids kAll = {kUser, kUser, kUser};
 void SetIds(const Ids& uid, const Ids& gid) {
   ASSERT_EQ(setresgid(gid.real, gid.effective, gid.saved), 0);
   ASSERT_EQ(setresuid(uid.real, uid.effective, uid.saved), 0);
-}
-
-// Without it even root can switch only among its real, effective and saved ids.
-void DropCapability(unsigned int capability) {
-  __user_cap_header_struct header = {_LINUX_CAPABILITY_VERSION_3, 0};
-  __user_cap_data_struct data[2] = {};
-  ASSERT_EQ(syscall(SYS_capget, &header, data), 0);
-  data[0].effective &= ~(1U << capability);
-  data[0].permitted &= ~(1U << capability);
-  ASSERT_EQ(syscall(SYS_capset, &header, data), 0);
 }
 
 LogLine Raised(const std::string& word) {
@@ -70,14 +60,6 @@ struct Step {
 
 class PrivilegeTest : public CleanTest {
  protected:
-  void SetUp() override {
-    if (geteuid() != 0) GTEST_SKIP() << "needs root";
-    CleanTest::SetUp();
-  }
-  void TearDown() override {
-    if (geteuid() == 0) CleanTest::TearDown();
-  }
-
   // Runs `test` in a child, whose ids nobody needs afterwards.
   static void Isolated(const std::function<void()>& test) { EXPECT_EQ(RunInChild(test), 0); }
 
@@ -204,7 +186,8 @@ TEST_F(PrivilegeTest, ALeaveThatCannotBecomeRootStopsAtOnce) {
 TEST_F(PrivilegeTest, ALeaveThatCannotRestoreTheGidKeepsTheUid) {
   Isolated([] {
     SetIds(kEffective, kEffective);
-    Expect({{Raised("resgid"), Raised("resuid")}, 0, 0, 0}, [] { DropCapability(CAP_SETGID); },
+    Expect({{Raised("resgid"), Raised("resuid")}, 0, 0, 0},
+           [] { RootIds::DropCapability(CAP_SETGID); },
            {{Raised("resuid"), Refused("resgid", kUser), Failed("LEAVE")}, EPERM, 0, 0});
   });
 }
@@ -212,7 +195,8 @@ TEST_F(PrivilegeTest, ALeaveThatCannotRestoreTheGidKeepsTheUid) {
 TEST_F(PrivilegeTest, ALeaveThatCannotRestoreTheUidHasRestoredTheGid) {
   Isolated([] {
     SetIds(kEffective, kEffective);
-    Expect({{Raised("resgid"), Raised("resuid")}, 0, 0, 0}, [] { DropCapability(CAP_SETUID); },
+    Expect({{Raised("resgid"), Raised("resuid")}, 0, 0, 0},
+           [] { RootIds::DropCapability(CAP_SETUID); },
            {{Raised("resuid"), Refused("resuid", kUser), Failed("LEAVE")}, EPERM, 0, kUser});
   });
 }
