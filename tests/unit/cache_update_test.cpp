@@ -309,7 +309,6 @@ class CachePrivilegeTest : public CacheFixture {
  protected:
   void SetUp() override {
     CacheFixture::SetUp();
-    if (geteuid() != 0) GTEST_SKIP() << "needs root";
     ASSERT_EQ(chmod(dir.c_str(), 0755), 0);
   }
 
@@ -320,6 +319,7 @@ class CachePrivilegeTest : public CacheFixture {
 };
 
 TEST_F(CachePrivilegeTest, FilesAreWrittenAndRemovedAsRootWhateverTheEffectiveIds) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root";
   EXPECT_EQ(
       RunInChild([this] {
         TestCache cache = MakeCache();
@@ -353,22 +353,30 @@ TEST_F(CachePrivilegeTest, FilesAreWrittenAndRemovedAsRootWhateverTheEffectiveId
 }
 
 TEST_F(CachePrivilegeTest, AnUnwritableDirectoryKeepsTheOldDocumentAndNoTemporary) {
+  const bool isRoot = geteuid() == 0;
   ASSERT_TRUE(MakeCache().UpdateWithData("old"));
-  EXPECT_EQ(RunInChild([this] {
-              ASSERT_EQ(setgroups(0, nullptr), 0);
-              ASSERT_EQ(setresgid(kNobody, kNobody, kNobody), 0);
-              ASSERT_EQ(setresuid(kNobody, kNobody, kNobody), 0);
+  ASSERT_EQ(chmod(cacheDir.c_str(), 0555), 0);
+  EXPECT_EQ(RunInChild([this, isRoot] {
+              std::vector<LogLine> lines = {
+                  Debug("cache.cpp", "UpdateWithData",
+                        "Failed to write cache to file [" + path + "] and reach retry limit[-1]")};
+              if (isRoot) {
+                ASSERT_EQ(setgroups(0, nullptr), 0);
+                ASSERT_EQ(setresgid(kNobody, kNobody, kNobody), 0);
+                ASSERT_EQ(setresuid(kNobody, kNobody, kNobody), 0);
+                lines.insert(
+                    lines.begin(),
+                    {Auth(LOG_AUTH | LOG_ERR,
+                          "cache.cpp ERROR: setresgid(-1, 0, -1) [Operation not permitted]"),
+                     Auth(LOG_AUTH | LOG_ERR, "cache.cpp ERROR: ENTERCriticalSection")});
+              }
               const TestCache cache = MakeCache(true, -1);
               EXPECT_FALSE(cache.UpdateWithData("new"));
-              ExpectLog({Auth(LOG_AUTH | LOG_ERR,
-                              "cache.cpp ERROR: setresgid(-1, 0, -1) [Operation not permitted]"),
-                         Auth(LOG_AUTH | LOG_ERR, "cache.cpp ERROR: ENTERCriticalSection"),
-                         Debug("cache.cpp", "UpdateWithData",
-                               "Failed to write cache to file [" + path +
-                                   "] and reach retry limit[-1]")});
+              ExpectLog(lines);
               EXPECT_EQ(cache.GetCachedData(), "old");
             }),
             0);
+  ASSERT_EQ(chmod(cacheDir.c_str(), 0755), 0);
   EXPECT_EQ(MakeCache().Read(), "old");
   EXPECT_EQ(NamesIn(cacheDir), std::vector<std::string>{"c.cached"});
 }

@@ -158,19 +158,18 @@ TEST_F(JsonValueFileTest, APlantedLinkIsTakenAwayOnceItsDirectoryIsFree) {
 }
 
 TEST_F(JsonValueFileTest, AFullDiskLeavesTheOldDocumentAndNothingElse) {
-  const std::string disk = Path("disk");
-  ASSERT_EQ(mkdir(disk.c_str(), 0755), 0);
-  if (mount("tmpfs", disk.c_str(), "tmpfs", 0, "size=64k") != 0) {
+  if (!RunWithOwnMounts([this] {
+        ASSERT_EQ(mount("tmpfs", dir.c_str(), "tmpfs", 0, "size=64k"), 0);
+        EXPECT_TRUE(toFile(Document("old"), Path("a")));
+        ExpectNotWritten(Path(std::string(300, 'n')), ENAMETOOLONG);
+        errno = 0;
+        EXPECT_FALSE(toFile(Document(std::string(200000, 'x')), Path("a")));
+        EXPECT_EQ(errno, ENOSPC);
+        ExpectDocument(Path("a"), Document("old"));
+        EXPECT_EQ(NamesIn(dir), Names{"a"});
+      })) {
     GTEST_SKIP() << "needs the right to mount a file system";
   }
-  EXPECT_TRUE(toFile(Document("old"), disk + "/a"));
-  ExpectNotWritten(disk + "/" + std::string(300, 'n'), ENAMETOOLONG);
-  errno = 0;
-  EXPECT_FALSE(toFile(Document(std::string(200000, 'x')), disk + "/a"));
-  EXPECT_EQ(errno, ENOSPC);
-  ExpectDocument(disk + "/a", Document("old"));
-  EXPECT_EQ(NamesIn(disk), Names{"a"});
-  EXPECT_EQ(umount(disk.c_str()), 0);
 }
 
 // A document that tells whether it is whole.
