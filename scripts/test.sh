@@ -6,8 +6,8 @@
 # The presets are in CMakePresets.json; "dev" without one. --as, which needs root, runs the tests with fewer rights:
 #   user        as an ordinary user, with a /tmp of its own where this system allows mounts
 #   container   as root with the rights that containers usually give: no mounts, no right to trace others
-# Both leave out the attacks on root, for which root mounts a /tmp of its own, and the tests of the package, which write
-# to the build tree. They end with the names of the tests that were skipped and that were left out, and fail when more
+# Both leave out the attacks on root, for which root mounts a /tmp of its own, the tests of the package, which write to
+# the build tree, and what valgrind repeats. They end with the names of the tests that were skipped and that were left out, and fail when more
 # than 40 were skipped.
 set -euo pipefail
 source "$(dirname "$0")/common.sh"
@@ -24,6 +24,7 @@ done
 most_skipped=40
 need_mounts='^[A-Za-z]*AttackTest\.'
 write_to_build='^Package\.'
+repeat='^valgrind\.'
 user=(setpriv --reuid=1000 --regid=1000 --clear-groups)
 container=(setpriv --inh-caps=-all --bounding-set="-all,+chown,+dac_override,+fowner,+fsetid,+kill,+setgid,+setuid,\
 +setpcap,+net_bind_service,+net_raw,+sys_chroot,+mknod,+audit_write,+setfcap")
@@ -47,7 +48,7 @@ run_as() {
   "$@" test -r CMakePresets.json -a -x "$build/$preset" || fail "this user cannot read the tree"
   echo "subdirs(\"$build/$preset\")" >"$notes/CTestTestfile.cmake"
   "$@" ctest --test-dir "$notes" --parallel "$(nproc)" --output-on-failure --no-tests=error \
-    --exclude-regex "$need_mounts|$write_to_build" | tee "$notes/output"
+    --exclude-regex "$need_mounts|$write_to_build|$repeat" | tee "$notes/output"
 }
 
 # list_names WHAT: the names from the standard input, with their number.
@@ -72,9 +73,10 @@ if [ -z "$as" ]; then
   options=()
   case $preset in
     tsan) options=(--tests-regex '^ThreadsTest') ;;
+    asan) options=(--label-exclude '^kill$' --exclude-regex "$write_to_build") ;;
     i386-asan)
       export ASAN_OPTIONS=quarantine_size_mb=16
-      options=(--label-exclude '^kill$')
+      options=(--label-regex '^(unit|process|fault|attack)$')
       ;;
   esac
   exec ctest --test-dir "$build/$preset" --output-on-failure --no-tests=error \
@@ -88,7 +90,7 @@ if [ "$as" = container ]; then
   run_as "${container[@]}" || status=$?
 elif unshare --mount true 2>/dev/null; then
   export -f with_own_tmp run_as fail
-  export build preset notes script need_mounts write_to_build
+  export build preset notes script need_mounts write_to_build repeat
   unshare --mount bash -euo pipefail -c 'with_own_tmp run_as "$@"' bash "${user[@]}" || status=$?
 else
   run_as "${user[@]}" || status=$?
@@ -97,4 +99,5 @@ sed -n 's/^\t *[0-9]* - \(.*\) (Skipped)$/\1/p' "$notes/output" >"$notes/skipped
 list_names "skipped, at most $most_skipped may be" <"$notes/skipped"
 names_of "$need_mounts" | list_names 'left out because they need mounts of root'
 names_of "$write_to_build" | list_names 'left out because they write to the build tree'
+names_of "$repeat" | list_names 'left out because they repeat a program for valgrind alone'
 ((status == 0 && $(wc -l <"$notes/skipped") <= most_skipped))

@@ -131,14 +131,14 @@ TEST_F(KilledUpdateTest, MayBeADetachedOneOrItsCaller) {
 
 TEST_F(KilledUpdateTest, MayBeFollowedByAnotherKilledUpdate) {
   const int pairs =
-      SweepRefreshes({7, 5}, {[this] { Refresh("new"); }, [this] { Refresh("newer"); }});
+      SweepRefreshes({15, 5}, {[this] { Refresh("new"); }, [this] { Refresh("newer"); }});
   EXPECT_GT(pairs, 50);
   RecordProperty("kills", pairs);
 }
 
 TEST_F(KilledUpdateTest, MayBeADetachedOneAfterAnother) {
   const int pairs = SweepRefreshes(
-      {11, 9}, {[this] { Refresh("new", false); }, [this] { Refresh("newer", false); }, 3});
+      {23, 9}, {[this] { Refresh("new", false); }, [this] { Refresh("newer", false); }, 3});
   EXPECT_GT(pairs, 50);
   RecordProperty("kills", pairs);
 }
