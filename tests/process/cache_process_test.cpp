@@ -19,6 +19,7 @@
 #include <thread>
 
 #include "kelodrcore/file_lock.h"
+#include "kelodrcore/json_value.h"
 #include "support/lock_test.h"
 #include "support/process.h"
 #include "support/test_clock.h"
@@ -26,6 +27,7 @@
 namespace {
 
 using KeloDRCore::FileLock;
+namespace JsonValue = KeloDRCore::JsonValue;
 
 // --- The claim
 
@@ -636,6 +638,8 @@ TEST_F(CacheProcessTest, AFailedForkFailsTheUpdate) {
   constexpr int kDone = 7;  // a status that only the end of the child's body gives
   const pid_t child = StartChild([&] {
     const TestCache cache = MakeCache(false);
+    // A sanitizer needs descriptors when it meets JsonCpp's reader and writer for the first time.
+    EXPECT_EQ(JsonValue::toString(cache.GetCachedData()), "\"old\"");
     const std::set<int> open = OpenDescriptors();
     rlim_t limit = 0;
     // Two free descriptors: enough for the lock and the pid file, too few to fork with.
