@@ -22,6 +22,7 @@
 #include "kelodrcore/file_lock.h"
 #include "kelodrcore/sqlite_db.h"
 #include "support/mounts.h"
+#include "support/process.h"
 #include "support/test_cache.h"
 
 namespace {
@@ -51,6 +52,7 @@ class LogCrowdTest : public testing::Test {
     ASSERT_NE(mkdtemp(pattern.data()), nullptr);
     dir = pattern;
     ASSERT_EQ(dlsym(RTLD_DEFAULT, "syslog"), dlsym(RTLD_NEXT, "syslog")) << "not the real one";
+    if (!kMayForkBesideThreads) GTEST_SKIP() << "AddressSanitizer does not survive such a fork";
     if (!CanLock()) GTEST_SKIP() << "the lock directory is another user's";
     ASSERT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 1), 0);
     openlog("kelodrcore-test", 0, LOG_LOCAL7);

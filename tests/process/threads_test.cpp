@@ -21,6 +21,7 @@
 #include "kelodrcore/sqlite_db.h"
 #include "kelodrcore/utils.h"
 #include "support/clean_test.h"
+#include "support/process.h"
 
 namespace {
 
@@ -208,6 +209,7 @@ TEST_F(ThreadsTest, MayUseEverythingAtOnce) {
 
 // A program with threads may fork, and its child has none of them to wait for.
 TEST_F(ThreadsTest, AChildThatIsForkedBesideThreadsOpensItsLocks) {
+  if (!kMayForkBesideThreads) GTEST_SKIP() << "AddressSanitizer does not survive such a fork";
   constexpr int kChildren = 50;
   constexpr unsigned int kLongest = 20;  // seconds, where a child needs milliseconds
   std::atomic<bool> done{false};

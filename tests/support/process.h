@@ -13,6 +13,13 @@
 
 inline bool IsRoot() { return geteuid() == 0; }
 
+// A child that is forked beside threads may find the allocator of AddressSanitizer locked for ever.
+#ifdef __SANITIZE_ADDRESS__
+inline constexpr bool kMayForkBesideThreads = false;
+#else
+inline constexpr bool kMayForkBesideThreads = true;
+#endif
+
 // An id that no other process of this machine runs under.
 inline uid_t PrivateUid() { return 1000000 + static_cast<uid_t>(getpid()); }
 
