@@ -46,15 +46,18 @@ bool AddNames(const std::string& file, std::set<std::string>& names) {
   return true;
 }
 
+bool SetAttribute(const std::string& file, const std::string& name, const Attribute& value) {
+  return Retry([&] {
+           return value ? setxattr(file.c_str(), name.c_str(), value->data(), value->size(), 0)
+                        : removexattr(file.c_str(), name.c_str());
+         }) == 0;
+}
+
 bool CopyAttribute(const std::string& from, const std::string& to, const std::string& name) {
   Attribute wanted;
   Attribute found;
   if (!GetAttribute(from, name, wanted) || !GetAttribute(to, name, found)) return false;
-  if (wanted == found) return true;
-  return Retry([&] {
-           return wanted ? setxattr(to.c_str(), name.c_str(), wanted->data(), wanted->size(), 0)
-                         : removexattr(to.c_str(), name.c_str());
-         }) == 0;
+  return wanted == found || SetAttribute(to, name, wanted);
 }
 
 // An attribute that only the new file has was given to it by its directory.
