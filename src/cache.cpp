@@ -13,6 +13,7 @@
 
 #include "kelodrcore/cache.h"
 
+#include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <syslog.h>
@@ -24,9 +25,7 @@
 #include <csignal>
 #include <cstring>
 #include <ctime>
-#include <mutex>
 #include <new>
-#include <thread>
 #include <utility>
 
 #include "document_file.h"
@@ -37,9 +36,8 @@
 #include "kelodrcore/utils.h"
 #include "lock_fork.h"
 #include "log.h"
+#include "own_claim.h"
 #include "posix/directory_walk.h"
-#include "posix/file_io.h"
-#include "posix/fork_mutex.h"
 #include "posix/trust.h"
 #include "privilege.h"
 
@@ -95,24 +93,6 @@ time_t ModificationTime(const std::string& path) {
 // The modification time as it is remembered: its low 32 bits tell a change as well.
 int ModificationStamp(const std::string& path) { return static_cast<int>(ModificationTime(path)); }
 
-// A cache file by whatever path it is reached.
-struct Identity {
-  explicit Identity(const std::string& path) : name(path.substr(path.rfind('/') + 1)) {
-    struct stat found = {};
-    if (Posix::StatAt(AT_FDCWD, Posix::DirectoryOf(path), 0, found)) {
-      device = found.st_dev;
-      inode = found.st_ino;
-    }
-  }
-  bool operator==(const Identity& other) const {
-    return device == other.device && inode == other.inode && name == other.name;
-  }
-
-  dev_t device = 0;
-  ino_t inode = 0;
-  std::string name;
-};
-
 // The claim of an update, which its destructor releases.
 class Claim {
  public:
@@ -124,30 +104,16 @@ class Claim {
   // Claims the update; false when somebody else is updating, or when that cannot be done.
   bool SetUpdating();
 
-  // Whether this process is updating the cache, in any thread or in this one.
-  enum class By { kAnyThread, kThisThread };
-  static bool IsMadeBy(By who, const std::string& path);
-
  private:
   void UnsetUpdating();
   bool Lock();
-  void Enlist();
-  void Delist();
-
-  static Claim* first;  // of the claims of this process, under Posix::forkMutex
 
   // What the release needs is made before the claim: it must not fail for want of memory.
   const std::string& path;
   const std::string pidFile;
-  const Identity identity;
-  const pid_t pid = getpid();
-  const std::thread::id thread = std::this_thread::get_id();
   CacheLock lock;
-  bool isHeld = false;
-  Claim* next = nullptr;
+  OwnClaim own;
 };
-
-Claim* Claim::first = nullptr;
 
 std::string PidFile(const std::string& path) { return path + ".pid"; }
 
@@ -182,7 +148,7 @@ int ClaimantOf(const std::string& pidFile) {
 bool IsClaimed(const std::string& path) {
   const std::string pidFile = PidFile(path);
   const int pid = ClaimantOf(pidFile);
-  if (pid != getpid() || Claim::IsMadeBy(Claim::By::kAnyThread, path)) return pid > 0;
+  if (pid != getpid() || OwnClaim::IsMade(OwnClaim::By::kAnyThread, path)) return pid > 0;
   KELODR_PRIVILEGED();
   RemovePidFile(pidFile);
   return false;
@@ -204,12 +170,10 @@ Updater LookForUpdater(const std::string& path) {
 }
 
 Claim::Claim(const std::string& cachePath)
-    : path(cachePath), pidFile(PidFile(path)), identity(path), lock(path) {}
+    : path(cachePath), pidFile(PidFile(path)), lock(path), own(path) {}
 
 Claim::~Claim() {
-  if (!isHeld) return;
-  UnsetUpdating();
-  Delist();
+  if (own.IsListed()) UnsetUpdating();
 }
 
 bool Claim::SetUpdating() {
@@ -228,7 +192,7 @@ bool Claim::SetUpdating() {
     KELODR_LOG(DEBUG, __func__, "Failed to set cache [%s] updating", path.c_str());
     return false;
   }
-  Enlist();
+  own.Enlist();
   KELODR_LOG(DEBUG, __func__, "---> Start to update cache [%s]", path.c_str());
   return true;
 }
@@ -266,30 +230,6 @@ void Claim::UnsetUpdating() {
   KELODR_LOG(DEBUG, __func__, "<--- Finish to update cache [%s]", path.c_str());
 }
 
-void Claim::Enlist() {
-  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
-  next = std::exchange(first, this);
-  isHeld = true;
-}
-
-void Claim::Delist() {
-  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
-  Claim** link = &first;
-  while (*link != this) link = &(*link)->next;
-  *link = next;
-}
-
-bool Claim::IsMadeBy(By who, const std::string& path) {
-  const Identity identity(path);
-  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
-  for (const Claim* claim = first; claim != nullptr; claim = claim->next) {
-    // Claims of a process that forked this one are not its own.
-    if (claim->pid != getpid() || !(claim->identity == identity)) continue;
-    if (who == By::kAnyThread || claim->thread == std::this_thread::get_id()) return true;
-  }
-  return false;
-}
-
 // For a forked child. If another thread was inside syslog at the fork, the locks of the log and of
 // the time zone are taken for ever here: then SIGALRM ends the child, before it claims anything.
 void ShowThatLogWorks() {
@@ -311,11 +251,6 @@ void ShowThatLogWorks() {
   alarm(0);
   pthread_sigmask(SIG_SETMASK, &mask, nullptr);
   sigaction(SIGALRM, &handler, nullptr);
-}
-
-bool WriteFile(const Json::Value& document, const std::string& path) {
-  KELODR_PRIVILEGED();
-  return ReplaceDocument(document, path, Whose::kBelieved);
 }
 
 // Runs `step` until it succeeds, at most `limit` + 2 times (but once at least), with a sleep of
@@ -397,7 +332,7 @@ bool Cache::Load() const {
 bool Cache::Update() const {
   const bool required = IsUpdatedDataRequired();
   // A fetch reads its own cache.
-  if (Claim::IsMadeBy(Claim::By::kThisThread, path)) return true;
+  if (OwnClaim::IsMade(OwnClaim::By::kThisThread, path)) return true;
   switch (LookForUpdater(path)) {
     case Updater::kNone:
       return required ? UpdateUnderClaim() : UpdateInBackground();
@@ -466,7 +401,10 @@ bool Cache::UpdateWithData(const Json::Value& data, long long begin, long long f
     return false;
   }
   Json::Value document = MakeDocument(data, begin, finish);
-  const auto write = [this, &document] { return WriteFile(document, path); };
+  const auto write = [this, &document] {
+    KELODR_PRIVILEGED();
+    return ReplaceDocument(document, path, Whose::kBelieved);
+  };
   if (!TryRepeatedly(retryLimit, 300, 1000, write)) {
     KELODR_LOG(DEBUG, __func__, "Failed to write cache to file [%s] and reach retry limit[%d]",
                path.c_str(), retryLimit);

@@ -13,6 +13,7 @@
 #include "log.h"
 #include "sqlite_attempt.h"
 #include "sqlite_bulk.h"
+#include "sqlite_query.h"
 #include "value_access.h"
 
 namespace KeloDRCore {
@@ -32,21 +33,6 @@ auto ThrowOnlyBadAlloc(const Action& action) {
   }
 }
 
-// SQLite answers null for a name only when it has no memory for it.
-const char* ColumnName(sqlite3_stmt* stmt, int column) {
-  const char* const name = sqlite3_column_name(stmt, column);
-  if (name == nullptr) throw std::bad_alloc();
-  return name;
-}
-
-// A null text is an empty one, but for the one that SQLite has no memory for.
-const char* ColumnText(sqlite3_stmt* stmt, int column) {
-  const auto* const text = reinterpret_cast<const char*>(sqlite3_column_text(stmt, column));
-  if (text != nullptr) return text;
-  if (sqlite3_errcode(sqlite3_db_handle(stmt)) == SQLITE_NOMEM) throw std::bad_alloc();
-  return "";
-}
-
 template <typename Payload>
 void AddField(SqliteValueList& record, std::string name, const Payload& payload) {
   if (name.empty()) {
@@ -56,16 +42,16 @@ void AddField(SqliteValueList& record, std::string name, const Payload& payload)
   }
 }
 
-SqliteValueList ParseRecord(sqlite3_stmt* stmt) {
+SqliteValueList ParseRecord(const Query& query) {
   SqliteValueList record;
-  const int columns = sqlite3_column_count(stmt);
+  const int columns = query.ColumnCount();
   for (int column = 0; column < columns; ++column) {
-    const char* const name = ColumnName(stmt, column);
-    const int type = sqlite3_column_type(stmt, column);
+    const char* const name = query.Name(column);
+    const int type = query.Type(column);
     if (type == SQLITE_INTEGER) {
-      AddField(record, name, static_cast<long long>(sqlite3_column_int64(stmt, column)));
+      AddField(record, name, query.Integer(column));
     } else if (type == SQLITE_TEXT) {
-      AddField(record, name, ColumnText(stmt, column));
+      AddField(record, name, query.Text(column));
     } else if (type == SQLITE_NULL) {
       KELODR_LOG(WARN, __func__, "field [%s] has null value", name);
     } else {
@@ -75,32 +61,9 @@ SqliteValueList ParseRecord(sqlite3_stmt* stmt) {
   return record;
 }
 
-// One attempt of a query.
-class Query {
- public:
-  Query(sqlite3* db, const std::string& sql)
-      : code(sqlite3_prepare_v2(db, sql.c_str(), -1, &stmt, nullptr)) {}
-  Query(const Query&) = delete;
-  Query& operator=(const Query&) = delete;
-  ~Query() { sqlite3_finalize(stmt); }
-
-  // True when there is one more row.
-  bool Next() {
-    if (code == SQLITE_OK || code == SQLITE_ROW) code = sqlite3_step(stmt);
-    return code == SQLITE_ROW;
-  }
-
-  SqliteValueList Row() const {
-    return ThrowOnlyBadAlloc([this] { return ParseRecord(stmt); });
-  }
-
-  // SQLite's result code of the last step.
-  int Code() const { return code; }
-
- private:
-  sqlite3_stmt* stmt = nullptr;
-  int code;
-};
+SqliteValueList Row(const Query& query) {
+  return ThrowOnlyBadAlloc([&] { return ParseRecord(query); });
+}
 
 // What Exec says when its attempts end. Each of the two queries shares one of these lines and has
 // one of its own: they cross their wordings, as log readers know them.
@@ -222,7 +185,7 @@ bool SqliteDB::DoSelectSqliteRecord(const std::string& sql, SqliteValueList& rec
   if (RefuseNul(sql, __func__)) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   Query query(dbHandle, sql);
-  if (query.Next()) record = query.Row();
+  if (query.Next()) record = Row(query);
   return SetQueryEnd(query.Code());
 }
 
@@ -231,7 +194,7 @@ bool SqliteDB::DoSelectSqliteRecords(const std::string& sql,
   if (RefuseNul(sql, __func__)) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   Query query(dbHandle, sql);
-  while (query.Next()) records.push_back(query.Row());
+  while (query.Next()) records.push_back(Row(query));
   return SetQueryEnd(query.Code());
 }
 
@@ -240,7 +203,7 @@ bool SqliteDB::TrySelectEach(const std::string& sql, const RecordTaker& take, bo
   Query query(dbHandle, sql);
   while (query.Next()) {
     isHandedOver = true;
-    if (!take(query.Row())) break;
+    if (!take(Row(query))) break;
   }
   return SetQueryEnd(query.Code());
 }
