@@ -34,34 +34,34 @@ auto ThrowOnlyBadAlloc(const Action& action) {
 }
 
 template <typename Payload>
-void AddField(SqliteValueList& record, std::string name, const Payload& payload) {
+void AddField(SqliteValueList& record, const std::string& name, const Payload& payload) {
   if (name.empty()) {
     record.AddValue(name, payload);  // refuses and logs
   } else {
-    ValueAccess::SetField(record, std::move(name), payload);
+    ValueAccess::SetField(record, name, payload);
   }
 }
 
-SqliteValueList ParseRecord(const Query& query) {
+SqliteValueList ParseRecord(Query& query) {
   SqliteValueList record;
-  const int columns = query.ColumnCount();
-  for (int column = 0; column < columns; ++column) {
-    const char* const name = query.Name(column);
+  int column = 0;
+  for (const std::string& name : query.Names()) {
     const int type = query.Type(column);
     if (type == SQLITE_INTEGER) {
       AddField(record, name, query.Integer(column));
     } else if (type == SQLITE_TEXT) {
       AddField(record, name, query.Text(column));
     } else if (type == SQLITE_NULL) {
-      KELODR_LOG(WARN, __func__, "field [%s] has null value", name);
+      KELODR_LOG(WARN, __func__, "field [%s] has null value", name.c_str());
     } else {
-      KELODR_LOG(WARN, __func__, "Not supported type [%d] with field [%s]", type, name);
+      KELODR_LOG(WARN, __func__, "Not supported type [%d] with field [%s]", type, name.c_str());
     }
+    ++column;
   }
   return record;
 }
 
-SqliteValueList Row(const Query& query) {
+SqliteValueList Row(Query& query) {
   return ThrowOnlyBadAlloc([&] { return ParseRecord(query); });
 }
 

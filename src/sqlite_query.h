@@ -7,6 +7,7 @@
 
 #include <new>
 #include <string>
+#include <vector>
 
 namespace KeloDRCore {
 
@@ -28,16 +29,15 @@ class Query {
   // SQLite's result code of the last step.
   int Code() const { return code; }
 
-  int ColumnCount() const { return sqlite3_column_count(stmt); }
+  // The names of the columns of a row. They are asked for once: SQLite locks the connection for
+  // each. Before the first row they may still change, because the first step may prepare anew.
+  const std::vector<std::string>& Names() {
+    if (names.empty()) ReadNames();
+    return names;
+  }
+
   int Type(int column) const { return sqlite3_column_type(stmt, column); }
   long long Integer(int column) const { return sqlite3_column_int64(stmt, column); }
-
-  // SQLite answers null for a name only when it has no memory for it.
-  const char* Name(int column) const {
-    const char* const name = sqlite3_column_name(stmt, column);
-    if (name == nullptr) throw std::bad_alloc();
-    return name;
-  }
 
   // A null text is an empty one, but for the one that SQLite has no memory for.
   const char* Text(int column) const {
@@ -48,8 +48,18 @@ class Query {
   }
 
  private:
+  void ReadNames() {
+    const int columns = sqlite3_column_count(stmt);
+    for (int column = 0; column < columns; ++column) {
+      const char* const name = sqlite3_column_name(stmt, column);
+      if (name == nullptr) throw std::bad_alloc();  // the only reason that SQLite has for it
+      names.emplace_back(name);
+    }
+  }
+
   sqlite3_stmt* stmt = nullptr;
   int code;
+  std::vector<std::string> names;
 };
 
 }  // namespace KeloDRCore

@@ -131,8 +131,7 @@ bool SqliteValue::Read(T& out) const {
 
 SqliteValueList::SqliteValueList() = default;
 SqliteValueList::SqliteValueList(const SqliteValueList& other) = default;
-SqliteValueList::SqliteValueList(SqliteValueList&& other) noexcept
-    : values(std::exchange(other.values, {})) {}
+SqliteValueList::SqliteValueList(SqliteValueList&& other) noexcept { values.swap(other.values); }
 SqliteValueList::~SqliteValueList() = default;
 
 SqliteValueList& SqliteValueList::operator=(const SqliteValueList& other) {

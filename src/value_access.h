@@ -4,7 +4,6 @@
 #define KELODRCORE_SRC_VALUE_ACCESS_H_
 
 #include <string>
-#include <utility>
 
 #include "kelodrcore/sqlite_value.h"
 
@@ -21,9 +20,9 @@ class ValueAccess {
   // What `list.AddValue(field, SqliteValue(payload))` does, without a value in between. The name
   // must not be empty, and the value must be valid.
   template <typename T>
-  static void SetField(SqliteValueList& list, std::string field, const T& payload) {
+  static void SetField(SqliteValueList& list, const std::string& field, const T& payload) {
     // Fields mostly come in order: look at the end first.
-    list.values.insert_or_assign(list.values.end(), std::move(field), payload);
+    list.values.insert_or_assign(list.values.end(), field, payload);
   }
 };
 
