@@ -2,9 +2,13 @@
 # The long storms, and 200 cuts of a disk's power: five minutes in all. Each prints a line of
 # figures; the first that finds anything wrong ends it.
 #
-# usage: scripts/storm.sh [SEED]       1 without one
+# usage: scripts/storm.sh [--soak] [SEED]       1 without one
+#
+# --soak runs the soak alone, for an hour and with pauses that leave most of the machine to others.
 set -euo pipefail
 source "$(dirname "$0")/common.sh"
+soak=''
+if [[ ${1:-} == --soak ]]; then soak=1 && shift; fi
 takes_at_most 1 "$@"
 seed=${1:-1}
 takes_number SEED "$seed"
@@ -14,7 +18,11 @@ scripts/build.sh storm
 if [[ -z ${TMPDIR:-} && -w /dev/shm ]]; then export TMPDIR=/dev/shm; fi
 storm() { nice "$build/storm/tests/storm" "$@" "seed=$seed"; }
 
-storm operations processes=16 seconds=60
+if [[ -n $soak ]]; then
+  storm soak processes=16 seconds=3600 pause=40
+  exit
+fi
+storm soak processes=16 seconds=60
 storm holders processes=8 count=10000
 storm expiries processes=50 count=200
 storm readers processes=5 count=5000000

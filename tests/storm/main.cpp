@@ -1,10 +1,11 @@
-// usage: storm NAME [processes=N] [seconds=N] [count=N] [seed=N]
+// usage: storm NAME [processes=N] [seconds=N] [count=N] [seed=N] [pause=N]
 //
-//   operations   processes do random things to one database, one cache, one document and one lock
-//                directory for some seconds, and are killed at random
-//   holders      each process takes one lock `count` times, and one holder in ten is killed
-//   expiries     processes read a cache each time that it expires, `count` times: one fetch each
-//   readers      one process writes a document, the others read it, `count` times in all
+//   soak       processes do random things to one database, one cache, five documents and four locks
+//              for some seconds, with at most `pause` milliseconds between two; they are killed,
+//              stopped and sent signals at random, and the disk fills up
+//   holders    each process takes one lock `count` times, and one holder in ten is killed
+//   expiries   processes read a cache each time that it expires, `count` times: one fetch each
+//   readers    one process writes a document, the others read it, `count` times in all
 //
 // Prints one line of figures; the exit status is 0 when everything held. The seed decides what each
 // process does, though not when the kernel lets it.
@@ -29,16 +30,17 @@ struct Kind {
 };
 
 const std::map<std::string, Kind> kKinds = {
-    {"operations", {RandomOperations, {"", 8, 3, 0, 1}}},
     {"holders", {KilledHolders, {"", 8, 0, 100, 1}}},
     {"expiries", {Expiries, {"", 50, 0, 4, 1}}},
     {"readers", {Readers, {"", 5, 0, 50000, 1}}},
+    {"soak", {Soak, {"", 8, 3, 0, 1}}},
 };
 
 const std::map<std::string, int Settings::*> kNumbers = {{"processes", &Settings::processes},
                                                          {"seconds", &Settings::seconds},
                                                          {"count", &Settings::count},
-                                                         {"seed", &Settings::seed}};
+                                                         {"seed", &Settings::seed},
+                                                         {"pause", &Settings::pause}};
 
 // Takes "NAME=NUMBER"; false for any other text.
 bool Set(Settings& settings, const std::string& argument) {
@@ -78,7 +80,7 @@ int main(int argc, char** argv) {
   Kind kind = valid ? found->second : Kind{};
   for (int i = 2; i < argc; ++i) valid = valid && Set(kind.settings, argv[i]);
   if (!valid) {
-    fprintf(stderr, "usage: storm operations|holders|expiries|readers [NAME=NUMBER...]\n");
+    fprintf(stderr, "usage: storm holders|expiries|readers|soak [NAME=NUMBER...]\n");
     return 2;
   }
   if (access("/tmp/.kelodr_lock", W_OK) != 0 && errno != ENOENT) {

@@ -7,6 +7,7 @@
 #include <sys/mman.h>
 #include <sys/types.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <functional>
 #include <new>
@@ -20,10 +21,11 @@ struct Settings {
   int seconds;
   int count;
   int seed;
+  int pause = 0;
 };
 
 // Each returns the figures for its report; what they run is told in main.cpp.
-std::string RandomOperations(const Settings& settings);
+std::string Soak(const Settings& settings);
 std::string KilledHolders(const Settings& settings);
 std::string Expiries(const Settings& settings);
 std::string Readers(const Settings& settings);
@@ -67,6 +69,13 @@ class Workers {
 
   void Kill(int worker);
 
+  pid_t Pid(int worker) const { return pids[static_cast<size_t>(worker)]; }
+
+  bool Has(pid_t pid) const { return std::count(pids.begin(), pids.end(), pid) > 0; }
+
+  // Waits for those that have ended, those that others left to this process, too.
+  void Reap();
+
   // Waits until each has ended by itself, and whatever they left to nobody, too.
   void Join(bool isKillingOver);
 
@@ -74,6 +83,7 @@ class Workers {
 
  private:
   void Start(size_t worker);
+  void TakeAll(int options, bool restart);
   void Take(pid_t pid, int status, bool restart);
 
   Body body;
