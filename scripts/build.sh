@@ -1,12 +1,11 @@
 #!/bin/bash
 # Installs what a preset needs, configures it and builds it in build/PRESET.
 #
-# usage: scripts/build.sh [PRESET]      the presets are in CMakePresets.json; "dev" without one
+# usage: scripts/build.sh [PRESET [TARGET...]]    the presets are in CMakePresets.json; "dev" without one
 #
 # KELODR_BUILD_DIR in the environment is used in place of build/, by all scripts.
 set -euo pipefail
 source "$(dirname "$0")/common.sh"
-takes_at_most 1 "$@"
 preset=${1:-dev}
 presets=$(sed -n '/"buildPresets"/,/]/s/.*{"name": "\([^"]*\)".*/\1/p' CMakePresets.json)
 grep --quiet --line-regexp --fixed-strings -e "$preset" <<<"$presets" ||
@@ -14,15 +13,16 @@ grep --quiet --line-regexp --fixed-strings -e "$preset" <<<"$presets" ||
 
 groups=(build test examples)
 options=()
-targets=()
+targets=("${@:2}")
 case $preset in
   release | release-i386) groups=(build examples) ;;
   package*) groups=(build examples package) ;;
   lint) groups=(build examples lint) ;;
   bench | fuzz) groups=(build "$preset") ;;
   system-platform) groups=(build) options=(-D "CMAKE_LIBRARY_PATH=$build/dev/platform") ;;
-  storm) groups=(build test) targets=(--target storm power) ;;
-  tsan) targets=(--target threads_test) ;;
+  storm) groups=(build test) targets=(storm power) ;;
+  tsan) targets=(threads_test) ;;
+  asan | i386-asan) groups+=(fuzz) ;;
   coverage) groups+=(coverage) ;;
 esac
 if [[ $preset == *i386* ]]; then
@@ -32,4 +32,4 @@ fi
 scripts/setup.sh "${groups[@]}"
 if [[ $preset == *i386* ]]; then scripts/setup-i386.sh; fi
 cmake --preset "$preset" -B "$build/$preset" "${options[@]}"
-cmake --build "$build/$preset" "${targets[@]}"
+cmake --build "$build/$preset" ${targets:+--target "${targets[@]}"}

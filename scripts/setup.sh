@@ -13,7 +13,7 @@
 #   i386      the 32-bit compiler runtime (scripts/setup-i386.sh installs it, too)
 #   docs      the API documentation's generator
 #   bench     the benchmark library, the libraries it compares with, the plotter
-#   fuzz      the fuzzing compiler
+#   fuzz      clang and its run-time libraries, for the fuzz targets and the sanitizers
 #   coverage  the coverage report
 #   systems   what makes the systems of scripts/test-on.sh
 set -euo pipefail

@@ -85,7 +85,7 @@ class LockDirectoryTest : public LockTest {
 };
 
 TEST_F(LockDirectoryTest, IsMadeWithMode0755WhateverTheUmask) {
-  for (const mode_t mask : {0, 022, 077, 0777}) {
+  for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
     RunWithOwnRoot([mask] {
       const mode_t before = umask(mask);
       FileLock lock("a/b/c");

@@ -48,11 +48,11 @@ void Log(const char* format, ...) {
 class LogCrowdTest : public testing::Test {
  protected:
   void SetUp() override {
+    if (!kMayForkBesideThreads) GTEST_SKIP() << "AddressSanitizer does not survive such a fork";
     std::string pattern = std::filesystem::temp_directory_path() / "kelodrcore-test-XXXXXX";
     ASSERT_NE(mkdtemp(pattern.data()), nullptr);
     dir = pattern;
     ASSERT_EQ(dlsym(RTLD_DEFAULT, "syslog"), dlsym(RTLD_NEXT, "syslog")) << "not the real one";
-    if (!kMayForkBesideThreads) GTEST_SKIP() << "AddressSanitizer does not survive such a fork";
     if (!CanLock()) GTEST_SKIP() << "the lock directory is another user's";
     ASSERT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 1), 0);
     openlog("kelodrcore-test", 0, LOG_LOCAL7);

@@ -103,7 +103,7 @@ TEST_F(JsonValueAccessTest, AStrangersLinkElsewhereIsFollowed) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to give links away";
   ASSERT_EQ(symlink("a", Path("link").c_str()), 0);
   ASSERT_EQ(lchown(Path("link").c_str(), kOther, kOther), 0);
-  for (const mode_t mode : {0755, 0777, 01755}) {
+  for (const mode_t mode : {0755U, 0777U, 01755U}) {
     ASSERT_EQ(chmod(dir.c_str(), mode), 0);
     EXPECT_TRUE(toFile(Document("x"), Path("link"))) << std::oct << mode;
   }

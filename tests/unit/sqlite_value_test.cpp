@@ -374,7 +374,7 @@ TEST_F(SqliteValueTest, AnyTextIsRenderedAsTheRegexRendersItAndReadBackBySqlite)
 }
 
 TEST_F(SqliteValueTest, OneOrTwoQuotesAreDoubledWhereverTheyStand) {
-  for (const size_t length : {1, 7, 8, 9, 15, 16, 17, 24, 63, 64, 65, 200}) {
+  for (const size_t length : {1U, 7U, 8U, 9U, 15U, 16U, 17U, 24U, 63U, 64U, 65U, 200U}) {
     const std::string text(length, 'x');
     for (size_t first = 0; first < length; ++first) {
       for (size_t second = first; second < length; ++second) {

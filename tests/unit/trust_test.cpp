@@ -54,7 +54,8 @@ TEST_F(TrustTest, RootAndTheEffectiveUserAreBelieved) {
 }
 
 TEST_F(TrustTest, OnlyARegularFileIsBelieved) {
-  for (const mode_t type : {S_IFDIR, S_IFLNK, S_IFIFO, S_IFSOCK, S_IFCHR, S_IFBLK}) {
+  for (const mode_t type :
+       std::vector<mode_t>{S_IFDIR, S_IFLNK, S_IFIFO, S_IFSOCK, S_IFCHR, S_IFBLK}) {
     struct stat file = FileOf(0);
     file.st_mode = type | 0644;
     EXPECT_FALSE(IsBelieved(file, Path("file"))) << std::oct << type;
@@ -64,12 +65,12 @@ TEST_F(TrustTest, OnlyARegularFileIsBelieved) {
 TEST_F(TrustTest, TheOwnerOfTheDirectoryIsBelievedUnlessAllMayWriteInIt) {
   if (geteuid() != 0) GTEST_SKIP() << "only root can give a directory away";
   Chown(dir, stranger);
-  for (const mode_t mode : {0700, 0755, 0775}) {
+  for (const mode_t mode : {0700U, 0755U, 0775U}) {
     ASSERT_EQ(chmod(dir.c_str(), mode), 0);
     EXPECT_TRUE(Believes(stranger)) << std::oct << mode;
     EXPECT_FALSE(Believes(stranger + 1)) << std::oct << mode;
   }
-  for (const mode_t mode : {0777, 01777, 0702}) {
+  for (const mode_t mode : {0777U, 01777U, 0702U}) {
     ASSERT_EQ(chmod(dir.c_str(), mode), 0);
     EXPECT_FALSE(Believes(stranger)) << std::oct << mode;
     EXPECT_TRUE(Believes(0)) << std::oct << mode;
