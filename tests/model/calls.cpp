@@ -49,6 +49,14 @@ bool Fails(const char* kind) {
 // What the faults put in place of SQLite's message.
 std::string Message() { return "injected " + std::to_string(*injected); }
 
+// The savepoint of many records has a name of nobody's concern.
+std::string WithoutName(const std::string& sql) {
+  for (const std::string verb : {"SAVEPOINT", "RELEASE"}) {
+    if (sql.rfind(verb + " ", 0) == 0 && sql.find(';') == std::string::npos) return verb;
+  }
+  return sql;
+}
+
 // The model's file for a file of the library.
 std::string OfTwin(const std::string& path) {
   const size_t at = path.find("/own/");
@@ -137,10 +145,12 @@ int sqlite3_exec(sqlite3* connection, const char* sql, int (*callback)(void*, in
   REAL(sqlite3_exec);
   if (depth > 0) return real(connection, sql, callback, argument, error);
   const Inside inside;
-  if (std::string(sql) == "ROLLBACK") {  // of an attempt that failed: only its effect counts
+  const std::string text = sql;
+  // Of an attempt that failed only the effect counts.
+  if (text == "ROLLBACK" || text.rfind("ROLLBACK TO ", 0) == 0) {
     return real(connection, sql, callback, argument, error);
   }
-  Trace::Add(std::string("exec ") + sql + (callback != nullptr || argument != nullptr ? "!" : ""));
+  Trace::Add("exec " + WithoutName(text) + (callback != nullptr || argument != nullptr ? "!" : ""));
   const bool fails = Fails("exec");
   int code = SQLITE_OK;
   if (error != nullptr) *error = nullptr;

@@ -1,4 +1,4 @@
-// The database handle, under faults of SQLite.
+// Random operations on the database handle, under faults of SQLite.
 
 #ifndef KELODRCORE_TESTS_MODEL_DATABASE_H_
 #define KELODRCORE_TESTS_MODEL_DATABASE_H_
@@ -7,7 +7,6 @@
 
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
@@ -15,381 +14,7 @@
 #include "kelodrcore/err.h"
 #include "kelodrcore/sqlite_db.h"
 #include "kelodrcore/sqlite_transaction.h"
-#include "kelodrcore/utils.h"
-#include "model/commands.h"
-
-namespace Model {
-
-class ErrRecorder {
- public:
-  virtual ~ErrRecorder() = default;
-  virtual std::string GetErrCodeStr(int /*code*/) const { return ""; }
-  Json::Value GetErr() const {
-    Json::Value document;
-    document["err_code"] = errCode;
-    const std::string name = GetErrCodeStr(errCode);
-    if (!name.empty()) document["err_code_str"] = name;
-    if (!errMsg.isNull()) document["err_msg"] = errMsg;
-    return document;
-  }
-
-  int errCode = 0;
-  Json::Value errMsg;
-};
-
-class SqliteDB : public ErrRecorder {
- public:
-  SqliteDB(const std::string& path, unsigned int retries, const std::string& label)
-      : dbPath(path), retryLimit(retries), logLabel(label) {}
-  ~SqliteDB() override { Close(); }
-
-  bool Open() {
-    if (dbHandle != nullptr) return true;
-    if (sqlite3_open(dbPath.c_str(), &dbHandle) != SQLITE_OK) {
-      Close();
-      Trace::Log(Warn, kFile, "Open", "Failed to open db[%s]", dbPath.c_str());
-      return false;
-    }
-    if (sqlite3_busy_timeout(dbHandle, 1000) != SQLITE_OK) {
-      Trace::Log(Warn, kFile, "Open", "Failed to set busy timeout with error");
-      return false;
-    }
-    return true;
-  }
-
-  void Close() {
-    if (dbHandle != nullptr) sqlite3_close(dbHandle);
-    dbHandle = nullptr;
-  }
-
-  bool IsInTransaction() const {
-    return dbHandle != nullptr && sqlite3_get_autocommit(dbHandle) == 0;
-  }
-  void RollBack() { sqlite3_exec(dbHandle, "ROLLBACK", nullptr, nullptr, nullptr); }
-
-  bool IsExisted() const { return std::filesystem::exists(Calls::Place(dbPath)); }
-
-  bool DoExecSqliteCommand(const std::string& sql) {
-    return !HasNul(sql, "DoExecSqliteCommand") && ExecOnce(sql);
-  }
-  bool DoSelectSqliteRecord(const std::string& sql, ValueList& record) {
-    return !HasNul(sql, "DoSelectSqliteRecord") && SelectOnce(sql, Into(record));
-  }
-  bool DoSelectSqliteRecords(const std::string& sql, std::vector<ValueList>& records) {
-    return !HasNul(sql, "DoSelectSqliteRecords") && SelectOnce(sql, Into(records));
-  }
-
-  bool Exec(const std::string& sql) {
-    SetErr(407);
-    if (sql.empty()) {
-      SetErr(401);
-      return Failed("Exec", "empty command to exec db[%s]", dbPath);
-    }
-    if (HasNul(sql, "Exec")) return false;
-    if (!Open()) {
-      SetErr(404);
-      return Failed("Exec", "Failed to open db [%s]", dbPath);
-    }
-    if (dbHandle == nullptr) {
-      SetErr(403);
-      return Failed("Exec", "DB[%s] is not opened", dbPath);
-    }
-    unsigned int retries = 0;
-    if (!Retried(retries, [&] { return ExecOnce(sql); })) {
-      return GaveUp("Exec", "exec command ", retries, sql);
-    }
-    SetErr(0);
-    if (retries > 0) {
-      Trace::Log(Info, kFile, "Exec", "After retry [%u] times, success to exec command [%s]",
-                 retries, sql.c_str());
-    }
-    return true;
-  }
-
-  bool SelectByCommand(const std::string& sql, ValueList& record) {
-    if (!OpenFor(sql, "Empty command to select record")) return false;
-    unsigned int retries = 0;
-    if (!Retried(retries, [&] { return SelectOnce(sql, Into(record)); })) {
-      return GaveUp("SelectByCommand", "select command", retries, sql);
-    }
-    if (retries > 0) {
-      Trace::Log(Info, kFile, "SelectByCommand",
-                 "After retry [%u] times, success to exec command [%s]", retries, sql.c_str());
-    }
-    return true;
-  }
-
-  bool SelectByCommand(const std::string& sql, std::vector<ValueList>& records) {
-    bool isHandedOver = false;
-    return SelectRows(sql, Into(records), isHandedOver);
-  }
-
-  void SetDBErr(int code, const char* message) {
-    if (code == SQLITE_OK) return;
-    errMsg = message != nullptr ? message : sqlite3_errmsg(dbHandle);
-    errCode = code;
-  }
-  void SetDBErr(const ErrRecorder& raw) {
-    Json::Value details;
-    if (raw.errCode != 0) details["sqlite_errcode"] = raw.errCode;
-    if (!raw.errMsg.isNull()) details["sqlite_errmsg"] = raw.errMsg;
-    errCode = raw.errCode == SQLITE_BUSY || raw.errCode == SQLITE_LOCKED ? 405 : 404;
-    errMsg = details;
-  }
-
-  bool IsTableExisted(const std::string& name) {
-    std::vector<ValueList> rows;
-    SelectByCommand("SELECT 1 FROM sqlite_master WHERE type='table' AND name='" + name + "';",
-                    rows);
-    return !rows.empty();
-  }
-
-  bool GetCount(const Table& table, int& count) {
-    const std::string sql = "SELECT count() as count FROM '" + table.tableName + "';";
-    std::vector<ValueList> rows;
-    SelectByCommand(sql, rows);
-    if (rows.empty()) return Failed("GetCount", "Record is empty on command [%s]", sql);
-    if (rows[0].GetValue("count", count)) return true;
-    return Failed("GetCount", "Record error [%s]", rows[0].ToStr());
-  }
-
-  bool CreateTable(const Table& table) {
-    if (table.columnDefs.empty()) return true;
-    if (table.tableName.empty()) return Failed("CreateTable", "Invalid table [%s]", "");
-    if (IsTableExisted(table.tableName)) return true;
-    if (Exec("CREATE TABLE IF NOT EXISTS " + table.tableName + " (" + table.columnDefs + ")")) {
-      return true;
-    }
-    return Failed("CreateTable", "Failed to create table [%s] with cmd[%s]", table.tableName,
-                  table.columnDefs);
-  }
-
-  bool Exec(const Command& command) {
-    SetErr(407);
-    const std::string sql = command.GetCommand();
-    Trace::Log(Info, kFile, "Exec", "%s Exec cmd: %s", logLabel.c_str(), sql.c_str());
-    if (!command.IsValid()) {
-      SetErr(401);
-      return false;
-    }
-    if (HasNul(sql, "Exec")) return false;
-    SetErr(404);
-    if (!CreateTable(command.GetTable())) {
-      return Failed("Exec", "Failed to create table [%s]", command.GetTable().tableName);
-    }
-    if (!Exec(sql)) return Failed("Exec", "Failed to exec [%s] in db[%s]", sql, dbPath);
-    Trace::Log(Info, kFile, "Exec", "%s Exec cmd success", logLabel.c_str());
-    SetErr(0);
-    return true;
-  }
-
-  bool InsertRecord(const InsertCommand& command) { return Exec(command); }
-  bool UpdateRecord(const UpdateCommand& command) { return Exec(command); }
-  bool DeleteRecord(const DeleteCommand& command) { return !IsExisted() || Exec(command); }
-  bool DeleteRecord(const std::string& condition, const Table& table) {
-    if (condition.empty()) {
-      SetErr(401);
-      return Failed("DeleteRecord", "invalid delete command: condition[%s]", condition);
-    }
-    DeleteCommand command;
-    command.SetTable(table);
-    command.SetCondition(condition);
-    return DeleteRecord(command);
-  }
-  bool DeleteAllRecords(const Table& table) {
-    DeleteCommand command;
-    command.SetTable(table);
-    command.DeleteAll();
-    return DeleteRecord(command);
-  }
-
-  bool SelectRecord(const SelectCommand& command, ValueList& record) {
-    return Prepared(command, "SelectRecord") &&
-           Cleared(SelectByCommand(command.GetCommand(), record));
-  }
-  bool SelectRecords(const SelectCommand& command, std::vector<ValueList>& records) {
-    return Prepared(command, "SelectRecords") &&
-           Cleared(SelectByCommand(command.GetCommand(), records));
-  }
-  bool SelectEach(const SelectCommand& command, const std::function<bool(const ValueList&)>& take) {
-    bool isHandedOver = false;
-    const auto takeOne = [&](const ValueList& row) {
-      isHandedOver = true;
-      return take(row);
-    };
-    return Prepared(command, "SelectEach") &&
-           Cleared(SelectRows(command.GetCommand(), takeOne, isHandedOver));
-  }
-
- private:
-  static constexpr const char* kFile = "sqlite_db.cpp";
-  using Take = std::function<bool(const ValueList&)>;  // false: no more rows
-
-  static Take Into(ValueList& record) {
-    return [&](const ValueList& row) {
-      record = row;
-      return false;
-    };
-  }
-  static Take Into(std::vector<ValueList>& records) {
-    return [&](const ValueList& row) {
-      records.push_back(row);
-      return true;
-    };
-  }
-
-  template <typename... Arguments>
-  static bool Failed(const char* function, const char* format, const Arguments&... arguments) {
-    Trace::Log(Err, kFile, function, format, std::string(arguments).c_str()...);
-    return false;
-  }
-
-  void SetErr(int code) {
-    errCode = code;
-    errMsg = Json::nullValue;
-  }
-
-  bool HasNul(const std::string& sql, const char* function) {
-    if (sql.find('\0') == std::string::npos) return false;
-    SetErr(401);
-    Failed(function, "NUL byte in command [%s]", sql);
-    return true;
-  }
-
-  bool GaveUp(const char* function, const char* what, unsigned int retries,
-              const std::string& sql) {
-    return Failed(function, "Reach retry limit [%s], failed to %s[%s] with err [%s]",
-                  std::to_string(retries), what, sql, ToText(GetErr()));
-  }
-
-  bool OpenFor(const std::string& sql, const char* emptyMessage) {
-    if (sql.empty()) {
-      SetErr(401);
-      return Failed("SelectByCommand", emptyMessage);
-    }
-    if (HasNul(sql, "SelectByCommand")) return false;
-    return Open() || Failed("SelectByCommand", "Failed to open db [%s]", dbPath);
-  }
-
-  bool ExecOnce(const std::string& sql) {
-    const bool wasFree = !IsInTransaction();
-    char* text = nullptr;
-    const int code = sqlite3_exec(dbHandle, sql.c_str(), nullptr, nullptr, &text);
-    if (code != SQLITE_OK) SetDBErr(code, text);
-    if (text != nullptr) sqlite3_free(text);
-    if (code != SQLITE_OK && wasFree && IsInTransaction()) RollBack();
-    return code == SQLITE_OK;
-  }
-
-  // `take` is given each row until it has enough, which is a success.
-  bool SelectOnce(const std::string& sql, const Take& take) {
-    SetErr(404);
-    sqlite3_stmt* statement = nullptr;
-    int code = sqlite3_prepare_v2(dbHandle, sql.c_str(), -1, &statement, nullptr);
-    const std::shared_ptr<sqlite3_stmt> owner(statement, sqlite3_finalize);
-    if (code == SQLITE_OK) {
-      do {
-        code = sqlite3_step(statement);
-      } while (code == SQLITE_ROW && take(ParseRecord(statement)));
-      if (code == SQLITE_ROW || code == SQLITE_DONE) {
-        SetErr(0);
-        return true;
-      }
-    }
-    SetDBErr(code, nullptr);
-    return false;
-  }
-
-  static ValueList ParseRecord(sqlite3_stmt* statement) {
-    ValueList record;
-    for (int i = 0; i < sqlite3_column_count(statement); ++i) {
-      const char* const name = sqlite3_column_name(statement, i);
-      const int type = sqlite3_column_type(statement, i);
-      if (type == SQLITE_INTEGER) {
-        record.AddValue(name, static_cast<long long>(sqlite3_column_int64(statement, i)));
-      } else if (type == SQLITE_TEXT) {
-        const auto* const text = reinterpret_cast<const char*>(sqlite3_column_text(statement, i));
-        record.AddValue(name, std::string(text != nullptr ? text : ""));
-      } else if (type == SQLITE_NULL) {
-        Trace::Log(Warn, kFile, "ParseRecord", "field [%s] has null value", name);
-      } else {
-        Trace::Log(Warn, kFile, "ParseRecord", "Not supported type [%d] with field [%s]", type,
-                   name);
-      }
-    }
-    return record;
-  }
-
-  template <typename Attempt>
-  bool Retried(unsigned int& retries, const Attempt& attempt, const bool& isFinal = false) {
-    while (!attempt()) {
-      const ErrRecorder raw = *this;
-      SetDBErr(raw);
-      if (raw.errCode != SQLITE_BUSY && raw.errCode != SQLITE_LOCKED) return false;
-      if (isFinal) return false;
-      if (++retries > retryLimit) return false;
-      Trace::Add("pause of 1000 to 2000 ms");
-    }
-    return true;
-  }
-
-  // Rows that were handed over are not handed over again.
-  bool SelectRows(const std::string& sql, const Take& take, const bool& isHandedOver) {
-    if (!OpenFor(sql, "Empty command to select records")) return false;
-    unsigned int retries = 0;
-    if (!Retried(
-            retries, [&] { return SelectOnce(sql, take); }, isHandedOver)) {
-      return GaveUp("SelectByCommand", "exec command ", retries, sql);
-    }
-    if (retries > 0) {
-      Trace::Log(Info, kFile, "SelectByCommand",
-                 "After retry [%u] times, success to select command", retries);
-    }
-    return true;
-  }
-
-  bool Prepared(const SelectCommand& command, const char* function) {
-    if (!command.IsValid()) {
-      SetErr(401);
-      return Failed(function, "invalid select command [%s]", command.ToStr());
-    }
-    if (!IsExisted() || HasNul(command.GetCommand(), "SelectByCommand")) return false;
-    SetErr(404);
-    return CreateTable(command.GetTable()) || Failed(function, "Failed to create table");
-  }
-
-  bool Cleared(bool isSelected) {
-    if (isSelected) SetErr(0);
-    return isSelected;
-  }
-
-  sqlite3* dbHandle = nullptr;
-  std::string dbPath;
-  unsigned int retryLimit;
-  std::string logLabel;
-};
-
-class Transaction {
- public:
-  explicit Transaction(SqliteDB& db) : handle(db), isBegun(db.Exec("BEGIN IMMEDIATE")) {}
-  Transaction(const Transaction&) = delete;
-  Transaction& operator=(const Transaction&) = delete;
-  ~Transaction() { Rollback(); }
-  bool IsOpen() const { return isBegun && handle.IsInTransaction(); }
-  bool Commit() {
-    isBegun = !handle.Exec("COMMIT");
-    return !isBegun;
-  }
-  void Rollback() {
-    if (IsOpen()) handle.RollBack();
-  }
-
- private:
-  SqliteDB& handle;
-  bool isBegun;
-};
-
-}  // namespace Model
+#include "model/records.h"
 
 // Handles that name their codes, if they are told to.
 template <typename Handle>
@@ -416,8 +41,7 @@ class Database {
     if (db.library == nullptr || Draw::Once(isUsual ? 60 : 10)) Renew();
     if (Draw::Once(2)) DrawFault();
     if (Draw::Once(12)) Calls::Hold(dir + "/own/db");
-    Table table;
-    switch (Draw::Below(11)) {
+    switch (Draw::Below(13)) {
       case 0:
         OfConnection();
         break;
@@ -437,6 +61,10 @@ class Database {
       case 6:
         OfTransaction();
         break;
+      case 7:
+      case 8:
+        OfRecords();
+        break;
       default:
         OfCommand();
     }
@@ -449,6 +77,7 @@ class Database {
 
  private:
   using Table = TableTwin;
+  using BatchTwin = Twin<std::vector<KeloDRCore::SqliteValueList>, std::vector<Model::ValueList>>;
 
   // Another handle, on the same file or a new one, or on what is no database.
   void Renew() {
@@ -619,12 +248,16 @@ class Database {
 
   void OfTransaction() {
     const size_t end = Draw::Below(4);
+    RefuseFalseSuccess();
+    TableTwin table = DrawTable();
+    BatchTwin batch = DrawBatch();
     Do("a transaction that ends by " + std::to_string(end), [&](auto side) {
       std::string shown;
       {
         auto transaction = Begin(side, *side(db));
         shown = Show(transaction.IsOpen(), side(db)->GetErr());
         side(db)->InsertRecord(side(commands.insert));
+        side(db)->InsertRecords(side(table), side(batch));
         if (end == 0) side(db)->Close();
         if (end == 1) transaction.Rollback();
         if (end == 2 && transaction.IsOpen()) shown += Show(transaction.Commit());
@@ -632,6 +265,61 @@ class Database {
       }
       return shown + Show(side(db)->GetErr()) + Calls::DumpDatabase();
     });
+  }
+
+  // Many records: most of them have the fields of the one before, and most can be stored. (A number
+  // that cannot ends a run: whether the next statement is prepared before is nobody's concern.)
+  static BatchTwin DrawBatch() {
+    BatchTwin batch;
+    std::vector<std::string> names;
+    for (size_t i = Draw::Below(6); i > 0; --i) {
+      const bool isNewRun = names.empty() || Draw::Once(4);
+      const bool mayFail = !isNewRun || batch.model.empty();
+      if (isNewRun) names = DrawNames();
+      ListTwin record;
+      for (const std::string& name : names) {
+        const int small = static_cast<int>(Draw::Below(50));
+        ValueTwin value = DrawValue();
+        const bool isKept = value.model.IsStorable() || (value.model.IsValid() && mayFail);
+        // Behind the largest id there are only random ones.
+        if (!isKept || name == "id" || !Draw::Once(4)) value = ValueTwin{small, small};
+        record.library.AddValue(name, value.library);
+        record.model.AddValue(name, value.model);
+      }
+      batch.library.push_back(record.library);
+      batch.model.push_back(record.model);
+    }
+    if (Draw::Once(20)) batch = {{{}}, {{}}};
+    return batch;
+  }
+  static std::vector<std::string> DrawNames() {
+    static const std::vector<std::string> usual = {"a", "b", "name", "x"};
+    static const std::vector<std::string> odd = {"id", "id", "none", "%s%n",
+                                                 std::string("n\0z", 3)};
+    std::vector<std::string> names = {Draw::Of(usual), Draw::Of(usual)};
+    if (Draw::Once(3)) names.push_back(Draw::Of(odd));
+    return names;
+  }
+
+  // A success of what was not done is no answer of SQLite.
+  static void RefuseFalseSuccess() {
+    Calls::Fault& fault = Calls::fault;
+    const bool isSuccess = fault.code == SQLITE_OK || fault.code == SQLITE_DONE;
+    if ((fault.kind == "exec" || fault.kind == "step") && isSuccess) fault.code = SQLITE_ERROR;
+  }
+
+  void OfRecords() {
+    RefuseFalseSuccess();
+    TableTwin table = DrawTable();
+    BatchTwin batch = DrawBatch();
+    const bool isReplacing = Draw::Once(3);
+    Do(std::to_string(batch.model.size()) + " records for " + table.model.tableName,
+       [&](auto side) {
+         auto& handle = *side(db);
+         const bool result = isReplacing ? handle.InsertOrReplaceRecords(side(table), side(batch))
+                                         : handle.InsertRecords(side(table), side(batch));
+         return End(result, side(db)) + Calls::DumpDatabase();
+       });
   }
 
   void OfDeletes() {
@@ -689,7 +377,7 @@ class Database {
   Twin<std::unique_ptr<KeloDRCore::ErrRecorder>, std::unique_ptr<Model::ErrRecorder>> other = {
       std::make_unique<KeloDRCore::ErrRecorder>(), std::make_unique<Model::ErrRecorder>()};
   ListTwin row;
-  Twin<std::vector<KeloDRCore::SqliteValueList>, std::vector<Model::ValueList>> rows;
+  BatchTwin rows;
 };
 
 #endif  // KELODRCORE_TESTS_MODEL_DATABASE_H_

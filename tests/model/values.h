@@ -3,6 +3,8 @@
 #ifndef KELODRCORE_TESTS_MODEL_VALUES_H_
 #define KELODRCORE_TESTS_MODEL_VALUES_H_
 
+#include <sqlite3.h>
+
 #include <cstdint>
 #include <limits>
 #include <map>
@@ -54,6 +56,20 @@ class Value {
   template <typename T>
   bool GetValue(T& out) const {
     return Read(out) || Warned(Type(out));
+  }
+
+  // Whether SQLite has such a value: an integer has 63 bits and a sign.
+  bool IsStorable() const { return value.isString() || value.isBool() || value.isInt64(); }
+
+  // Gives a value that can be stored to a statement as it is.
+  void Bind(sqlite3_stmt* statement, int place) const {
+    if (value.isString()) {
+      const std::string text = value.asString();
+      sqlite3_bind_text(statement, place, text.data(), static_cast<int>(text.size()),
+                        SQLITE_TRANSIENT);
+    } else {
+      sqlite3_bind_int64(statement, place, value.asInt64());
+    }
   }
 
  private:
