@@ -6,15 +6,11 @@
 #include <sqlite3.h>
 #include <unistd.h>
 
-#include <cstring>
-#include <type_traits>
-
 #include "kelodrcore/err.h"
 #include "support/database.h"
 
 namespace {
 
-using KeloDRCore::ErrRecorder;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
@@ -58,70 +54,14 @@ extern "C" const char* sqlite3_column_name(sqlite3_stmt* stmt, int column) {
 
 namespace {
 
-class NamingRecorder : public ErrRecorder {
- public:
-  std::string GetErrCodeStr(int code) const override { return KeloDRCore::ERR::ToString(code); }
-};
-
-class OpenRecorder : public ErrRecorder {
- public:
-  OpenRecorder(int code, const Json::Value& message) {
-    errCode = code;
-    errMsg = message;
-  }
-};
-
-TEST(ErrRecorderTest, FreshOneHasOnlyCodeZero) { EXPECT_EQ(ErrRecorder().GetErr(), Error(0)); }
-
-TEST(ErrRecorderTest, HasNoNameForAnyCode) {
-  for (const int code : {0, 401, 404, 405, -1}) EXPECT_EQ(ErrRecorder().GetErrCodeStr(code), "");
-}
-
-TEST(ErrRecorderTest, NamesItsCodeThroughTheOverride) {
-  class Naming : public NamingRecorder {
-   public:
-    Naming() { errCode = 401; }
-  };
-  Json::Value expected = Error(401);
-  expected["err_code_str"] = KeloDRCore::ERR::ToString(401);
-  EXPECT_EQ(Naming().GetErr(), expected);
-  EXPECT_EQ(static_cast<const ErrRecorder&>(Naming()).GetErr(), expected);
-}
-
-TEST(ErrRecorderTest, ShowsDetailsUnlessTheyAreNull) {
-  EXPECT_EQ(OpenRecorder(404, Json::Value()).GetErr(), Error(404));
-  for (const Json::Value& details : {Json::Value("text"), Json::Value(""), Json::Value(0),
-                                     Json::Value(Json::objectValue), Json::Value(false)}) {
-    Json::Value expected = Error(-7);
-    expected["err_msg"] = details;
-    EXPECT_EQ(OpenRecorder(-7, details).GetErr(), expected);
-  }
-}
-
-TEST(ErrRecorderTest, CopiesCodeAndDetails) {
-  const OpenRecorder original(5, "database is locked");
-  const ErrRecorder copy = original;
-  EXPECT_EQ(copy.GetErr(), original.GetErr());
-  ErrRecorder assigned;
-  assigned = original;
-  EXPECT_EQ(assigned.GetErr(), original.GetErr());
-  static_assert(!std::has_virtual_destructor_v<ErrRecorder>);
-  static_assert(std::has_virtual_destructor_v<SqliteDB>);
-  static_assert(!std::is_copy_constructible_v<SqliteDB> && !std::is_copy_assignable_v<SqliteDB>);
-}
-
-// A pointer to a virtual member holds its offset in the virtual table plus one.
-TEST(ErrRecorderTest, KeepsTheOrderOfItsSlots) {
-  const auto slot = [](auto member) {
-    size_t word = 0;
-    std::memcpy(&word, &member, sizeof word);
-    return (word - 1) / sizeof(void*);
-  };
-  EXPECT_EQ(slot(&ErrRecorder::GetErr), 0U);
-  EXPECT_EQ(slot(&ErrRecorder::GetErrCodeStr), 1U);
-}
-
 using SqliteDBTest = DatabaseTest;
+
+// What a single attempt records: SQLite's own code and message.
+Json::Value RawError(int code, const std::string& message) {
+  Json::Value err = Error(code);
+  err["err_msg"] = message;
+  return err;
+}
 
 TEST_F(SqliteDBTest, ConstructionOpensNothing) {
   EXPECT_FALSE(HasFile());
@@ -235,13 +175,13 @@ TEST_F(SqliteDBTest, StaysOpenAcrossOperationsAndFailures) {
 }
 
 TEST_F(SqliteDBTest, SingleAttemptsFailOnAClosedHandle) {
-  const OpenRecorder raw(21, "out of memory");
+  const Json::Value failure = RawError(21, "out of memory");
   EXPECT_FALSE(db->DoExecSqliteCommand("CREATE TABLE t (n)"));
-  EXPECT_EQ(db->GetErr(), raw.GetErr());
+  EXPECT_EQ(db->GetErr(), failure);
   EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT 1 AS n", record));
-  EXPECT_EQ(db->GetErr(), raw.GetErr());
+  EXPECT_EQ(db->GetErr(), failure);
   EXPECT_FALSE(db->DoSelectSqliteRecords("SELECT 1 AS n", records));
-  EXPECT_EQ(db->GetErr(), raw.GetErr());
+  EXPECT_EQ(db->GetErr(), failure);
   EXPECT_FALSE(HasFile());
   EXPECT_EQ(record.ToStr(), "");
   EXPECT_THAT(records, IsEmpty());
@@ -250,7 +190,7 @@ TEST_F(SqliteDBTest, SingleAttemptsFailOnAClosedHandle) {
 TEST_F(SqliteDBTest, SingleExecRecordsTheRawFailureAndNoSuccess) {
   ASSERT_TRUE(db->Open());
   EXPECT_FALSE(db->DoExecSqliteCommand("DROP TABLE missing"));
-  const Json::Value failure = OpenRecorder(1, "no such table: missing").GetErr();
+  const Json::Value failure = RawError(1, "no such table: missing");
   EXPECT_EQ(db->GetErr(), failure);
   EXPECT_TRUE(db->DoExecSqliteCommand("CREATE TABLE t (n)"));
   EXPECT_EQ(db->GetErr(), failure);
@@ -260,7 +200,7 @@ TEST_F(SqliteDBTest, SingleExecRecordsTheRawFailureAndNoSuccess) {
 
 TEST_F(SqliteDBTest, SingleSelectsRecordTheRawFailureAndClearItOnSuccess) {
   ASSERT_TRUE(db->Open());
-  const Json::Value failure = OpenRecorder(1, "no such table: missing").GetErr();
+  const Json::Value failure = RawError(1, "no such table: missing");
   EXPECT_FALSE(db->DoSelectSqliteRecord("SELECT * FROM missing", record));
   EXPECT_EQ(db->GetErr(), failure);
   EXPECT_TRUE(db->DoSelectSqliteRecord("SELECT 1 AS n", record));
@@ -274,89 +214,13 @@ TEST_F(SqliteDBTest, SingleSelectsRecordTheRawFailureAndClearItOnSuccess) {
 // A text without a statement compiles to nothing, and stepping nothing is a misuse.
 TEST_F(SqliteDBTest, SingleSelectsFailOnATextWithoutAStatement) {
   ASSERT_TRUE(db->Open());
-  const Json::Value misuse = OpenRecorder(21, "not an error").GetErr();
+  const Json::Value misuse = RawError(21, "not an error");
   for (const char* const blank : {"", " \n", "-- nothing", "/* nothing */", ";"}) {
     EXPECT_FALSE(db->DoSelectSqliteRecord(blank, record));
     EXPECT_EQ(db->GetErr(), misuse);
     EXPECT_FALSE(db->DoSelectSqliteRecords(blank, records));
     EXPECT_EQ(db->GetErr(), misuse);
   }
-}
-
-TEST_F(SqliteDBTest, SetDBErrOfCodeZeroDoesNothing) {
-  db->SetDBErr(7, "kept");
-  db->SetDBErr(0, "other");
-  db->SetDBErr(0, nullptr);
-  EXPECT_EQ(db->GetErr(), OpenRecorder(7, "kept").GetErr());
-}
-
-TEST_F(SqliteDBTest, SetDBErrTakesTheGivenMessageOrTheConnections) {
-  const SqliteDB& constant = *db;
-  constant.SetDBErr(26, "given");
-  EXPECT_EQ(db->GetErr(), OpenRecorder(26, "given").GetErr());
-  constant.SetDBErr(-3, "");
-  EXPECT_EQ(db->GetErr(), OpenRecorder(-3, "").GetErr());
-  ASSERT_TRUE(db->Open());
-  constant.SetDBErr(8, nullptr);
-  EXPECT_EQ(db->GetErr(), OpenRecorder(8, "not an error").GetErr());
-}
-
-TEST_F(SqliteDBTest, SetDBErrClassifiesBusyAndLockedAsALockAndAllElseAsAFailure) {
-  const SqliteDB& constant = *db;
-  for (const int code : {5, 6}) {
-    constant.SetDBErr(OpenRecorder(code, "text"));
-    EXPECT_EQ(db->GetErr(), Error(405, code, "text"));
-  }
-  for (const int code : {1, 2, 3, 4, 7, 8, 10, 26, 100, 101, 261, 262, 404, 405, -5}) {
-    constant.SetDBErr(OpenRecorder(code, "text"));
-    EXPECT_EQ(db->GetErr(), Error(404, code, "text"));
-  }
-}
-
-TEST_F(SqliteDBTest, SetDBErrKeepsOnlyTheDetailsThatAreThere) {
-  db->SetDBErr(7, "before");
-  db->SetDBErr(ErrRecorder());
-  EXPECT_EQ(db->GetErr(), Error(404));
-  db->SetDBErr(OpenRecorder(5, Json::Value()));
-  Json::Value codeOnly = Error(405);
-  codeOnly["err_msg"]["sqlite_errcode"] = 5;
-  EXPECT_EQ(db->GetErr(), codeOnly);
-  db->SetDBErr(OpenRecorder(0, "text"));
-  Json::Value textOnly = Error(404);
-  textOnly["err_msg"]["sqlite_errmsg"] = "text";
-  EXPECT_EQ(db->GetErr(), textOnly);
-}
-
-TEST_F(SqliteDBTest, SetDBErrClassifiesItsOwnError) {
-  db->SetDBErr(6, "database table is locked");
-  db->SetDBErr(*db);
-  EXPECT_EQ(db->GetErr(), Error(405, 6, "database table is locked"));
-}
-
-TEST_F(SqliteDBTest, ErrorsCarryNoName) { EXPECT_EQ(db->GetErrCodeStr(404), ""); }
-
-TEST_F(SqliteDBTest, FailureLinesShowTheErrorOfTheSubclass) {
-  class OtherDB : public SqliteDB {
-   public:
-    using SqliteDB::SqliteDB;
-    Json::Value GetErr() const override {
-      Json::Value err = SqliteDB::GetErr();
-      err["label"] = "other";
-      return err;
-    }
-    std::string GetErrCodeStr(int code) const override { return KeloDRCore::ERR::ToString(code); }
-  };
-  OtherDB other(path, 0, "");
-  Json::Value expected = Error(404, 1, "no such table: missing");
-  expected["err_code_str"] = KeloDRCore::ERR::ToString(404);
-  expected["label"] = "other";
-  const std::string sql = "SELECT * FROM missing";
-  EXPECT_FALSE(other.Exec(sql));
-  EXPECT_EQ(other.GetErr(), expected);
-  EXPECT_FALSE(other.SelectByCommand(sql, record));
-  EXPECT_FALSE(other.SelectByCommand(sql, records));
-  ExpectLog({ExecFailed("Exec", 0, sql, expected), SelectFailed(0, sql, expected),
-             ExecFailed("SelectByCommand", 0, sql, expected)});
 }
 
 TEST_F(SqliteDBTest, ExecRunsAStatementWithoutALine) {
@@ -525,20 +389,6 @@ TEST_F(SqliteDBTest, BulkInsertsNameAConnectionThatIsNotThere) {
   EXPECT_EQ(db->GetErr(), Error(403));
   ExpectLog({Info(kFile, "InsertRecords", "label Exec cmd: INSERT INTO t (n) VALUES (?);"),
              Err(kFile, "InsertRecords", "DB[" + path + "] is not opened")});
-}
-
-class ThrowingDB : public SqliteDB {
- public:
-  using SqliteDB::SqliteDB;
-  std::string GetErrCodeStr(int /*code*/) const override { throw Json::LogicError("own"); }
-};
-
-TEST_F(SqliteDBTest, WhatTheNamingOfACodeThrowsPassesUnchanged) {
-  ThrowingDB throwing(path, 0, "label");
-  EXPECT_THROW((void)throwing.GetErr(), Json::LogicError);
-  EXPECT_THROW(throwing.Exec("nonsense"), Json::LogicError);
-  EXPECT_THROW(throwing.SelectByCommand("nonsense", record), Json::LogicError);
-  EXPECT_THROW(throwing.SelectByCommand("nonsense", records), Json::LogicError);
 }
 
 TEST_F(SqliteDBTest, FailureNamesBytesThatAreNotUtf8) {
