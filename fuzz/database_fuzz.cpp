@@ -153,12 +153,30 @@ bool RunTransaction(FuzzedDataProvider& input, SqliteDB& db) {
   return !transaction.IsOpen() || input.ConsumeBool() || transaction.Commit();
 }
 
+// By the connection alone, so that the handle's error stays; -1 when the table cannot be read.
+int CountRows() {
+  int count = -1;
+  const auto take = [](void* out, int, char** values, char**) {
+    *static_cast<int*>(out) = std::stoi(values[0]);
+    return 0;
+  };
+  if (open != nullptr)
+    sqlite3_exec(open, "SELECT count(*) FROM job NOT INDEXED", take, &count, nullptr);
+  return count;
+}
+
 bool Insert(FuzzedDataProvider& input, SqliteDB& db, bool replaces) {
   std::vector<SqliteValueList> records;
   for (int i = input.ConsumeIntegralInRange(1, 3); i > 0; --i) {
     records.push_back(MakeRecord(std::string(input.ConsumeIntegral<uint8_t>(), 'n'), i));
   }
-  return replaces ? db.InsertOrReplaceRecords(kJob, records) : db.InsertRecords(kJob, records);
+  const bool wasInTransaction = IsInTransaction();
+  const int before = CountRows();
+  const bool isDone =
+      replaces ? db.InsertOrReplaceRecords(kJob, records) : db.InsertRecords(kJob, records);
+  if (isDone || before < 0 || wasInTransaction != IsInTransaction()) return isDone;
+  Require(CountRows() == before, "all records are inserted or none");
+  return false;
 }
 
 bool Operate(FuzzedDataProvider& input, SqliteDB& db) {
