@@ -6,16 +6,20 @@ library of its own, which the test programs of the dev build (scripts/build.sh d
 theirs; a program that has a part of the mutant in itself is linked anew. The programs run as root in namespaces of
 their own, where only /tmp can be written: a mutant may remove anything.
 
-A file is tested by the programs of its name: X.cpp and X.h by X_test, X_*_test, fault_X_test and so on.
+A file is tested by the programs of its name: X.cpp and X.h by X_test, X_*_test, fault_X_test and so on. A failure
+counts when it comes twice in a row; so does a test that does not come to its end, if it does with the library as it is.
 
 Results are kept in build/mutation/results.tsv by the text of the line: a stopped run goes on, and a changed line is
 measured anew. The order is random but always the same, so that any part of a run is a fair sample.
+
+--faults puts the faults of scripts/faults.py into the library instead, one at a time, and fails unless each is noticed.
 """
 
 import argparse
 import collections
 import concurrent.futures
 import json
+import math
 import os
 import pathlib
 import random
@@ -23,23 +27,30 @@ import re
 import shutil
 import subprocess
 import sys
+import tempfile
 import threading
 import time
+
+import faults
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 BUILDS = pathlib.Path(os.environ.get("KELODR_BUILD_DIR", ROOT / "build"))
 BUILD = BUILDS / "dev"
 WORK = BUILDS / "mutation"
 RESULTS = WORK / "results.tsv"
+SYSTEM = WORK / "system.h"
+TIMES = WORK / "times.json"  # of the test programs as they were built
 FOLDERS = ["src", "posix", "platform", "include/kelodrcore"]
 
 # The names of further tests, for files of which no test, or not every one, has the name.
 MORE_NAMES = {
+    "access": ["json_value", "json", "document", "document_file"],
     "descriptor": ["file", "file_lock", "json_value"],
-    "directory_walk": ["file_lock"],
+    "directory_walk": ["file_lock", "lock"],
     "document_file": ["json_value", "json", "document", "file", "short_transfer"],
     "file": ["key_value", "short_transfer"],
-    "file_io": ["file", "json_value", "platform"],
+    "file_io": ["file", "json_value", "platform", "document"],
+    "file_lock": ["lock"],
     "json_text": ["json_value", "locale", "response"],
     "json_value": ["json"],
     "kelocore": ["platform"],
@@ -48,13 +59,15 @@ MORE_NAMES = {
     "lock_fork": ["file_lock", "cache"],
     "log": ["file_lock", "sqlite_value"],
     "own_claim": ["cache"],
+    "pipe": ["platform", "utils"],
     "privilege": ["file", "cache"],
     "retry": ["file", "file_lock", "platform"],
+    "sqlite_attempt": ["sqlite_bulk", "sqlite_transaction", "sqlite_db"],
     "sqlite_bulk": ["sqlite_transaction", "sqlite_db"],
     "sqlite_command": ["sqlite_select_command", "layout"],
     "sqlite_query": ["sqlite_db", "sqlite_transaction"],
     "sqlite_value": ["sqlite_db_row"],
-    "trust": ["json_value", "cache"],
+    "trust": ["json_value", "cache", "document"],
     "validator": ["utils"],
     "value_access": ["sqlite_value"],
 }
@@ -80,7 +93,11 @@ SANDBOX = ["unshare", "--mount", "--pid", "--fork", "--kill-child", "--mount-pro
            'mount -t tmpfs tmpfs /tmp && mount -o remount,bind,ro / && '
            '"$@" && [ ! -e $TEST_PREMATURE_EXIT_FILE ]; exit $?', "bash"]
 
-Mutant = collections.namedtuple("Mutant", "file line start end new key")
+NOTICED = ["failed", "timed out"]
+LINKER = "-fuse-ld=lld" if shutil.which("ld.lld") else ""
+
+# The edits are (start, end, new text), from the last one of the file to the first.
+Mutant = collections.namedtuple("Mutant", "file line edits key")
 
 
 def blanked(text):
@@ -139,7 +156,18 @@ def mutants_of(path):
         shown = " ".join(new.split()) if new.startswith("!(") else new.strip()
         key = f"{path.relative_to(ROOT)}\t{lines[line - 1].strip()}\t{column}\t{old.strip()} => {shown}"
         seen[key] += 1
-        yield Mutant(path, line, start, end, new, re.sub(r" +", " ", f"{key}\t{seen[key]}"))
+        yield Mutant(path, line, [(start, end, new)], re.sub(r" +", " ", f"{key}\t{seen[key]}"))
+
+
+def fault_of(name, file, replacements):
+    """The mutant of a fault made by hand; each old text stands in the file once."""
+    path = ROOT / file
+    text = path.read_text()
+    for old, _ in replacements:
+        if text.count(old) != 1:
+            sys.exit(f"mutate.py: {name}: {file} does not have this once:\n{old}")
+    edits = sorted(((text.index(old), text.index(old) + len(old), new) for old, new in replacements), reverse=True)
+    return Mutant(path, text.count("\n", 0, edits[-1][0]) + 1, edits, name)
 
 
 def library_files():
@@ -188,34 +216,92 @@ class Commands:
         return [one for one in objects if str(path) in self.files.get(one, ())]
 
 
+class Tests:
+    """What is known of the test programs: how long each takes, and for which files each failed."""
+
+    def __init__(self, worker, programs):
+        self.seconds, self.failures = {}, collections.Counter()
+        known = json.loads(TIMES.read_text()) if TIMES.exists() else {}
+        for program in sorted(programs):
+            built = (BUILD / "tests" / program).stat().st_mtime
+            if known.get(program, [0])[0] != built:
+                known[program] = [built, self.measured(worker, program)]
+                TIMES.write_text(json.dumps(known, indent=1))
+            self.seconds[program] = known[program][1]
+
+    @staticmethod
+    def measured(worker, program):
+        begin = time.monotonic()
+        if worker.run_test(program, 900, BUILD) != "passed":
+            sys.exit(f"mutate.py: {program} fails without any change")
+        seconds = time.monotonic() - begin
+        print(f"mutate.py: {program} takes {seconds:.1f} s", flush=True)
+        return seconds
+
+    def in_order(self, path):
+        """First those that are quick and failed often for this file."""
+        return sorted(tests_of(path),
+                      key=lambda test: self.seconds[test] / (1 + self.failures[path, test]))
+
+    def limit(self, test):
+        return 10 + 5 * self.seconds[test]
+
+
 class Worker:
     """Builds and tests mutants in a directory of its own, on a mirror of the tree's sources."""
 
-    def __init__(self, commands, number):
-        self.dir = WORK / f"worker{number}"
+    def __init__(self, commands):
+        self.place = tempfile.TemporaryDirectory(prefix="worker", dir=WORK)
+        self.dir = pathlib.Path(self.place.name)
         self.mirror = self.dir / "mirror"
         self.commands = commands
         self.linked = set()  # the test programs that are linked anew
-        shutil.rmtree(self.dir, ignore_errors=True)
         for path in [*library_files(), *ROOT.glob("tests/*/*.cpp"), *ROOT.glob("tests/*/*.h")]:
             place = self.mirror / path.relative_to(ROOT)
             place.parent.mkdir(parents=True, exist_ok=True)
             place.symlink_to(path)
 
-    def run_mutant(self, mutant, limits):
+    def compile_system_headers(self):
+        """Compiles what src/ includes of the system, once for all runs: it takes most of the time of a compilation."""
+        texts = [path.read_text() for path in library_files()]
+        includes = sorted({line for text in texts for line in re.findall(r"^#include <.+>$", text, re.M)})
+        first = next(one for one in self.commands.compile if one.startswith("src/"))
+        command = re.sub(r" -o \S+ -c \S+", f" -x c++-header {SYSTEM} -o {SYSTEM}.gch", self.compilation(first))
+        text = "\n".join(includes) + f"\n// {command.replace(str(self.dir), '')}\n"
+        if not SYSTEM.exists() or SYSTEM.read_text() != text:
+            SYSTEM.write_text(text)
+            self.run(command)
+
+    def run_mutant(self, mutant, tests):
+        """Returns the outcome and the test that gave it."""
         text = mutant.file.read_text()
+        for start, end, new in mutant.edits:
+            text = text[:start] + new + text[end:]
         source = self.mirror / mutant.file.relative_to(ROOT)
         source.unlink()
-        source.write_text(text[:mutant.start] + mutant.new + text[mutant.end:])
+        source.write_text(text)
+        programs = tests.in_order(mutant.file)
         try:
-            tests = sorted(tests_of(mutant.file), key=limits.get)
-            if not self.build(mutant.file, tests):
+            if not self.build(mutant.file, programs):
                 return "not compiled"
         finally:
             source.unlink()
             source.symlink_to(mutant.file)
-        outcomes = (self.run_test(test, limits[test]) for test in tests)
-        return next((outcome for outcome in outcomes if outcome != "passed"), "survived")
+        for program in programs:
+            outcome = self.run_test(program, tests.limit(program))
+            if outcome == "passed":
+                continue
+            if not self.is_noticed(program, outcome, tests.limit(program)):
+                print(f"mutate.py: {program} {outcome} by chance: {mutant.key}", flush=True)
+                continue
+            tests.failures[mutant.file, program] += 1
+            return f"{outcome} in {program}"
+        return "survived"
+
+    def is_noticed(self, program, outcome, limit):
+        """Whether an outcome comes again, and is not the machine's, which may be too busy."""
+        return ((outcome == "failed" or self.run_test(program, limit, BUILD) == "passed")
+                and self.run_test(program, limit) == outcome)
 
     def build(self, path, tests):
         """Compiles what the file is part of, and links the library and those programs anew."""
@@ -228,18 +314,21 @@ class Worker:
             if objects:
                 changed[f"tests/{test}"] = objects
         self.linked = {pathlib.Path(output).name for output in changed}
-        return (all(self.compile(one) for one in {one for all_ in changed.values() for one in all_})
+        return (all(self.run(self.compilation(one))
+                    for one in {one for all_ in changed.values() for one in all_})
                 and all(self.link(output, objects) for output, objects in changed.items()))
 
     def object(self, name):
         return self.dir / name.replace("/", "_")
 
-    def compile(self, name):
-        command = re.sub(r" -(Werror|MD|g)\b| -M[TF] \S+", "", self.commands.compile[name])
+    def compilation(self, name):
+        command = re.sub(r"^ccache | -(Werror|MD|g)\b| -M[TF] \S+", "", self.commands.compile[name])
         for folder in ["src", "posix", "platform", "include", "tests"]:
             command = command.replace(f"{ROOT}/{folder}", f"{self.mirror}/{folder}")
         command = command.replace(f"-I{ROOT} ", f"-I{self.mirror} ")
-        return self.run(command.replace(f" -o {name}", f" -o {self.object(name)}") + " -w")
+        if name.startswith("src/"):
+            command += f" -include {SYSTEM}"
+        return command.replace(f" -o {name}", f" -o {self.object(name)}") + " -w"
 
     def link(self, output, objects):
         command = self.commands.link[output]
@@ -248,20 +337,22 @@ class Worker:
             command = (command.replace(f" {name} ", f" {mutated} ") if f" {name} " in command
                        else command.replace(" -o ", f" {mutated} -o ", 1))
         name = "libkelodrcore.so.1" if output == self.commands.library else pathlib.Path(output).name
-        return self.run(command.replace(f" -o {output}", f" -o {self.dir / name}"))
+        command = command.replace(f" -o {output}", f" {LINKER} -o {self.dir / name}")
+        return self.run(command)
 
     @staticmethod
     def run(command):
-        return subprocess.run(command, shell=True, cwd=BUILD, timeout=300,
+        return subprocess.run(command, shell=True, cwd=BUILD, timeout=600,
                               capture_output=True).returncode == 0
 
-    def run_test(self, name, limit):
-        directory = self.dir if name in self.linked else BUILD / "tests"
+    def run_test(self, name, limit, build=None):
+        """Runs a program with the library of the mutant, or with that of `build`."""
+        directory = self.dir if name in self.linked and not build else BUILD / "tests"
         arguments = [KILL_FILTER] if name.startswith("kill_") else []
         command = SANDBOX + [str(directory / name), *arguments, "--gtest_brief=1", "--gtest_fail_fast"]
         process = subprocess.Popen(command, stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
                                    stderr=subprocess.DEVNULL, start_new_session=True,
-                                   env={**os.environ, "LD_LIBRARY_PATH": str(self.dir),
+                                   env={**os.environ, "LD_LIBRARY_PATH": str(build / "src" if build else self.dir),
                                         "TEST_PREMATURE_EXIT_FILE": "/tmp/unfinished"})
         try:
             return "passed" if process.wait(limit) == 0 else "failed"
@@ -272,46 +363,61 @@ class Worker:
 
 
 def read_results():
+    """The outcomes by the keys of the mutants."""
     if not RESULTS.exists():
         return {}
-    rows = (line.rsplit("\t", 1) for line in RESULTS.read_text().splitlines())
-    return dict(rows)
+    return dict(line.rsplit("\t", 1) for line in RESULTS.read_text().splitlines())
 
 
-def measured_limits(worker, programs):
-    """How long each test program may take, from what it takes with the library as it is."""
-    shutil.copy(BUILD / "src" / "libkelodrcore.so.1", worker.dir / "libkelodrcore.so.1")
-    limits = {}
-    for program in sorted(programs):
-        begin = time.monotonic()
-        if worker.run_test(program, 300) != "passed":
-            sys.exit(f"mutate.py: {program} fails without any change")
-        seconds = time.monotonic() - begin
-        limits[program] = 10 + 5 * seconds
-        print(f"mutate.py: {program} takes {seconds:.1f} s", flush=True)
-    return limits
+def word_of(outcome):
+    """An outcome without the name of the test."""
+    return outcome.split(" in ")[0]
 
 
-def run_all(mutants, minutes, jobs):
+def keep(mutant, outcome):
+    with RESULTS.open("a") as out:
+        out.write(f"{mutant.key}\t{outcome}\n")
+
+
+def run_all(mutants, minutes, jobs, take):
+    """Measures the mutants and gives each with its outcome to `take`."""
     commands = Commands()
-    workers = [Worker(commands, number) for number in range(jobs)]
-    limits = measured_limits(workers[0], {test for path in {m.file for m in mutants} for test in tests_of(path)})
+    workers = [Worker(commands) for _ in range(jobs)]
+    workers[0].compile_system_headers()
+    tests = Tests(workers[0], {test for path in {m.file for m in mutants} for test in tests_of(path)})
+    due = iter(mutants)
     deadline = time.monotonic() + 60 * minutes
     lock = threading.Lock()
 
     def work(worker):
-        while True:
+        while time.monotonic() < deadline:
             with lock:
-                if not mutants or time.monotonic() > deadline:
-                    return
-                mutant = mutants.pop(0)
-            outcome = worker.run_mutant(mutant, limits)
-            with lock, RESULTS.open("a") as out:
-                out.write(f"{mutant.key}\t{outcome}\n")
+                mutant = next(due, None)
+            if mutant is None:
+                return
+            outcome = worker.run_mutant(mutant, tests)
+            with lock:
+                take(mutant, outcome)
 
     with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
         for future in [pool.submit(work, worker) for worker in workers]:
             future.result()
+
+
+def run_faults(files, jobs):
+    """Whether each fault made by hand in these files, or in all, is noticed."""
+    due = [fault_of(*fault) for fault in faults.FAULTS]
+    due = [fault for fault in due if not files or fault.file.stem in files]
+    outcomes = {}
+
+    def take(fault, outcome):
+        outcomes[fault.key] = outcome
+        print(f"{outcome:45} {fault.key}", flush=True)
+
+    run_all(due, math.inf, jobs, take)
+    noticed = sum(word_of(outcome) in NOTICED for outcome in outcomes.values())
+    print(f"{noticed} of {len(due)} faults are noticed")
+    return noticed == len(due)
 
 
 def report(mutants, results):
@@ -319,12 +425,12 @@ def report(mutants, results):
     total = collections.Counter()
     for path in sorted({mutant.file for mutant in mutants}):
         own = [mutant for mutant in mutants if mutant.file == path]
-        counts = collections.Counter(results.get(mutant.key) for mutant in own)
+        counts = collections.Counter(word_of(results.get(mutant.key, "")) for mutant in own)
         counts["mutants"] = len(own) - counts["not compiled"]
         print_row(path.name, counts)
         total += counts
     print_row("all", total)
-    print("\nSurvivors:")
+    print(f"{total['timed out']} of them were noticed because a test did not come to its end.\n\nSurvivors:")
     for mutant in sorted(mutants, key=lambda m: (m.file, m.line)):
         if results.get(mutant.key) == "survived":
             print(f"{mutant.file.name}:{mutant.line}: {mutant.key.split(chr(9))[3]}"
@@ -332,7 +438,7 @@ def report(mutants, results):
 
 
 def print_row(name, counts):
-    noticed = counts["failed"] + counts["timed out"]
+    noticed = sum(counts[outcome] for outcome in NOTICED)
     measured = noticed + counts["survived"]
     share = f"{100 * noticed / measured:.1f} %" if measured else "-"
     print(f"{name:24}{counts['mutants']:9}{measured:9}{noticed:9}{counts['survived']:9}{share:>8}")
@@ -345,18 +451,21 @@ def main():
     parser.add_argument("--files", nargs="*", help="files of the library by their names, without .cpp and .h; all without")
     parser.add_argument("--jobs", type=int, default=2, help="how many at once (2)")
     parser.add_argument("--retry", action="store_true", help="measure again what survived or timed out")
+    parser.add_argument("--faults", action="store_true", help="measure the faults made by hand")
     parser.add_argument("--report", action="store_true", help="only show what was measured")
     arguments = parser.parse_args()
 
     WORK.mkdir(parents=True, exist_ok=True)
+    if arguments.faults:
+        sys.exit(not run_faults(arguments.files, arguments.jobs))
     files = [path for path in library_files() if not arguments.files or path.stem in arguments.files]
     mutants = [mutant for path in files for mutant in mutants_of(path)]
     if not arguments.report:
         results = read_results()
         due = [m for m in mutants if m.key not in results or
-               (arguments.retry and results[m.key] in ("survived", "timed out"))]
+               (arguments.retry and word_of(results[m.key]) in ("survived", "timed out"))]
         random.Random(1).shuffle(due)
-        run_all(due, arguments.minutes, arguments.jobs)
+        run_all(due, arguments.minutes, arguments.jobs, keep)
     report(mutants, read_results())
 
 

@@ -34,6 +34,13 @@ int FailStream(FILE* stream) {
   return EOF;
 }
 
+int CloseAndFail(int fd) {
+  const int error = errno;
+  Next<int(int)>("close")(fd);
+  errno = error;
+  return -1;
+}
+
 // What is given back is not held by anybody else.
 bool Unlocks(int command, long argument) {
   if (command != F_SETLK && command != F_SETLK64) return false;
@@ -108,7 +115,7 @@ FAULT_CALL(int, ftruncate64, -1, (int fd, off64_t size), (fd, size), EINTR, EIO)
 FAULT_CALL(void*, mmap64, reinterpret_cast<void*>(-1),
            (void* at, size_t size, int access, int flags, int fd, off64_t offset),
            (at, size, access, flags, fd, offset), EACCES, EAGAIN, ENOMEM)
-FAULT_CALL(int, close, (Next<int(int)>("close")(fd), errno = EIO, -1), (int fd), (fd), EIO)
+FAULT_CALL(int, close, CloseAndFail(fd), (int fd), (fd), EIO)
 
 FAULT_CALL(int, access, -1, (const char* path, int mode), (path, mode), EIO, EACCES, ENOMEM)
 FAULT_CALL(ssize_t, readlink, -1, (const char* path, char* target, size_t size),

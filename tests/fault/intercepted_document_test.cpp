@@ -1,6 +1,7 @@
 // Another process that comes between two calls of a document's reader or writer.
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -259,6 +260,19 @@ TEST_F(InterceptedDocumentTest, TheWholeTextIsSyncedBeforeItIsPublished) {
     EXPECT_TRUE(name.HasRun()) << length;
     unlink(path.c_str());
   }
+}
+
+// Another writer takes a temporary that is not locked for one of a dead writer.
+TEST_F(InterceptedDocumentTest, TheTemporaryIsLockedUntilItIsPublished) {
+  const Interception publish("renameat", 1, [&] {
+    const int file = open(temporary.c_str(), O_RDONLY | O_CLOEXEC);
+    EXPECT_EQ(flock(file, LOCK_EX | LOCK_NB), -1);
+    EXPECT_EQ(errno, EWOULDBLOCK);
+    close(file);
+    return kGoOn;
+  });
+  ExpectWritten();
+  EXPECT_TRUE(publish.HasRun());
 }
 
 // The kernel has followed the link of the directory's owner when a stranger's takes its place.

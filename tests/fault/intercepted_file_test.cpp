@@ -1,13 +1,15 @@
-// What other processes see of a file while it is read.
+// What other processes see of a file while it is read, and how it is closed.
 
 #include <fcntl.h>
 
+#include <cerrno>
 #include <functional>
 #include <map>
 #include <string>
 
 #include "fault/interception.h"
 #include "kelodrcore/file.h"
+#include "posix/descriptor.h"
 #include "support/clean_test.h"
 
 namespace {
@@ -44,6 +46,16 @@ TEST_F(InterceptedFileTest, KeyValueTextIsOpenedCloseOnExec) {
   std::map<std::string, int> map;
   ExpectCloseOnExec([&](const std::string& path) { EXPECT_EQ(File::Read(path, map), 1); });
   EXPECT_EQ(map["a"], 1);
+}
+
+// Its number is free, and may be another thread's file by now.
+TEST_F(InterceptedFileTest, AnInterruptedCloseIsNotMadeAgain) {
+  KeloDRCore::Posix::Descriptor file(open(dir.c_str(), O_RDONLY | O_CLOEXEC));
+  const Fault::Interception interrupted("close", 1, EINTR);
+  const Fault::Interception again("close", 2, EIO);
+  file.Close();
+  EXPECT_TRUE(interrupted.HasRun());
+  EXPECT_FALSE(again.HasRun());
 }
 
 }  // namespace

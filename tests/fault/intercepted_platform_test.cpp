@@ -56,6 +56,25 @@ TEST_F(InterceptedProgramTest, RunsWhereThePipeIsInPlaceAlready) {
   });
 }
 
+// A program that another thread starts just then inherits nothing.
+TEST_F(InterceptedProgramTest, ClosesAllThatIsOpenedOnExec) {
+  const std::set<int> before = OpenDescriptors();
+  int opened = 0;
+  const auto look = [&] {
+    for (const int fd : OpenDescriptors()) {
+      if (before.count(fd) > 0) continue;
+      EXPECT_EQ(fcntl(fd, F_GETFD), FD_CLOEXEC) << fd;
+      ++opened;
+    }
+    return Fault::kGoOn;
+  };
+  const Interception pidFile("fchmod", 1, look);
+  EXPECT_EQ(KLIBCProcPidFileCreate(Path("pid").c_str()), 0);
+  const Interception program("fork", 1, look);
+  EXPECT_EQ(Exec("/bin/true"), 0);
+  EXPECT_EQ(opened, 4) << "the pid file, /dev/null and a pipe";
+}
+
 constexpr int kAborted = 3;
 
 using InterceptedRandomTest = CleanTest;

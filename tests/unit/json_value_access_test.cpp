@@ -185,6 +185,15 @@ TEST_F(JsonValueAccessTest, AttributesStay) {
   EXPECT_EQ(AttributeOf(Path("a"), "security.kelodr"), isSecured ? "label" : "");
 }
 
+// A change of the owner takes them away.
+TEST_F(JsonValueAccessTest, CapabilitiesOfAnothersFileStay) {
+  const std::string capabilities = std::string("\1\0\0\2\0\4", 6) + std::string(14, '\0');
+  const bool isSet = chown(Path("a").c_str(), kOther, kOther) == 0 &&
+                     SetAttribute(Path("a"), "security.capability", capabilities);
+  ExpectWritten();
+  EXPECT_EQ(AttributeOf(Path("a"), "security.capability"), isSet ? capabilities : "");
+}
+
 TEST_F(JsonValueAccessTest, AttributesThatCannotBeKeptAreAFailure) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to set what another user may not";
   if (!SetAttribute(Path("a"), "security.kelodr", "label")) GTEST_SKIP() << "no attributes here";
