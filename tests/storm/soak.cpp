@@ -23,6 +23,7 @@ using KeloDRCore::JsonValue::toFile;
 namespace {
 
 constexpr int kMoreMemoryKiB = 512;  // allowed to a survivor, from a tenth of the time to the end
+constexpr unsigned int kPatienceS = 120;  // for who waits at the end; then this process is killed
 
 // A small one in the place of the directory, where this process may mount it.
 class Disk {
@@ -134,6 +135,7 @@ void MakeTroubles(const Settings& settings, Shared& shared, Troubles& troubles) 
     if (Clock::now() - begin > length / 10) shared.isWarm = true;
   }
   shared.stop = true;
+  alarm(kPatienceS);
 }
 
 void Prepare(const Settings& settings, Shared& shared) {

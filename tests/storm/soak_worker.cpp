@@ -1,5 +1,6 @@
 #include <malloc.h>
 #include <sys/file.h>
+#include <sys/time.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -34,6 +35,13 @@ void CatchSignals(Shared& shared, std::mt19937& random) {
   }
 }
 
+// Interrupts whatever waits.
+void StartTimer() {
+  const timeval interval = {0, 5000};
+  const itimerval timer = {interval, interval};
+  setitimer(ITIMER_REAL, &timer, nullptr);
+}
+
 // Marks this process as the only one in a section. One that was killed there lets go of its locks a
 // little before it is dead; one that goes on finds that it is not the only one when it leaves.
 void Enter(std::atomic<pid_t>& section, const char* what) {
@@ -58,7 +66,7 @@ class SoakCache : public Cache {
 
   bool GetUpdatedData(Json::Value& out) const override {
     Enter(shared.fetcher, "two fetches at a time");
-    SleepMs(Draw(random, 20));
+    SleepMs(Draw(random, 100));
     out = Numbered(++shared.fetches);
     Leave(shared.fetcher, "a fetch ended while another one ran");
     return Draw(random, 20) != 0;
@@ -187,6 +195,7 @@ std::string DocumentPath(const Settings& settings, int which) {
 void Live(const Settings& settings, Shared& shared, int number, int life) {
   std::mt19937 random = Generator(settings, number, life);
   CatchSignals(shared, random);
+  if ((number + life) % 4 == 0) StartTimer();
   shared.ready[number] = getpid();
   Worker worker(settings, shared, random);
   bool isMeasured = number >= Survivors(settings);
