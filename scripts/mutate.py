@@ -255,7 +255,7 @@ class Worker:
         self.dir = pathlib.Path(self.place.name)
         self.mirror = self.dir / "mirror"
         self.commands = commands
-        self.linked = set()  # the test programs that are linked anew
+        self.compiled, self.linked = set(), set()  # of the mutant at hand: objects, test programs
         for path in [*library_files(), *ROOT.glob("tests/*/*.cpp"), *ROOT.glob("tests/*/*.h")]:
             place = self.mirror / path.relative_to(ROOT)
             place.parent.mkdir(parents=True, exist_ok=True)
@@ -280,14 +280,19 @@ class Worker:
         source = self.mirror / mutant.file.relative_to(ROOT)
         source.unlink()
         source.write_text(text)
-        programs = tests.in_order(mutant.file)
         try:
-            if not self.build(mutant.file, programs):
-                return "not compiled"
+            return self.run_tests(mutant, tests)
         finally:
             source.unlink()
             source.symlink_to(mutant.file)
-        for program in programs:
+
+    def run_tests(self, mutant, tests):
+        self.compiled, self.linked = set(), set()
+        if not self.build(self.commands.library, mutant.file):
+            return "not compiled"
+        for program in tests.in_order(mutant.file):
+            if not self.build(f"tests/{program}", mutant.file):
+                return "not compiled"
             outcome = self.run_test(program, tests.limit(program))
             if outcome == "passed":
                 continue
@@ -303,20 +308,23 @@ class Worker:
         return ((outcome == "failed" or self.run_test(program, limit, BUILD) == "passed")
                 and self.run_test(program, limit) == outcome)
 
-    def build(self, path, tests):
-        """Compiles what the file is part of, and links the library and those programs anew."""
+    def build(self, output, path):
+        """Compiles what the file is part of, and links the library, or a program that has a part, anew."""
         library = self.commands.library
-        changed = {library: self.commands.objects_of(library, path)}
-        for test in tests:
-            objects = self.commands.objects_of(f"tests/{test}", path)
+        objects = self.commands.objects_of(output, path)
+        if output != library:
             # The archives of posix/ and platform/ give a program only what is not among its objects.
-            objects += [one for one in changed[library] if not one.startswith("src/")]
-            if objects:
-                changed[f"tests/{test}"] = objects
-        self.linked = {pathlib.Path(output).name for output in changed}
-        return (all(self.run(self.compilation(one))
-                    for one in {one for all_ in changed.values() for one in all_})
-                and all(self.link(output, objects) for output, objects in changed.items()))
+            objects += [one for one in self.commands.objects_of(library, path) if not one.startswith("src/")]
+            if not objects:
+                return True
+            self.linked.add(pathlib.Path(output).name)
+        return all(self.compile(one) for one in objects) and self.link(output, objects)
+
+    def compile(self, name):
+        if name in self.compiled:
+            return True
+        self.compiled.add(name)
+        return self.run(self.compilation(name))
 
     def object(self, name):
         return self.dir / name.replace("/", "_")

@@ -1,8 +1,11 @@
-// A claim whose pid file cannot be removed at once.
+// A claim whose pid file cannot be removed at once, and a document that is replaced while it is
+// read.
 
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
+#include <filesystem>
 #include <memory>
 #include <vector>
 
@@ -102,6 +105,21 @@ TEST_F(InterceptedCacheTest, TheClaimOfAnotherLiveProcessStays) {
       LogCapture::Clear();
     }
   }
+}
+
+TEST_F(InterceptedCacheTest, ADocumentThatIsReplacedWhileItIsReadIsReadAgain) {
+  const std::string path = Path("c.cached");
+  WriteText(path, R"({"cached_data": "old"})");
+  std::filesystem::last_write_time(
+      path, std::filesystem::last_write_time(path) - std::chrono::seconds(10));
+  const Interception other("read", 1, [&] {
+    EXPECT_EQ(unlink(path.c_str()), 0);
+    WriteText(path, R"({"cached_data": "new"})");
+    return Fault::kGoOn;
+  });
+  EXPECT_EQ(cache->Read(), "old");
+  EXPECT_TRUE(other.HasRun());
+  EXPECT_EQ(cache->Read(), "new");
 }
 
 }  // namespace

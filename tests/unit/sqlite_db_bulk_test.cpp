@@ -323,6 +323,7 @@ TEST_F(SqliteDBBulkTest, InsideATransactionItsFailureUndoesOnlyItself) {
   EXPECT_TRUE(db->InsertRecords(kTable, {Record(1), Record(2)}));
   EXPECT_FALSE(db->InsertRecords(kTable, {Record(3), Record(1)}));
   EXPECT_EQ(db->GetErr(), Error(404, 19, "UNIQUE constraint failed: t.n"));
+  EXPECT_FALSE(db->Exec("RELEASE records")) << "the savepoint is left";
   EXPECT_TRUE(transaction.IsOpen());
   EXPECT_TRUE(db->InsertRecords(kTable, {Record(4)}));
   EXPECT_THAT(Rows(*other, "SELECT n FROM t"), IsEmpty());
