@@ -75,7 +75,7 @@ bool CopyOwner(int from, int to) {
   struct stat found = {};
   if (!Stat(from, wanted) || !Stat(to, found)) return false;
   if (wanted.st_uid == found.st_uid && wanted.st_gid == found.st_gid) return true;
-  return Retry([&] { return fchown(to, wanted.st_uid, wanted.st_gid); }) == 0;
+  return SetOwner(to, wanted.st_uid, wanted.st_gid);
 }
 
 }  // namespace
@@ -84,7 +84,7 @@ bool CopyAccess(int from, int to, mode_t added) {
   struct stat wanted = {};
   // A change of owner clears attributes and set-id bits, and an ACL changes the mode.
   return CopyOwner(from, to) && CopyAttributes(NameOf(from), NameOf(to)) && Stat(from, wanted) &&
-         Retry([&] { return fchmod(to, (wanted.st_mode & kModeBits) | added); }) == 0;
+         SetMode(to, (wanted.st_mode & kModeBits) | added);
 }
 
 }  // namespace KeloDRCore::Posix

@@ -33,8 +33,7 @@ bool Secure(int directory) {
   const uid_t user = geteuid();
   if (user != 0) return found.st_uid == 0 || found.st_uid == user || Fail(EACCES);
   if (found.st_uid == 0 && (found.st_mode & (S_IWGRP | S_IWOTH)) == 0) return true;
-  return Retry([&] { return fchown(directory, 0, 0); }) == 0 &&
-         Retry([&] { return fchmod(directory, kMode); }) == 0;
+  return SetOwner(directory, 0, 0) && SetMode(directory, kMode);
 }
 
 // After a failure to open it: whether what is no directory could be taken away. In the place of the
@@ -42,7 +41,7 @@ bool Secure(int directory) {
 bool ClearStep(int parent, const Step& step) {
   if ((errno != ENOTDIR && errno != ELOOP) || geteuid() != 0 || !step.isBelow) return false;
   if (!step.isFirst) return ClearPlanted(parent, step.name);
-  return Retry([&] { return unlinkat(parent, step.name.c_str(), 0); }) == 0 || errno == ENOENT;
+  return UnlinkAt(parent, step.name);
 }
 
 // Its owner may have moved the directory away before it was secured.
@@ -90,10 +89,7 @@ bool ClearPlanted(int directory, const std::string& name) {
   struct stat found = {};
   if (geteuid() != 0 || !StatAt(directory, name, AT_SYMLINK_NOFOLLOW, found)) return false;
   if (found.st_uid == 0) return false;
-  if (!S_ISDIR(found.st_mode)) {
-    return Retry([&] { return unlinkat(directory, name.c_str(), 0); }) == 0;
-  }
-  return MoveAway(directory, name);
+  return S_ISDIR(found.st_mode) ? MoveAway(directory, name) : UnlinkAt(directory, name);
 }
 
 Descriptor OpenStepwise(const std::string& start, const std::string& path,

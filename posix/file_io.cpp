@@ -42,6 +42,22 @@ bool IsSameFile(const struct stat& one, const struct stat& other) {
   return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
+bool SetOwner(int fd, uid_t user, gid_t group) {
+  return Retry([&] { return fchown(fd, user, group); }) == 0;
+}
+
+bool SetMode(int fd, mode_t mode) {
+  return Retry([&] { return fchmod(fd, mode); }) == 0;
+}
+
+bool Sync(int fd) {
+  return Retry([&] { return fsync(fd); }) == 0;
+}
+
+bool UnlinkAt(int directory, const std::string& path) {
+  return Retry([&] { return unlinkat(directory, path.c_str(), 0); }) == 0 || errno == ENOENT;
+}
+
 bool MoveAway(int directory, const std::string& path) {
   unsigned long long random = 0;
   if (Retry([&] { return getrandom(&random, sizeof random, 0); }) < 0) return false;

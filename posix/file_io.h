@@ -35,6 +35,13 @@ bool StatAt(int directory, const std::string& path, int flags, struct stat& foun
 
 bool IsSameFile(const struct stat& one, const struct stat& other);
 
+bool SetOwner(int fd, uid_t user, gid_t group);
+bool SetMode(int fd, mode_t mode);
+bool Sync(int fd);
+
+// Removes what is at `path`, which is no directory. True also when nothing is there.
+bool UnlinkAt(int directory, const std::string& path);
+
 // Gives what strangers may have put at `path` another name beside it, one that nobody can guess and
 // take first. True also when nothing is there.
 bool MoveAway(int directory, const std::string& path);

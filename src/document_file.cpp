@@ -52,16 +52,10 @@ using Posix::MoveAway;
 using Posix::OpenAt;
 using Posix::Retry;
 using Posix::StatAt;
+using Posix::Sync;
+using Posix::UnlinkAt;
 
 bool StatFile(const Descriptor& file, struct stat& found) { return Posix::Stat(file.Get(), found); }
-
-bool UnlinkAt(int directory, const std::string& name) {
-  return Retry([&] { return unlinkat(directory, name.c_str(), 0); }) == 0 || errno == ENOENT;
-}
-
-bool Sync(const Descriptor& file) {
-  return Retry([&] { return fsync(file.Get()); }) == 0;
-}
 
 bool TryLock(const Descriptor& file) {
   return Retry([&] { return flock(file.Get(), LOCK_EX | LOCK_NB); }) == 0;
@@ -69,10 +63,6 @@ bool TryLock(const Descriptor& file) {
 
 bool Unlock(const Descriptor& file) {
   return Retry([&] { return flock(file.Get(), LOCK_UN); }) == 0;
-}
-
-bool SetMode(const Descriptor& file, mode_t mode) {
-  return Retry([&] { return fchmod(file.Get(), mode); }) == 0;
 }
 
 // C strings end at the first NUL byte: such a path would name another file.
@@ -300,7 +290,8 @@ bool Temporary::Publish() {
 constexpr mode_t kReadByOwner = S_IRUSR;
 
 bool RemoveReadBit(const Descriptor& file, mode_t mode) {
-  return (mode & kReadByOwner) != 0 || (SetMode(file, mode & Posix::kModeBits) && Sync(file));
+  return (mode & kReadByOwner) != 0 ||
+         (Posix::SetMode(file.Get(), mode & Posix::kModeBits) && Sync(file.Get()));
 }
 
 // A new file gets its mode from the kernel (umask, default ACL). What replaces a file is nobody
@@ -323,8 +314,8 @@ bool Replace(const Place& place, Whose whose, const std::string& text) {
       !(StatFile(old, state) && Posix::CopyAccess(old.Get(), file.Get(), kReadByOwner))) {
     return false;
   }
-  return Sync(file) && temporary.Publish() && RemoveReadBit(file, state.st_mode) &&
-         Sync(place.directory);
+  return Sync(file.Get()) && temporary.Publish() && RemoveReadBit(file, state.st_mode) &&
+         Sync(place.directory.Get());
 }
 
 Descriptor OpenDocument(const std::string& path, Whose whose) {

@@ -68,8 +68,7 @@ WriteResult WriteAndSync(FILE* stream, int fd, const Json::Value& value) {
     return WriteResult::kWriteFailed;
   }
   if (fflush(stream) != 0) return WriteResult::kFlushFailed;
-  return Posix::Retry([&] { return fsync(fd); }) == 0 ? WriteResult::kDone
-                                                      : WriteResult::kSyncFailed;
+  return Posix::Sync(fd) ? WriteResult::kDone : WriteResult::kSyncFailed;
 }
 
 }  // namespace
