@@ -10,7 +10,6 @@
 #include <cerrno>
 #include <charconv>
 #include <climits>
-#include <cstdint>
 #include <cstring>
 #include <new>
 #include <string>
@@ -40,7 +39,7 @@ bool ReadStart(const char* path, size_t limit, std::string& text) try {
 struct ProcStat {
   char state = 0;
   int threads = 0;
-  uint64_t startTime = 0;  // clock ticks since boot
+  unsigned long long startTime = 0;  // clock ticks since boot
 };
 
 // Reads what proc(5) lists as fields 3, 20 and 22. The name, field 2, may hold any byte, brackets
@@ -51,14 +50,12 @@ bool ReadProcStat(int pid, ProcStat* stat) {
   std::string text;
   if (!ReadStart(path, 1024, text)) return false;
   const size_t nameEnd = text.rfind(')');
-  unsigned long long startTime = 0;
   if (nameEnd == std::string::npos ||
       sscanf(&text[nameEnd + 1],
              " %c %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %*s %d %*s %llu",
-             &stat->state, &stat->threads, &startTime) != 3) {
+             &stat->state, &stat->threads, &stat->startTime) != 3) {
     return Posix::Fail(ENOENT);  // not what proc(5) describes
   }
-  stat->startTime = startTime;
   return true;
 }
 
@@ -66,7 +63,7 @@ bool Exists(int pid) { return kill(pid, 0) == 0 || errno == EPERM; }
 
 // Where the start time cannot be read (processes of others may be hidden), nothing speaks against
 // a process that exists.
-bool MayHaveStartedAt(int pid, uint64_t startTime) {
+bool MayHaveStartedAt(int pid, unsigned long long startTime) {
   ProcStat stat;
   if (!ReadProcStat(pid, &stat)) return Exists(pid);
   return stat.startTime == startTime;
@@ -79,7 +76,7 @@ std::string_view Trim(std::string_view text) {
 }
 
 // Digits only, from end to end.
-bool ParseNumber(std::string_view text, uint64_t* number) {
+bool ParseNumber(std::string_view text, unsigned long long* number) {
   const char* const end = text.data() + text.size();
   const auto [rest, error] = std::from_chars(text.data(), end, *number);
   return error == std::errc() && rest == end;
@@ -89,7 +86,7 @@ bool ParseNumber(std::string_view text, uint64_t* number) {
 // however many writes the rest takes and wherever they break off.
 bool WritePidFile(int fd, std::string text) {
   const char first = std::exchange(text.front(), '\0');
-  return fchmod(fd, 0644) == 0 && Posix::WriteAll(fd, text) &&
+  return Posix::SetMode(fd, 0644) && Posix::WriteAll(fd, text) &&
          Retry([&] { return pwrite(fd, &first, 1, 0); }) == 1;
 }
 
@@ -123,11 +120,11 @@ int KLIBCReadPidFile(const char* path) {
   if (!ReadStart(path, kTooLong, content) || content.size() == kTooLong) return 0;
   const std::string_view text = Trim(content);
   const size_t newline = text.find('\n');
-  uint64_t pid = 0;
+  unsigned long long pid = 0;
   if (!ParseNumber(Trim(text.substr(0, newline)), &pid) || pid > INT_MAX) return 0;
   const int result = static_cast<int>(pid);
   if (newline == std::string_view::npos) return result;
-  uint64_t startTime = 0;
+  unsigned long long startTime = 0;
   if (!ParseNumber(Trim(text.substr(newline)), &startTime)) return 0;
   return MayHaveStartedAt(result, startTime) ? result : 0;
 }
@@ -149,8 +146,7 @@ int KLIBCProcPidFileCreate(const char* path) {
   ProcStat self;
   if (!ReadProcStat(getpid(), &self)) return -1;
   char text[64];
-  snprintf(text, sizeof text, "%d\n%llu\n", static_cast<int>(getpid()),
-           static_cast<unsigned long long>(self.startTime));
+  snprintf(text, sizeof text, "%d\n%llu\n", static_cast<int>(getpid()), self.startTime);
   if (unlink(path) != 0 && errno != ENOENT) return -1;
   const Descriptor file(Retry(
       [&] { return open(path, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644); }));

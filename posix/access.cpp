@@ -1,7 +1,6 @@
 #include "posix/access.h"
 
 #include <sys/xattr.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <optional>

@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <utility>
 
 #include "posix/file_io.h"
 #include "posix/retry.h"
