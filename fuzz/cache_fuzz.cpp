@@ -6,8 +6,10 @@
 
 #include <fcntl.h>
 #include <kelodrcore/cache.h>
+#include <kelodrcore/file_lock.h>
 #include <kelodrcore/json_value.h>
 #include <signal.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -22,6 +24,7 @@
 namespace {
 
 using KeloDRCore::Cache;
+using KeloDRCore::FileLock;
 namespace JsonValue = KeloDRCore::JsonValue;
 
 constexpr long kTimeout = 100;
@@ -38,13 +41,24 @@ struct Entry {
 int pauses = 0;           // that the library made
 int pausesOfUpdater = 0;  // with the last one another process would give its claim up
 
+// What the locks of the cache leave below /tmp.
+void RemoveLockDirectories(std::filesystem::path lowest) {
+  std::error_code error;
+  std::filesystem::remove_all(lowest, error);
+  while (!error && (lowest = lowest.parent_path()) != "/tmp")
+    std::filesystem::remove(lowest, error);
+}
+
 const std::string& Directory() {
   static const Sandbox sandbox;
-  static const std::string lockDirectory = "/tmp/.kelodr_lock" + sandbox.Path();
-  static const bool isCleaned = atexit([] { std::filesystem::remove_all(lockDirectory); }) == 0;
-  Require(isCleaned, "what is left is removed");
-  return sandbox.Path();
+  static const std::string& path = sandbox.Path();
+  static const bool isCleaned =
+      atexit([] { RemoveLockDirectories("/tmp/.kelodr_lock" + path); }) == 0;
+  static const bool isLocked = FileLock(path + "/first").lock(LOCK_EX | LOCK_NB, 0);
+  Require(isCleaned && isLocked, "/tmp/.kelodr_lock/dev/shm is missing or one's own");
+  return path;
 }
+
 std::string Path() { return Directory() + "/a.cached"; }
 std::string PidFile() { return Path() + ".pid"; }
 std::string LinkedFile(const std::string& path) { return path + ".linked"; }

@@ -8,5 +8,7 @@ void __syslog_chk(int /*priority*/, int /*flag*/, const char* /*format*/, ...) {
 
 // An input frees little: a short quarantine of freed memory holds all of it, and saves half the
 // time.
-const char* __asan_default_options() { return "malloc_context_size=5:quarantine_size_mb=8"; }
+const char* __asan_default_options() {
+  return "malloc_context_size=5:quarantine_size_mb=1:thread_local_quarantine_size_kb=64";
+}
 }
