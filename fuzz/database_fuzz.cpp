@@ -10,8 +10,9 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <csignal>
-#include <fstream>
 
 #include "sandbox.h"
 
@@ -22,11 +23,9 @@ using namespace KeloDRCore;
 constexpr int kRows = 12;
 const SqliteTableHandler kJob("job", "id INTEGER PRIMARY KEY, name TEXT UNIQUE, size INTEGER");
 
-struct Files {
-  std::string database;
-  std::string journal;
-  std::string log;
-};
+// The bytes of a database's files, none for a missing one.
+constexpr const char* kEndings[] = {"", "-journal", "-wal"};
+using Files = std::array<std::string, std::size(kEndings)>;
 
 sqlite3* open = nullptr;  // the connection of the handle
 int steps = 0;            // thousands of SQLite's instructions that the operation took
@@ -54,15 +53,12 @@ Files ReadFiles() {
   return {BytesOf(Path()), BytesOf(Path() + "-journal"), BytesOf(Path() + "-wal")};
 }
 
-void RemoveFiles() {
-  for (const char* const end : {"", "-journal", "-wal", "-shm"}) unlink((Path() + end).c_str());
-}
-
 void WriteFiles(const Files& files) {
-  RemoveFiles();
-  PutFile(Path(), files.database);
-  if (!files.journal.empty()) PutFile(Path() + "-journal", files.journal);
-  if (!files.log.empty()) PutFile(Path() + "-wal", files.log);
+  unlink((Path() + "-shm").c_str());
+  for (size_t i = 0; i < files.size(); ++i) {
+    unlink((Path() + kEndings[i]).c_str());
+    if (i == 0 || !files[i].empty()) PutFile(Path() + kEndings[i], files[i]);
+  }
 }
 
 SqliteValueList MakeRecord(const std::string& name, int size) {
@@ -74,7 +70,7 @@ SqliteValueList MakeRecord(const std::string& name, int size) {
 
 // The files of a database in which `killed` was running when its process was killed.
 Files MakeFiles(const std::string& mode, const std::string& killed) {
-  RemoveFiles();
+  WriteFiles({});
   SqliteDB db(Path(), 0, "fuzz");
   Require(db.Exec("PRAGMA page_size=512; PRAGMA journal_mode=" + mode), "a mode is set");
   std::vector<SqliteValueList> records;
@@ -229,8 +225,8 @@ void CheckOperation(FuzzedDataProvider& input, SqliteDB& db) {
 
 // What SQLite takes for no database. A single byte is an empty one.
 bool IsForeign(const Files& files) {
-  return files.database.size() > 1 && files.database.rfind("SQLite format 3", 0) != 0 &&
-         files.journal.empty() && files.log.empty();
+  return files[0].size() > 1 && files[0].rfind("SQLite format 3", 0) != 0 && files[1].empty() &&
+         files[2].empty();
 }
 
 int LowestDescriptor() {
@@ -261,23 +257,19 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   FuzzedDataProvider input(data, size);
   const Files& whole = TakeFiles(input);
   Files files = whole;
-  Change(input, files.database);
-  Change(input, files.journal);
-  Change(input, files.log);
+  for (std::string& bytes : files) Change(input, bytes);
   WriteFiles(files);
-  const bool isWhole =
-      files.database == whole.database && files.journal == whole.journal && files.log == whole.log;
-  const bool isForeign = IsForeign(files);
   const int descriptor = LowestDescriptor();
   const sqlite3_int64 memory = sqlite3_memory_used();
   {
     SqliteDB db(Path(), 0, "fuzz");
     int count = -1;
-    if (isWhole) Require(db.GetCount(kJob, count) && count == kRows, "what was written is there");
+    if (files == whole)
+      Require(db.GetCount(kJob, count) && count == kRows, "what was written is there");
     while (input.remaining_bytes() > 0) CheckOperation(input, db);
   }
   Require(sqlite3_memory_used() == memory, "SQLite's memory is given back");
   Require(LowestDescriptor() == descriptor, "no descriptor is left");
-  if (isForeign) Require(BytesOf(Path()) == files.database, "what is no database is left alone");
+  if (IsForeign(files)) Require(BytesOf(Path()) == files[0], "what is no database is left alone");
   return 0;
 }
