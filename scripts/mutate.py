@@ -46,22 +46,22 @@ FOLDERS = ["src", "posix", "platform", "include/kelodrcore"]
 MORE_NAMES = {
     "access": ["json_value", "json", "document", "document_file"],
     "descriptor": ["file", "file_lock", "json_value"],
-    "directory_walk": ["file_lock", "lock"],
+    "directory_walk": ["file_lock", "lock", "cache_process"],
     "document_file": ["json_value", "json", "document", "file", "short_transfer"],
     "file": ["key_value", "short_transfer"],
-    "file_io": ["file", "json_value", "platform", "document"],
-    "file_lock": ["lock"],
+    "file_io": ["file", "json_value", "platform", "document", "cache_process"],
+    "file_lock": ["lock", "cache_process", "cache_refresher"],
     "json_text": ["json_value", "locale", "response"],
     "json_value": ["json"],
-    "kelocore": ["platform"],
+    "kelocore": ["platform", "cache_process"],
     "kelocore_process": ["platform"],
     "kelorandom": ["platform", "utils"],
     "lock_fork": ["file_lock", "cache"],
     "log": ["file_lock", "sqlite_value"],
     "own_claim": ["cache"],
-    "pipe": ["platform", "utils"],
+    "pipe": ["platform", "utils", "cache_process"],
     "privilege": ["file", "cache"],
-    "retry": ["file", "file_lock", "platform"],
+    "retry": ["file", "file_lock", "platform", "signal_storm"],
     "sqlite_attempt": ["sqlite_bulk", "sqlite_transaction", "sqlite_db"],
     "sqlite_bulk": ["sqlite_transaction", "sqlite_db"],
     "sqlite_command": ["sqlite_select_command", "layout"],
@@ -219,8 +219,9 @@ class Commands:
 class Tests:
     """What is known of the test programs: how long each takes, and for which files each failed."""
 
-    def __init__(self, worker, programs):
+    def __init__(self, worker, programs, longest):
         self.seconds, self.failures = {}, collections.Counter()
+        self.longest = longest
         known = json.loads(TIMES.read_text()) if TIMES.exists() else {}
         for program in sorted(programs):
             built = (BUILD / "tests" / program).stat().st_mtime
@@ -240,7 +241,7 @@ class Tests:
 
     def in_order(self, path):
         """First those that are quick and failed often for this file."""
-        return sorted(tests_of(path),
+        return sorted((test for test in tests_of(path) if self.seconds[test] <= self.longest),
                       key=lambda test: self.seconds[test] / (1 + self.failures[path, test]))
 
     def limit(self, test):
@@ -387,14 +388,15 @@ def keep(mutant, outcome):
         out.write(f"{mutant.key}\t{outcome}\n")
 
 
-def run_all(mutants, minutes, jobs, take):
+def run_all(mutants, arguments, take):
     """Measures the mutants and gives each with its outcome to `take`."""
     commands = Commands()
-    workers = [Worker(commands) for _ in range(jobs)]
+    workers = [Worker(commands) for _ in range(arguments.jobs)]
     workers[0].compile_system_headers()
-    tests = Tests(workers[0], {test for path in {m.file for m in mutants} for test in tests_of(path)})
+    programs = {test for path in {m.file for m in mutants} for test in tests_of(path)}
+    tests = Tests(workers[0], programs, arguments.longest)
     due = iter(mutants)
-    deadline = time.monotonic() + 60 * minutes
+    deadline = time.monotonic() + 60 * arguments.minutes
     lock = threading.Lock()
 
     def work(worker):
@@ -407,22 +409,22 @@ def run_all(mutants, minutes, jobs, take):
             with lock:
                 take(mutant, outcome)
 
-    with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
+    with concurrent.futures.ThreadPoolExecutor(arguments.jobs) as pool:
         for future in [pool.submit(work, worker) for worker in workers]:
             future.result()
 
 
-def run_faults(files, jobs):
-    """Whether each fault made by hand in these files, or in all, is noticed."""
+def run_faults(arguments):
+    """Whether each fault made by hand in the files is noticed."""
     due = [fault_of(*fault) for fault in faults.FAULTS]
-    due = [fault for fault in due if not files or fault.file.stem in files]
+    due = [fault for fault in due if not arguments.files or fault.file.stem in arguments.files]
     outcomes = {}
 
     def take(fault, outcome):
         outcomes[fault.key] = outcome
         print(f"{outcome:45} {fault.key}", flush=True)
 
-    run_all(due, math.inf, jobs, take)
+    run_all(due, arguments, take)
     noticed = sum(word_of(outcome) in NOTICED for outcome in outcomes.values())
     print(f"{noticed} of {len(due)} faults are noticed")
     return noticed == len(due)
@@ -458,6 +460,8 @@ def main():
     parser.add_argument("--minutes", type=float, default=60, help="stop after that long (60)")
     parser.add_argument("--files", nargs="*", help="files of the library by their names, without .cpp and .h; all without")
     parser.add_argument("--jobs", type=int, default=2, help="how many at once (2)")
+    parser.add_argument("--longest", type=float, default=math.inf,
+                        help="leave out test programs that take more seconds; --retry gives survivors to them, too")
     parser.add_argument("--retry", action="store_true", help="measure again what survived or timed out")
     parser.add_argument("--faults", action="store_true", help="measure the faults made by hand")
     parser.add_argument("--report", action="store_true", help="only show what was measured")
@@ -465,7 +469,7 @@ def main():
 
     WORK.mkdir(parents=True, exist_ok=True)
     if arguments.faults:
-        sys.exit(not run_faults(arguments.files, arguments.jobs))
+        sys.exit(not run_faults(arguments))
     files = [path for path in library_files() if not arguments.files or path.stem in arguments.files]
     mutants = [mutant for path in files for mutant in mutants_of(path)]
     if not arguments.report:
@@ -473,7 +477,7 @@ def main():
         due = [m for m in mutants if m.key not in results or
                (arguments.retry and word_of(results[m.key]) in ("survived", "timed out"))]
         random.Random(1).shuffle(due)
-        run_all(due, arguments.minutes, arguments.jobs, keep)
+        run_all(due, arguments, keep)
     report(mutants, read_results())
 
 
