@@ -218,7 +218,8 @@ std::string Figures(const Shared& shared, const Disk& disk) {
 
 std::string Soak(const Settings& settings) {
   Shared& shared = MakeShared<Shared>();
-  if (settings.processes > kMostProcesses) return Expect(false, "too many processes"), "";
+  const bool isPossible = settings.processes > 1 && settings.processes <= kMostProcesses;
+  if (!isPossible) return Expect(false, "too many processes, or too few"), "";
   const Disk disk(settings.dir);
   Prepare(settings, shared);
   const int descriptors = MeasureThis().descriptors;
