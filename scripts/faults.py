@@ -5,9 +5,9 @@ A fault is its name, the file and the replacements in it; each old text stands t
 
 FAULTS = [
     ("a document is renamed before it is synced", "src/document_file.cpp",
-     [("return Sync(file) && temporary.Publish() &&", "return temporary.Publish() && Sync(file) &&")]),
+     [("Sync(file.Get()) && temporary.Publish()", "temporary.Publish() && Sync(file.Get())")]),
     ("the directory of a document is not synced", "src/document_file.cpp",
-     [(" &&\n         Sync(place.directory);", ";")]),
+     [(" &&\n         Sync(place.directory.Get());", ";")]),
     ("access is copied after the rename", "src/document_file.cpp",
      [("!(StatFile(old, state) && Posix::CopyAccess(old.Get(), file.Get(), kReadByOwner))",
        "!StatFile(old, state)"),
@@ -73,7 +73,7 @@ FAULTS = [
     ("a pid file is inherited by other programs", "platform/kelocore.cpp",
      [("O_NOFOLLOW | O_CLOEXEC", "O_NOFOLLOW")]),
     ("the mode of a pid file depends on the umask", "platform/kelocore.cpp",
-     [("fchmod(fd, 0644) == 0 && ", "")]),
+     [("Posix::SetMode(fd, 0644) && ", "")]),
     ("/dev/null is inherited by other programs", "platform/kelocore_process.cpp",
      [("O_RDWR | O_CLOEXEC", "O_RDWR")]),
     ("a claim is made without a second look", "src/cache.cpp",

@@ -13,6 +13,7 @@ Results are kept in build/mutation/results.tsv by the text of the line: a stoppe
 measured anew. The order is random but always the same, so that any part of a run is a fair sample.
 
 --faults puts the faults of scripts/faults.py into the library instead, one at a time, and fails unless each is noticed.
+Every run, a mere --report too, fails when the text that a fault replaces is not there any more.
 """
 
 import argparse
@@ -414,10 +415,8 @@ def run_all(mutants, arguments, take):
             future.result()
 
 
-def run_faults(arguments):
-    """Whether each fault made by hand in the files is noticed."""
-    due = [fault_of(*fault) for fault in faults.FAULTS]
-    due = [fault for fault in due if not arguments.files or fault.file.stem in arguments.files]
+def run_faults(due, arguments):
+    """Whether each fault is noticed."""
     outcomes = {}
 
     def take(fault, outcome):
@@ -468,9 +467,10 @@ def main():
     arguments = parser.parse_args()
 
     WORK.mkdir(parents=True, exist_ok=True)
-    if arguments.faults:
-        sys.exit(not run_faults(arguments))
     files = [path for path in library_files() if not arguments.files or path.stem in arguments.files]
+    made_by_hand = [fault_of(*fault) for fault in faults.FAULTS]
+    if arguments.faults:
+        sys.exit(not run_faults([fault for fault in made_by_hand if fault.file in files], arguments))
     mutants = [mutant for path in files for mutant in mutants_of(path)]
     if not arguments.report:
         results = read_results()
