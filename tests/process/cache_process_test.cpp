@@ -307,16 +307,20 @@ TEST_F(CacheProcessTest, AFetchReadsTheOldDataOfItsOwnCache) {
   }
 }
 
+// One has another name, the other stands in another directory.
 TEST_F(CacheProcessTest, AFetchUpdatesAnotherCache) {
-  TestCache other(cacheDir, "other", 1000, true, 0);
-  other.FetchGives("other");
-  TestCache cache = MakeCache();
-  cache.fetch = [&](Json::Value& out) {
-    out = other.Read();
-    return true;
-  };
-  EXPECT_EQ(cache.Read(), "other");
-  EXPECT_EQ(other.Remove(), 0);
+  for (TestCache other : {TestCache(cacheDir, "other", 1000, true, 0),
+                          TestCache(Path("other"), "c", 1000, true, 0)}) {
+    other.FetchGives("other");
+    TestCache cache = MakeCache();
+    cache.fetch = [&](Json::Value& out) {
+      out = other.Read();
+      return true;
+    };
+    EXPECT_TRUE(cache.Update());
+    EXPECT_EQ(cache.GetCachedData(), "other");
+    EXPECT_EQ(other.Remove(), 0);
+  }
   LogCapture::Clear();
 }
 
@@ -347,6 +351,21 @@ TEST_F(CacheProcessTest, AChildOfAFetchFindsItsParentUpdating) {
   };
   EXPECT_TRUE(cache.Update());
   EXPECT_EQ(JoinAll(), 0);
+  LogCapture::Clear();
+}
+
+TEST_F(CacheProcessTest, AChildOfAFetchWaitsForItsParent) {
+  WriteCacheFile("\"old\"", kStale);
+  TestCache cache = MakeCache();
+  pid_t child = -1;
+  cache.fetch = [&](Json::Value& out) {
+    child = StartWaiter("new");
+    EXPECT_TRUE(WaitForLines(StartsWaiting()));
+    out = "new";
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(JoinChild(child), 0);
   LogCapture::Clear();
 }
 
