@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstdio>
 #include <ios>
 #include <limits>
@@ -35,11 +34,12 @@ Posix::Descriptor OpenToRead(const std::string& path) {
   return Posix::Open(path, O_RDONLY | Posix::kHarmless);
 }
 
-// A directory opens like a file and counts as an empty one, as it does to std::ifstream.
+// A directory opens like a file and counts as an empty one, as it does to std::ifstream. Anything
+// else that is not a regular file may have no end.
 bool ReadToEnd(const Posix::Descriptor& file, std::string& text) {
-  if (Posix::ReadAll(file.Get(), text)) return true;
-  text.clear();
-  return errno == EISDIR;
+  struct stat found = {};
+  if (!Posix::Stat(file.Get(), found)) return false;
+  return S_ISDIR(found.st_mode) || (S_ISREG(found.st_mode) && Posix::ReadAll(file.Get(), text));
 }
 
 // What fgets makes of `text`: pieces of at most one line and 1023 bytes, of which a NUL byte hides

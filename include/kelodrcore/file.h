@@ -87,8 +87,9 @@ KELODR_EXPORT bool RemoveDir(const std::string& path);
 /// nothing at all on one side of it is logged and skipped.
 ///
 /// The result is the number of entries of `map`, which then holds exactly what was read; 0 for a
-/// missing file (not logged) and -1 for an empty path and for a file that cannot be opened or read
-/// to its end, with `map` unchanged. A FIFO is not waited for.
+/// missing file (not logged) and for a directory, and -1 for an empty path, for a file that cannot
+/// be opened or read to its end, and for anything else that is not a regular file, with `map`
+/// unchanged.
 template <typename K, typename V>
 int Read(const std::string& path, std::map<K, V>& map);
 
