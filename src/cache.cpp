@@ -173,7 +173,12 @@ Claim::Claim(const std::string& cachePath)
     : path(cachePath), pidFile(PidFile(path)), lock(path), own(path) {}
 
 Claim::~Claim() {
-  if (own.IsListed()) UnsetUpdating();
+  if (!own.IsListed()) return;
+  try {
+    UnsetUpdating();
+  } catch (const std::bad_alloc&) {
+    // A stranger's pid file that there is no memory to judge: it may stay, it claims nothing.
+  }
 }
 
 bool Claim::SetUpdating() {

@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <cstring>
 
+#include "attack/acl.h"
 #include "attack/attack.h"
 #include "kelodrcore/file.h"
 #include "kelodrcore/json_value.h"
@@ -21,43 +22,6 @@ namespace {
 
 constexpr char kPath[] = "/tmp/doc";
 constexpr char kTemporary[] = "/tmp/.doc.kelodr-0";
-constexpr char kAccess[] = "system.posix_acl_access";
-constexpr char kDefault[] = "system.posix_acl_default";
-
-// An access control list as the kernel takes it.
-struct AclEntry {
-  uint16_t tag;
-  uint16_t permissions;
-  uint32_t id;
-};
-struct Acl {
-  uint32_t version = 2;
-  AclEntry entries[5];
-};
-constexpr uint32_t kNobody = UINT32_MAX;
-constexpr uint16_t kRead = 4;
-constexpr uint16_t kReadWrite = 6;
-
-// The owner reads and writes, and the user may do what `permissions` say; nobody else anything.
-Acl AclForUser(uint16_t permissions) {
-  return {2,
-          {{0x01, kReadWrite, kNobody},
-           {0x02, permissions, kUser},
-           {0x04, 0, kNobody},
-           {0x10, permissions, kNobody},
-           {0x20, 0, kNobody}}};
-}
-
-std::string Attribute(const std::string& path, const char* name) {
-  char value[256];
-  const ssize_t size = getxattr(path.c_str(), name, value, sizeof value);
-  return size < 0 ? "none" : std::string(value, static_cast<size_t>(size));
-}
-
-template <typename T>
-void SetAttribute(const std::string& path, const char* name, const T& value) {
-  ASSERT_EQ(setxattr(path.c_str(), name, &value, sizeof value, 0), 0) << name;
-}
 
 void ExpectRefused(const std::string& path, int error) {
   errno = 0;

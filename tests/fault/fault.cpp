@@ -9,10 +9,13 @@
 #include <array>
 #include <atomic>
 #include <cerrno>
+#include <csignal>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <iostream>
 #include <new>
+#include <utility>
 
 #include "fault/interception.h"
 
@@ -25,6 +28,13 @@ struct State {
   std::atomic<int> calls;
   std::atomic<int> failures;
   std::array<const char*, 64> failed;  // literals, at the same place in a forked child
+  std::atomic<long long> waited;       // microseconds
+
+  // Of the whole test.
+  std::atomic<int> runs;
+  std::atomic<int> allFailures;
+  std::atomic<int> shortTransfers;
+  std::atomic<long long> longestWait;
 };
 
 State* state = nullptr;
@@ -37,16 +47,17 @@ State* NewState() {
   return new (memory) State{};
 }
 
-// A signal that never stops coming is no fault of the system's; this many in a row is bad enough.
-constexpr int kSignalsInARow = 10;
+constexpr int kSignalsInARow = 10;  // no failure
 
-// In seconds. A failure that lasts must not hang anybody: SIGALRM ends the test then.
+// In seconds. The library's longest waits are for a minute each.
 constexpr unsigned int kLongestRun = 60;
+constexpr long long kLongestWait = 300;
 
 // Not 0 for what sets errno.
 int ErrnoOf(int error) {
   if (error == Fault::kNoMemory) return ENOMEM;
   if (error == Fault::kDiskFull) return ENOSPC;
+  if (error == Fault::kSignals) return EINTR;
   return error > 0 ? error : 0;
 }
 
@@ -63,10 +74,26 @@ std::string NameOf(int error) {
       return "moves a half";
     case Fault::kDiskFull:
       return "fills the disk";
+    case Fault::kSignals:
+      return "is interrupted";
     default:
       return "fails: " + (error > 0 ? strerror(error) : "error " + std::to_string(error));
   }
 }
+
+// The watchdog: ends this process. A forked child that goes on meets no failure any more.
+[[noreturn]] void Bite(const char* why) {
+  state->armed = false;
+  dprintf(STDERR_FILENO,
+          "watchdog: %s: call %d %s, from there on at most %d times; %d failed:", why,
+          state->plan.first, NameOf(state->plan.error).c_str(), state->plan.times,
+          state->failures.load());
+  for (const std::string& call : Fault::FailedCalls()) dprintf(STDERR_FILENO, " %s", call.c_str());
+  dprintf(STDERR_FILENO, "\n");
+  _exit(1);
+}
+
+void BiteAtTheAlarm(int /*signal*/) { Bite("not over after a minute"); }
 
 // True when an exception came out that is not to.
 bool RunCaught(const Fault::Operation& operation, bool mayThrowJsonError, Fault::Outcome& outcome) {
@@ -81,6 +108,12 @@ bool RunCaught(const Fault::Operation& operation, bool mayThrowJsonError, Fault:
   return outcome.threw && outcome.error != Fault::kNoMemory;
 }
 
+// Those that nobody could wait for.
+void ReapChildren() {
+  while (waitpid(-1, nullptr, 0) > 0) {
+  }
+}
+
 void ExpectNothingLeft(const std::set<int>& descriptors, uid_t uid, gid_t gid) {
   EXPECT_EQ(OpenDescriptors(), descriptors) << "descriptors left open or closed";
   EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1) << "a child was left behind";
@@ -93,11 +126,11 @@ void ExpectNothingLeft(const std::set<int>& descriptors, uid_t uid, gid_t gid) {
 namespace Fault {
 
 void Arm(const Plan& plan) {
-  if (state == nullptr) state = NewState();
   state->plan = plan;
   state->calls = 0;
   state->failures = 0;
   state->failed = {};
+  state->waited = 0;
   state->armed = true;
 }
 
@@ -122,7 +155,13 @@ bool Hits(const char* call, std::initializer_list<int> errors) {
     return false;
   }
   const Plan& plan = state->plan;
-  if (std::find(errors.begin(), errors.end(), plan.error) == errors.end()) return false;
+  int error = plan.error;
+  if (error == kSignals) {
+    // The kernel's generator is interrupted only until it has its first seed.
+    if (strcmp(call, "getrandom") == 0) return false;
+    error = EINTR;
+  }
+  if (std::find(errors.begin(), errors.end(), error) == errors.end()) return false;
   const int number = ++state->calls;
   if (number < plan.first || number - plan.first >= plan.times) return false;
   ++state->failures;
@@ -137,6 +176,12 @@ bool Outcome::FailedForGood(const std::string& call) const {
   return error != EINTR && Failed(call);
 }
 
+void Wait(long long microseconds) {
+  if (state == nullptr || !state->armed) return;
+  state->waited += microseconds;
+  if (state->waited > kLongestWait * 1000000) Bite("more than five minutes of sleep");
+}
+
 bool IsSuspended() { return suspensions > 0; }
 Suspension::Suspension() { ++suspensions; }
 Suspension::~Suspension() { --suspensions; }
@@ -146,12 +191,17 @@ Suspension::~Suspension() { --suspensions; }
 void FaultTest::SetUp() {
   CleanTest::SetUp();
   bystander = memfd_create("bystander", MFD_CLOEXEC);
+  state = NewState();
+  signal(SIGALRM, BiteAtTheAlarm);
 }
 
 void FaultTest::TearDown() {
   close(bystander);
-  std::cout << "[  faults  ] " << runs << " runs, " << failures << " failed calls, "
-            << shortTransfers << " short transfers\n";
+  std::cout << "[  faults  ] " << state->runs << " runs, " << state->allFailures
+            << " failed calls, " << state->shortTransfers << " short transfers, longest wait "
+            << state->longestWait / 1000000 << " s\n";
+  munmap(std::exchange(state, nullptr), sizeof(State));
+  signal(SIGALRM, SIG_DFL);
   CleanTest::TearDown();
 }
 
@@ -161,6 +211,7 @@ void FaultTest::SweepCalls(const Fault::Operation& operation) {
     const int held = error == EAGAIN ? heldForGood : Fault::kForGood;
     Sweep(operation, error, error == EINTR ? kSignalsInARow : held);
   }
+  if (interruptedStride > 0) Sweep(operation, Fault::kSignals, Fault::kForGood, interruptedStride);
 }
 
 void FaultTest::SweepMemory(const Fault::Operation& operation) {
@@ -173,12 +224,12 @@ void FaultTest::SweepTransfers(const Fault::Operation& operation) {
   LogCapture::Clear();
   operation.run();
   undisturbedLog = LogCapture::Take();
-  const int before = shortTransfers;
+  const int before = state->shortTransfers;
   for (const int portion : {Fault::kOneByte, Fault::kHalf}) {
     Sweep(operation, portion, Fault::kOnce);
     Sweep(operation, portion, Fault::kForGood);
   }
-  EXPECT_GT(shortTransfers, before) << "nothing was moved";
+  EXPECT_GT(state->shortTransfers, before) << "nothing was moved";
   Sweep(operation, Fault::kDiskFull, Fault::kForGood);
 }
 
@@ -188,11 +239,13 @@ void FaultTest::ExpectUndisturbed(const Fault::Outcome& outcome) const {
   EXPECT_EQ(outcome.log, undisturbedLog);
 }
 
-void FaultTest::Sweep(const Fault::Operation& operation, int error, int times) {
-  for (int first = 1;; ++first) {
-    if (!RunFailing(operation, {error, first, times}) || HasFailure()) return;
+void FaultTest::Sweep(const Fault::Operation& operation, int error, int times, int stride) {
+  for (int first = 1;; first += stride) {
+    alarm(kLongestRun);
+    if (!RunFailing(operation, {error, first, times}) || HasFailure()) break;
     RunUnfailed(operation);
   }
+  alarm(0);
 }
 
 // False when no call was left to fail.
@@ -203,16 +256,15 @@ bool FaultTest::RunFailing(const Fault::Operation& operation, const Fault::Plan&
   const uid_t uid = geteuid();
   const gid_t gid = getegid();
   Fault::Outcome outcome{false, false, plan.error, 0, {}, {}};
-  alarm(kLongestRun);
   Fault::Arm(plan);
   const bool threwWrongly = RunCaught(operation, mayThrowJsonError, outcome);
   outcome.failures = Fault::Disarm();
-  alarm(0);
   outcome.failed = Fault::FailedCalls();
   outcome.log = LogCapture::Take();
   SCOPED_TRACE("call " + std::to_string(plan.first) + " " + NameOf(plan.error) + ", " +
                std::to_string(outcome.failures) +
                " times: " + testing::PrintToString(outcome.failed));
+  if (plan.error == Fault::kSignals && outcome.Failed("waitpid")) ReapChildren();
   ExpectNothingLeft(descriptors, uid, gid);
   EXPECT_EQ(lseek(bystander, 0, SEEK_END), 0) << "written to a file of the caller's";
   EXPECT_FALSE(threwWrongly) << "an exception came out";
@@ -222,8 +274,9 @@ bool FaultTest::RunFailing(const Fault::Operation& operation, const Fault::Plan&
     ExpectUndisturbed(outcome);
   }
   operation.check(outcome);
-  ++runs;
-  (IsFailure(plan.error) ? failures : shortTransfers) += hits;
+  ++state->runs;
+  (IsFailure(plan.error) ? state->allFailures : state->shortTransfers) += hits;
+  state->longestWait = std::max(state->longestWait.load(), state->waited.load());
   return hits > 0;
 }
 

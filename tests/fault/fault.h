@@ -28,6 +28,9 @@ constexpr int kHalf = -3;
 // The disk becomes full: the first write of the plan writes a half, the others fail with ENOSPC.
 constexpr int kDiskFull = -4;
 
+// Signals without end.
+constexpr int kSignals = -5;
+
 constexpr int kOnce = 1;
 constexpr int kForGood = INT_MAX;
 
@@ -52,6 +55,9 @@ std::vector<std::string> FailedCalls();
 bool Hits(const char* call, std::initializer_list<int> errors);
 
 bool IsSuspended();
+
+// Counts a sleep of the operation's, which takes no time here.
+void Wait(long long microseconds);
 
 // Calls made while it lives neither count nor fail.
 class Suspension {
@@ -88,6 +94,9 @@ struct Operation {
 // Runs an operation with call 1 failing, then call 2, until no call is left to fail; once and for
 // good; with each errno. After each run nothing may be left open, running or raised, the
 // operation's own check must hold, and the next run, in which nothing fails, must succeed.
+//
+// A watchdog ends the program, and says why, when a run lasts longer than a minute or would sleep
+// for longer than five: nothing waits for the end of a fault.
 class FaultTest : public CleanTest {
  protected:
   void SetUp() override;
@@ -98,11 +107,15 @@ class FaultTest : public CleanTest {
   // Moves less than asked, which is to change nothing: result, log and effect. Fills the disk as
   // well.
   void SweepTransfers(const Fault::Operation& operation);
-  // One error, `times` calls in a row.
-  void Sweep(const Fault::Operation& operation, int error, int times);
+  // One error, `times` calls in a row, from each `stride`-th call on.
+  void Sweep(const Fault::Operation& operation, int error, int times, int stride = 1);
 
   // Whether JsonCpp's own exception may come out where it finds no memory.
   bool mayThrowJsonError = false;
+
+  // Signals without end are a failure at last (posix/retry.h), but only after a million calls: not
+  // each call is tried. 0 where there is no such end: SQLite makes its calls again for ever.
+  int interruptedStride = 11;
 
   // How many calls find a lock held "for good"; less where the operation waits for its holder.
   int heldForGood = Fault::kForGood;
@@ -115,9 +128,6 @@ class FaultTest : public CleanTest {
   // An empty file that the test's process happens to have open; nobody may write to it.
   int bystander = -1;
   std::vector<LogLine> undisturbedLog;
-  int runs = 0;
-  int failures = 0;
-  int shortTransfers = 0;
 };
 
 #endif  // KELODRCORE_TESTS_FAULT_FAULT_H_

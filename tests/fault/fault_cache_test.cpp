@@ -30,9 +30,8 @@ class CacheFaultTest : public FaultTest {
     if (!CanLock()) GTEST_SKIP() << "the lock directory is another user's";
     cacheDir = Path("caches");
     path = cacheDir + "/c.cached";
-    // Whoever holds the lock is waited for, but not before the longest wait for it (a minute) ends.
-    heldForGood = 1500;
     mayThrowJsonError = true;
+    interruptedStride = 47;
   }
   void TearDown() override {
     const std::filesystem::path lock = FileLock::getLockFilePath(path + ".lock");
@@ -163,6 +162,8 @@ TEST_F(CacheFaultTest, AnUpdateIsMadeOrFails) {
     releasesWithoutLock +=
         static_cast<size_t>(std::count(outcome.log.begin(), outcome.log.end(), withoutLock));
   };
+  // Whoever holds the lock is waited for: longer than the longest wait for it (a minute).
+  heldForGood = 1500;
   SweepCalls({prepare, run, check});
   releasesWithoutLock = 0;
   SweepMemory({prepare, run, check});

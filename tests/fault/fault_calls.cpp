@@ -12,11 +12,14 @@
 #include <fcntl.h>
 #include <sqlite3.h>
 #include <sys/types.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdarg>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <ctime>
 #include <new>
 
 #include "fault/fault.h"
@@ -196,18 +199,45 @@ extern "C" int __fprintf_chk(FILE* stream, int /*flag*/, const char* format, ...
 }
 
 // No sweep waits, not for the disk either: only a loss of power would show the difference.
-#define FAULT_SLEEP(name)                          \
-  extern "C" int Fault_##name(...) __asm__(#name); \
-  extern "C" int Fault_##name(...) { return 0; }
+namespace {
 
-FAULT_SLEEP(sleep)
-FAULT_SLEEP(usleep)
-FAULT_SLEEP(nanosleep)
-FAULT_SLEEP(clock_nanosleep)
+// `Time` is a timespec, of 32 or of 64 bits.
+template <typename Time>
+int Sleep(const Time* time) {
+  Fault::Wait(time->tv_sec * 1000000LL + time->tv_nsec / 1000);
+  return 0;
+}
+
+struct Time64 {
+  int64_t tv_sec;
+  int32_t tv_nsec;
+};
+
+}  // namespace
+
+extern "C" unsigned int sleep(unsigned int seconds) {
+  Fault::Wait(seconds * 1000000LL);
+  return 0;
+}
+extern "C" int usleep(useconds_t time) {
+  Fault::Wait(time);
+  return 0;
+}
+extern "C" int nanosleep(const timespec* time, timespec* /*rest*/) { return Sleep(time); }
+extern "C" int clock_nanosleep(clockid_t, int, const timespec* time, timespec*) {
+  return Sleep(time);
+}
 #if __SIZEOF_LONG__ == 4
-FAULT_SLEEP(__nanosleep64)
-FAULT_SLEEP(__clock_nanosleep_time64)
+extern "C" int __nanosleep64(const Time64* time, void*) { return Sleep(time); }
+extern "C" int __clock_nanosleep_time64(int, int, const Time64* time, void*) { return Sleep(time); }
 #endif
+
+// In a build that counts what is executed, a child writes its counts then.
+extern "C" void _exit(int status) {
+  const Fault::Suspension suspension;
+  Next<void(int)>("_exit")(status);
+  abort();
+}
 
 extern "C" int fsync(int /*fd*/) {
   return Intercepts("fsync") || Hits("fsync", {EINTR, EIO, ENOSPC}) ? -1 : 0;

@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 #include <functional>
 
 #include "fault/fault.h"
@@ -45,7 +46,9 @@ class JsonFaultTest : public FaultTest {
 };
 
 void JsonFaultTest::ExpectAllDone(const Outcome& outcome) {
-  if (!outcome.succeeded || outcome.error <= 0 || outcome.error == EINTR) return;
+  if (!outcome.succeeded || outcome.error == Fault::kNoMemory || outcome.error == EINTR) {
+    return;
+  }
   for (const std::string& call : outcome.failed) {
     EXPECT_TRUE(call == "close" || call == "flock") << call;
   }
@@ -119,6 +122,23 @@ TEST_F(JsonFaultTest, ToFileReplacesAFileWholeOrNotAtAll) {
   SweepCalls(ToFile(kOld));
   SweepMemory(ToFile(kOld));
   SweepTransfers(ToFile(kOld));
+}
+
+TEST_F(JsonFaultTest, ToFileReplacesTheFileBehindALinkWholeOrNotAtAll) {
+  Fault::Operation operation = ToFile(kOld);
+  operation.prepare = [this, prepareFile = operation.prepare] {
+    prepareFile();
+    EXPECT_EQ(symlink("document", Path("link").c_str()), 0);
+  };
+  operation.run = [this] { return JsonValue::toFile(newDocument, Path("link")); };
+  operation.check = [this](const Outcome& outcome) {
+    const std::string text = ReadText(path);
+    EXPECT_TRUE(text == kNew || (!outcome.succeeded && text == kOld)) << text;
+    EXPECT_TRUE(std::filesystem::is_symlink(Path("link")));
+    ExpectAllDone(outcome);
+  };
+  SweepCalls(operation);
+  SweepMemory(operation);
 }
 
 TEST_F(JsonFaultTest, ToFileTakesALeftTemporaryAwayOrFails) {

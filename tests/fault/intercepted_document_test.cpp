@@ -153,6 +153,23 @@ TEST_F(InterceptedDocumentTest, ALeftTemporaryMayBeRemovedBySomebodyElse) {
   }
 }
 
+TEST_F(InterceptedDocumentTest, AFileSystemWithoutAttributesHasNoneToCopy) {
+  WriteText(path, "\"old\"");
+  for (const char* const call : {"listxattr", "getxattr"}) {
+    const Interception none(call, 1, ENOTSUP);
+    ExpectWritten();
+    EXPECT_TRUE(none.HasRun()) << call;
+  }
+}
+
+// Nobody can guess and take the name that a planted directory gets.
+TEST_F(InterceptedDocumentTest, WithoutARandomNameAPlantedDirectoryStays) {
+  ASSERT_EQ(mkdir(temporary.c_str(), 0755), 0);
+  const Interception missing("getrandom", 1, ENOSYS);
+  ExpectNotWritten(ENOSYS);
+  EXPECT_TRUE(missing.HasRun());
+}
+
 TEST_F(InterceptedDocumentTest, APlantedLinkMayBeRemovedBySomebodyElse) {
   ASSERT_EQ(symlink("nowhere", temporary.c_str()), 0);
   const Interception other("flock", 1, [&] {

@@ -11,7 +11,7 @@
 namespace Fault {
 namespace {
 
-std::array<Interception*, 8> waiting{};
+std::array<Interception*, 16> waiting{};
 
 }  // namespace
 
