@@ -30,8 +30,8 @@ bool Secure(int directory) {
   struct stat found = {};
   if (!Stat(directory, found)) return false;
   const uid_t user = geteuid();
-  if (user != 0) return found.st_uid == 0 || found.st_uid == user || Fail(EACCES);
-  if (found.st_uid == 0 && (found.st_mode & (S_IWGRP | S_IWOTH)) == 0) return true;
+  if (user != 0 && found.st_uid != 0 && found.st_uid != user) return Fail(EACCES);
+  if (user != 0 || (found.st_uid == 0 && (found.st_mode & (S_IWGRP | S_IWOTH)) == 0)) return true;
   return SetOwner(directory, 0, 0) && SetMode(directory, kMode);
 }
 

@@ -17,7 +17,8 @@ bool IsOfDirectory(const struct stat& file, const struct stat& directory) {
 }
 
 bool Accept(const struct stat& file, const std::string& path) {
-  return IsBelieved(file, path) || Fail(S_ISREG(file.st_mode) ? EACCES : EINVAL);
+  if (IsBelieved(file, path)) return true;
+  return Fail(S_ISREG(file.st_mode) ? EACCES : EINVAL);
 }
 
 }  // namespace

@@ -152,7 +152,8 @@ bool OpenOld(const Place& place, Whose whose, Descriptor& old) {
   if (Counts(found, place, whose)) return true;
   old.Close();
   if (S_ISDIR(found.st_mode)) return Fail(EISDIR);
-  return whose == Whose::kBelieved || Fail(EINVAL);
+  if (whose == Whose::kAnybodys) return Fail(EINVAL);
+  return true;
 }
 
 // The kernel looks first: it refuses what is not to be replaced before anything is touched, and
@@ -160,7 +161,8 @@ bool OpenOld(const Place& place, Whose whose, Descriptor& old) {
 bool IsReplaceable(const std::string& path) {
   struct stat found = {};
   if (!StatAt(AT_FDCWD, path, 0, found)) return errno == ENOENT;
-  return S_ISREG(found.st_mode) || Fail(S_ISDIR(found.st_mode) ? EISDIR : EINVAL);
+  if (S_ISREG(found.st_mode)) return true;
+  return Fail(S_ISDIR(found.st_mode) ? EISDIR : EINVAL);
 }
 
 // The temporary of one writer: from Claim() to Publish() it is locked and under its name; if
@@ -322,10 +324,10 @@ Descriptor OpenDocument(const std::string& path, Whose whose) {
   if (whose == Whose::kBelieved) return Posix::OpenBelieved(path);
   Descriptor file = Posix::Open(path, O_RDONLY | Posix::kHarmless);
   struct stat found = {};
-  const bool isDocument =
-      file.IsOpen() && StatFile(file, found) && (S_ISREG(found.st_mode) || Fail(EINVAL));
-  if (!isDocument) file.Close();
-  return file;
+  if (!file.IsOpen() || !StatFile(file, found)) return {};
+  if (S_ISREG(found.st_mode)) return file;
+  errno = EINVAL;
+  return {};
 }
 
 }  // namespace
@@ -341,7 +343,8 @@ bool ReplaceDocument(const Json::Value& value, const std::string& path, Whose wh
   if (!IsPath(path)) return Fail(EINVAL);
   if (whose == Whose::kAnybodys && !IsReplaceable(path)) return false;
   Place place;
-  return Locate(path, whose, place) && Replace(place, whose, WriteJson(value));
+  if (!Locate(path, whose, place)) return false;
+  return Replace(place, whose, WriteJson(value));
 }
 
 }  // namespace KeloDRCore

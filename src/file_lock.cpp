@@ -161,7 +161,8 @@ std::string FileLock::getLockFilePath(const std::string& name) {
 
 bool FileLock::checkLockDir() const {
   const std::string parent = File::GetParentDir(path);
-  return !parent.empty() && OpenLockDir(parent).IsOpen();
+  if (parent.empty()) return false;
+  return OpenLockDir(parent).IsOpen();
 }
 
 bool FileLock::openLockedFile() {

@@ -1,5 +1,7 @@
 #include "kelodrcore/sqlite_command.h"
 
+#include <string_view>
+
 #include "kelodrcore/container.h"
 #include "log.h"
 #include "value_access.h"
@@ -37,7 +39,8 @@ std::string Assignments(const SqliteValueList& list) {
 }
 
 std::string Where(const std::string& condition) {
-  return condition.empty() ? "" : " WHERE " + condition;
+  if (condition.empty()) return "";
+  return " WHERE " + condition;
 }
 
 }  // namespace
@@ -163,8 +166,9 @@ std::string SelectCommand::GetCommand() const {
 }
 
 void SelectCommand::DumpParam(std::stringstream& stream) const {
-  stream << "condition:[" << condition << "]/fields:["
-         << (selectAll ? "all" : Container::ToString(fields, ", ")) << "]";
+  const std::string names = Container::ToString(fields, ", ");
+  const std::string_view shown = selectAll ? "all" : std::string_view(names);
+  stream << "condition:[" << condition << "]/fields:[" << shown << "]";
 }
 
 bool SelectCommand::AddField(const std::string& field) {
@@ -230,7 +234,9 @@ std::string DeleteCommand::GetCommand() const {
 }
 
 void DeleteCommand::DumpParam(std::stringstream& stream) const {
-  stream << "condition:[" << (condition.empty() && deleteAll ? "all" : condition) << "]";
+  const std::string_view shown =
+      condition.empty() && deleteAll ? "all" : std::string_view(condition);
+  stream << "condition:[" << shown << "]";
 }
 
 void DeleteCommand::DeleteAll() { deleteAll = true; }

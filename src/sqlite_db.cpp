@@ -339,8 +339,9 @@ bool SqliteDB::CreateTable(const SqliteTableHandler& table) {
   if (IsTableExisted(table.tableName)) return true;
   // A failed query may have ended the transaction: what follows must not be kept without it.
   const bool isLost = wasInTransaction && !IsInTransaction();
-  if (isLost ||
-      !Exec("CREATE TABLE IF NOT EXISTS " + table.tableName + " (" + table.columnDefs + ")")) {
+  const std::string sql =
+      "CREATE TABLE IF NOT EXISTS " + table.tableName + " (" + table.columnDefs + ")";
+  if (isLost || !Exec(sql)) {
     KELODR_LOG(ERR, __func__, "Failed to create table [%s] with cmd[%s]", table.tableName.c_str(),
                table.columnDefs.c_str());
     return false;
@@ -406,7 +407,8 @@ bool SqliteDB::PrepareSelect(const SelectCommand& cmd, const char* function) {
     KELODR_LOG(ERR, function, "invalid select command [%s]", cmd.ToStr().c_str());
     return false;
   }
-  if (!IsExisted() || RefuseNul(cmd.GetCommand(), "SelectByCommand")) return false;
+  if (!IsExisted()) return false;
+  if (RefuseNul(cmd.GetCommand(), "SelectByCommand")) return false;
   SetErr(ERR::ERR_DATABASE_OPERATION);
   if (!CreateTable(cmd.GetTable())) {
     KELODR_LOG(ERR, function, "%s", "Failed to create table");
@@ -416,11 +418,13 @@ bool SqliteDB::PrepareSelect(const SelectCommand& cmd, const char* function) {
 }
 
 bool SqliteDB::SelectRecord(const SelectCommand& cmd, SqliteValueList& record) {
-  return PrepareSelect(cmd, __func__) && SelectByCommand(cmd.GetCommand(), record);
+  if (!PrepareSelect(cmd, __func__)) return false;
+  return SelectByCommand(cmd.GetCommand(), record);
 }
 
 bool SqliteDB::SelectRecords(const SelectCommand& cmd, std::vector<SqliteValueList>& records) {
-  return PrepareSelect(cmd, __func__) && SelectByCommand(cmd.GetCommand(), records);
+  if (!PrepareSelect(cmd, __func__)) return false;
+  return SelectByCommand(cmd.GetCommand(), records);
 }
 
 bool SqliteDB::SelectEach(const SelectCommand& cmd, const RecordTaker& take) {

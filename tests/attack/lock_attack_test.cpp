@@ -203,6 +203,17 @@ TEST_F(LockAttackTest, AnOrdinaryUserLocksInADirectoryOfRootOrHisOwn) {
   });
 }
 
+TEST_F(LockAttackTest, AnOrdinaryUserTakesNothingAwayThatIsNoLockFile) {
+  Attack([] {
+    AsUser([] {
+      MakeDir(kTop, 0755, kUser);
+      MakeQueue(InTop("queue"));
+      EXPECT_FALSE(FileLock("queue").lock(kExclusive, 0));
+    });
+    EXPECT_TRUE(S_ISFIFO(LookAt(InTop("queue")).st_mode));
+  });
+}
+
 TEST_F(LockAttackTest, AnOrdinaryUserDoesNotLockInAStrangersDirectory) {
   Attack([] {
     MakeDir(kTop, 0777, kUser + 1);

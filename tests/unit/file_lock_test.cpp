@@ -117,6 +117,23 @@ TEST_F(FileLockTest, ADirectoryThatCannotBeMadeIsNamedByEachStep) {
              Err("file_lock.cpp", "lock", "Bad fd [-1] to lock [" + parent + "/lock]")});
 }
 
+TEST_F(FileLockTest, ANameThatEndsWithASlashIsThatOfADirectory) {
+  FileLock lock(name + "/");
+  EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 1));
+  ExpectLog(CannotOpen(path + "/", "Is a directory"));
+}
+
+TEST_F(FileLockTest, ANameMayLeadUpwards) {
+  FileLock lock("../.kelodr_lock/" + name);
+  EXPECT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 1));
+  EXPECT_FALSE(IsFree());
+  // A step that is no directory is taken away nowhere but below the lock directory.
+  FileLock below("../.kelodr_lock/" + name + "/lock");
+  EXPECT_FALSE(below.lock(LOCK_EX | LOCK_NB, 1));
+  LogCapture::Clear();
+  EXPECT_FALSE(IsFree());
+}
+
 TEST_F(FileLockTest, AFileThatCannotBeOpenedIsNamedWithTheReason) {
   std::filesystem::create_directory(path);
   FileLock lock(name);
