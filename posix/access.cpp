@@ -60,7 +60,9 @@ bool CopyAttribute(const std::string& from, const std::string& to, const std::st
 }
 
 // An attribute that only the new file has was given to it by its directory.
-bool CopyAttributes(const std::string& from, const std::string& to) {
+bool CopyAttributes(int fromFd, int toFd) {
+  const std::string from = NameOf(fromFd);
+  const std::string to = NameOf(toFd);
   std::set<std::string> names = {kAcl};
   if (!AddNames(from, names) || !AddNames(to, names)) return false;
   for (const std::string& name : names) {
@@ -82,7 +84,7 @@ bool CopyOwner(int from, int to) {
 bool CopyAccess(int from, int to, mode_t added) {
   struct stat wanted = {};
   // A change of owner clears attributes and set-id bits, and an ACL changes the mode.
-  return CopyOwner(from, to) && CopyAttributes(NameOf(from), NameOf(to)) && Stat(from, wanted) &&
+  return CopyOwner(from, to) && CopyAttributes(from, to) && Stat(from, wanted) &&
          SetMode(to, (wanted.st_mode & kModeBits) | added);
 }
 

@@ -27,7 +27,7 @@ LD_PRELOAD=$build/coverage/exit.so ctest --preset coverage --test-dir "$build/co
 report=$build/coverage/report
 mkdir -p "$report"
 gcovr --root . --filter src/ --filter platform/ --filter posix/ --exclude-throw-branches \
-  --exclude-unreachable-branches --exclude-branches-by-pattern '^ *\} catch \(.*' --json "$report/counts.json" "$build/coverage"
+  --exclude-unreachable-branches --exclude-branches-by-pattern '^ *\} catch \(.*' --json "$report/counts.json" "$build/coverage"/{src,platform,posix}
 gcovr --root . --add-tracefile "$report/counts.json" --html-details "$report/index.html"
 gcovr --root . --add-tracefile "$report/counts.json" --branches
 gcovr --root . --add-tracefile "$report/counts.json" --print-summary \

@@ -90,7 +90,11 @@ std::string WithoutPoints(std::string_view text) {
     if (text[0] == '"') length = QuotedLength(text);
     if (isNumber) length = NumberLength(text);
     const std::string_view piece = text.substr(0, length);
-    result += isNumber ? NumberWithoutPoint(piece) : std::string(piece);
+    if (isNumber) {
+      result += NumberWithoutPoint(piece);
+    } else {
+      result += piece;
+    }
     text.remove_prefix(length);
   }
   return result;
@@ -122,46 +126,45 @@ Json::StreamWriterBuilder WriterSettings() {
   return builder;
 }
 
-// The settings are made once and never destroyed: other destructors may read and write documents
-// when the process ends.
-
-std::unique_ptr<Json::CharReader> NewReader(Origin origin) {
-  static const auto& forText = *new Json::CharReaderBuilder(ReaderSettings(kLevelsOfText));
-  static const auto& forFile = *new Json::CharReaderBuilder(ReaderSettings(kLevelsOfFile));
-  return std::unique_ptr<Json::CharReader>(
-      (origin == Origin::kText ? forText : forFile).newCharReader());
-}
-
-std::unique_ptr<Json::StreamWriter> NewWriter() {
-  static const auto& settings = *new Json::StreamWriterBuilder(WriterSettings());
-  return std::unique_ptr<Json::StreamWriter>(settings.newStreamWriter());
-}
-
-bool Parse(Json::Value& value, std::string_view text, Origin origin) {
-  return NewReader(origin)->parse(text.data(), text.data() + text.size(), &value, nullptr) &&
-         IsBlank(text.substr(static_cast<size_t>(value.getOffsetLimit())));
-}
-
 locale_t NewClassicLocale() {
   const locale_t classic = newlocale(LC_ALL_MASK, "C", nullptr);
   if (classic == nullptr) throw std::bad_alloc();
   return classic;
 }
 
+struct Settings {
+  const Json::CharReaderBuilder forText = ReaderSettings(kLevelsOfText);
+  const Json::CharReaderBuilder forFile = ReaderSettings(kLevelsOfFile);
+  const Json::StreamWriterBuilder forWriter = WriterSettings();
+  const locale_t classic = NewClassicLocale();
+};
+
+// Made once and never destroyed: other destructors may read and write documents when the process
+// ends.
+const Settings& GetSettings() {
+  static const Settings* const settings = std::make_unique<Settings>().release();
+  return *settings;
+}
+
+bool Parse(Json::Value& value, std::string_view text, Origin origin) {
+  const Settings& settings = GetSettings();
+  const auto& builder = origin == Origin::kText ? settings.forText : settings.forFile;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  return reader->parse(text.data(), text.data() + text.size(), &value, nullptr) &&
+         IsBlank(text.substr(static_cast<size_t>(value.getOffsetLimit())));
+}
+
 // The C locale of this thread while it lives. JsonCpp has printf write doubles, and knows no
 // decimal point but "." and ",".
 class PlainNumbers {
  public:
-  PlainNumbers() {
-    static const locale_t classic = NewClassicLocale();
-    before = uselocale(classic);
-  }
+  PlainNumbers() = default;
   PlainNumbers(const PlainNumbers&) = delete;
   PlainNumbers& operator=(const PlainNumbers&) = delete;
   ~PlainNumbers() { uselocale(before); }
 
  private:
-  locale_t before;
+  const locale_t before = uselocale(GetSettings().classic);
 };
 
 }  // namespace
@@ -193,7 +196,8 @@ std::string WriteJson(const Json::Value& value) {
   text.exceptions(std::ios::badbit);  // otherwise memory that runs out cuts the text
   try {
     const PlainNumbers plain;
-    NewWriter()->write(value, &text);
+    const std::unique_ptr<Json::StreamWriter> writer(GetSettings().forWriter.newStreamWriter());
+    writer->write(value, &text);
     return text.str();
   } catch (const std::length_error&) {
     throw std::bad_alloc();  // GCOVR_EXCL_LINE: 2 GiB on 32 bits

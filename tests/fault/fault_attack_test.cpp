@@ -256,6 +256,22 @@ TEST_F(FaultAttackTest, ALockLeadsNowhereAndIsHeldOrNotGot) {
               {[] {}, run, [](const Outcome&) {}});
 }
 
+// Some kernels call a link one, others say that it is no directory. It may be gone meanwhile.
+TEST_F(FaultAttackTest, ALinkInPlaceOfTheLockDirectoryIsTakenAwayByWhateverNameAndHand) {
+  for (const bool isGone : {false, true}) {
+    Scene::Attack([isGone] {
+      Link(kLockDir, kHome)();
+      const Fault::Interception isLink("openat", 2, ELOOP);
+      const Fault::Interception stranger("unlinkat", 1, [isGone] {
+        if (isGone) unlink(kLockDir);
+        return Fault::kGoOn;
+      });
+      EXPECT_TRUE(FileLock("name").lock(LOCK_EX | LOCK_NB, 0));
+      EXPECT_TRUE(isLink.HasRun() && stranger.HasRun());
+    });
+  }
+}
+
 // Before each look whether it is still the one that was made safe, another takes its place.
 TEST_F(FaultAttackTest, ALockDirectoryThatIsSwappedAgainAndAgainIsGivenUp) {
   Scene::Attack([] {

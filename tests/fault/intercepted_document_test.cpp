@@ -143,8 +143,9 @@ TEST_F(InterceptedDocumentTest, ADirectoryThatComesIntoBeingIsNotReplaced) {
 TEST_F(InterceptedDocumentTest, ALeftTemporaryMayBeRemovedBySomebodyElse) {
   for (const char* const call : {"openat", "unlinkat"}) {
     WriteText(temporary, "half");
-    // The directory is opened first, then the temporary is to be made, then opened.
-    const Interception other(call, std::string(call) == "openat" ? 3 : 1, [&] {
+    // The directory is opened first, then twice what may stand at the document's name; then the
+    // temporary is to be made, then opened.
+    const Interception other(call, std::string(call) == "openat" ? 5 : 1, [&] {
       EXPECT_EQ(unlink(temporary.c_str()), 0);
       return kGoOn;
     });
@@ -160,6 +161,16 @@ TEST_F(InterceptedDocumentTest, AFileSystemWithoutAttributesHasNoneToCopy) {
     ExpectWritten();
     EXPECT_TRUE(none.HasRun()) << call;
   }
+}
+
+TEST_F(InterceptedDocumentTest, APlantedDirectoryMayBeRemovedBySomebodyElse) {
+  ASSERT_EQ(mkdir(temporary.c_str(), 0755), 0);
+  const Interception other("renameat", 1, [&] {
+    EXPECT_EQ(rmdir(temporary.c_str()), 0);
+    return kGoOn;
+  });
+  ExpectWritten();
+  EXPECT_TRUE(other.HasRun());
 }
 
 // Nobody can guess and take the name that a planted directory gets.

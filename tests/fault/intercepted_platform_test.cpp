@@ -35,10 +35,10 @@ void RunWithStreams(const std::set<int>& streams, const std::function<void()>& b
 
 using InterceptedProgramTest = CleanTest;
 
-// Both ends of its pipe come on numbers of standard streams, and are to be moved.
+// /dev/null and both ends of the pipe come on numbers of standard streams, and are to be moved.
 TEST_F(InterceptedProgramTest, FailsWhereAPipeCannotBeMovedAboveTheStreams) {
-  for (const int number : {1, 2}) {
-    RunWithStreams({STDERR_FILENO}, [number] {
+  for (const int number : {1, 2, 3}) {
+    RunWithStreams({}, [number] {
       const Interception noDescriptor("fcntl", number, EMFILE);
       errno = 0;
       EXPECT_EQ(Exec("/bin/true"), -1);
@@ -48,10 +48,17 @@ TEST_F(InterceptedProgramTest, FailsWhereAPipeCannotBeMovedAboveTheStreams) {
   }
 }
 
-// The end that the supervisor reports through has the number that it would be moved to.
+// The end that the supervisor reports through has the number that it would be moved to: another
+// thread has just given that back.
 TEST_F(InterceptedProgramTest, RunsWhereThePipeIsInPlaceAlready) {
   RunWithStreams({STDIN_FILENO, STDOUT_FILENO}, [] {
+    const int first = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+    const Interception otherThread("pipe2", 1, [first] {
+      close(first);
+      return Fault::kGoOn;
+    });
     EXPECT_EQ(Exec("/bin/true"), 0);
+    EXPECT_TRUE(otherThread.HasRun());
     EXPECT_EQ(Exec("/bin/false"), -1);
   });
 }
