@@ -477,6 +477,7 @@ def main():
         due = [m for m in mutants if m.key not in results or
                (arguments.retry and word_of(results[m.key]) in ("survived", "timed out"))]
         random.Random(1).shuffle(due)
+        due.sort(key=lambda mutant: mutant.key not in results)  # what is measured again comes first
         run_all(due, arguments, keep)
     report(mutants, read_results())
 

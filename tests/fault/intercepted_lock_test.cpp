@@ -3,7 +3,10 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
+#include <cerrno>
 #include <cstdio>
+#include <string>
+#include <vector>
 
 #include "fault/interception.h"
 #include "posix/directory_walk.h"
@@ -33,6 +36,18 @@ TEST_F(InterceptedLockTest, ADirectoryThatItsOwnerMovesAwayIsNotTaken) {
   ASSERT_TRUE(KeloDRCore::Posix::Stat(opened.Get(), found));
   ASSERT_EQ(stat(step.c_str(), &named), 0);
   EXPECT_TRUE(KeloDRCore::Posix::IsSameFile(found, named));
+}
+
+TEST_F(InterceptedLockTest, AStepThatCannotBeMadeIsLeftToTheCaller) {
+  const Fault::Interception refusal("mkdirat", 1, EACCES);
+  std::vector<std::string> made;
+  const Descriptor opened =
+      KeloDRCore::Posix::OpenStepwise(dir, Path("step/lower"), [&](const std::string& path) {
+        made.push_back(path);
+        return mkdir(path.c_str(), 0755) == 0;
+      });
+  EXPECT_TRUE(opened.IsOpen());
+  EXPECT_EQ(made, std::vector<std::string>{Path("step")});
 }
 
 }  // namespace

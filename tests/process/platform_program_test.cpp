@@ -53,6 +53,13 @@ TEST_F(ExecTest, FailsWithErrnoForAProgramThatCannotBeStarted) {
   EXPECT_EQ(errno, EACCES);
 }
 
+// The program kills the process that would tell its status.
+TEST_F(ExecTest, FailsWithErrnoWhereNobodyCanTellTheStatus) {
+  errno = 0;
+  EXPECT_EQ(Shell("kill -KILL $PPID"), -1);
+  EXPECT_EQ(errno, ECHILD);
+}
+
 TEST_F(ExecTest, FailsWithErrnoWithoutFreeDescriptors) {
   EXPECT_EQ(RunInChild([] {
               LeaveNoDescriptors();
