@@ -23,17 +23,13 @@
 
 namespace {
 
-using KeloDRCore::Posix::AboveStandardStreams;
-using KeloDRCore::Posix::Descriptor;
-using KeloDRCore::Posix::forkMutex;
-using KeloDRCore::Posix::kFirstFreeDescriptor;
-using KeloDRCore::Posix::Pipe;
-using KeloDRCore::Posix::Receive;
-using KeloDRCore::Posix::Retry;
-using KeloDRCore::Posix::Send;
+namespace Posix = KeloDRCore::Posix;
+using Posix::Descriptor;
+using Posix::kFirstFreeDescriptor;
+using Posix::Retry;
 
 Descriptor OpenNull() {
-  return AboveStandardStreams(
+  return Posix::AboveStandardStreams(
       Descriptor(Retry([] { return open("/dev/null", O_RDWR | O_CLOEXEC); })));
 }
 
@@ -118,23 +114,23 @@ bool ArrangeDescriptors(const Streams& streams, int report) {
                             int report) {
   signal(SIGCHLD, SIG_DFL);
   if (!ArrangeDescriptors(streams, report)) {
-    Send(report, errno);
+    Posix::Send(report, errno);
     _exit(0);
   }
   pid_t pid = -1;
   const int error = Spawn(program, argv, &pid);
-  Send(kFirstFreeDescriptor, error);
+  Posix::Send(kFirstFreeDescriptor, error);
   if (error != 0) _exit(0);
   for (int fd = 0; fd < kFirstFreeDescriptor; ++fd) close(fd);
   int status = -1;
   Retry([&] { return waitpid(pid, &status, 0); });
-  Send(kFirstFreeDescriptor, status);
+  Posix::Send(kFirstFreeDescriptor, status);
   _exit(0);
 }
 
 // False with errno when the program cannot be started; nothing is left of it then.
 bool Start(const char* program, char* const argv[], const Streams& streams, Program* started) {
-  Pipe report;
+  Posix::Pipe report;
   if (!report.Open()) return false;
   {
     const SignalBlock block;
@@ -144,7 +140,7 @@ bool Start(const char* program, char* const argv[], const Streams& streams, Prog
   if (started->supervisor < 0) return false;
   report.writeEnd.Close();
   int error = ECHILD;  // the supervisor was killed
-  if (Receive(report.readEnd.Get(), &error) && error == 0) {
+  if (Posix::Receive(report.readEnd.Get(), &error) && error == 0) {
     started->report = std::move(report.readEnd);
     return true;
   }
@@ -156,7 +152,7 @@ bool Start(const char* program, char* const argv[], const Streams& streams, Prog
 // The wait status, or -1 with errno when nobody can tell it any more.
 int Finish(const Program& program) {
   int status = -1;
-  if (!Receive(program.report.Get(), &status)) errno = ECHILD;
+  if (!Posix::Receive(program.report.Get(), &status)) errno = ECHILD;
   Reap(program.supervisor);
   return status;
 }
@@ -171,13 +167,13 @@ struct Running {
 std::unique_ptr<Running>* const running = new std::unique_ptr<Running>;  // outlives every user
 
 void Remember(std::unique_ptr<Running> entry) {
-  const std::lock_guard<std::mutex> guard(forkMutex);
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
   entry->next = std::move(*running);
   *running = std::move(entry);
 }
 
 std::unique_ptr<Running> Forget(const FILE* stream) {
-  const std::lock_guard<std::mutex> guard(forkMutex);
+  const std::lock_guard<std::mutex> guard(Posix::forkMutex);
   std::unique_ptr<Running>* link = running;
   while (*link && (*link)->stream != stream) link = &(*link)->next;
   std::unique_ptr<Running> found = std::move(*link);
@@ -188,7 +184,7 @@ std::unique_ptr<Running> Forget(const FILE* stream) {
 FILE* OpenStream(const char* program, const char* mode, char* const argv[]) {
   const bool reading = strcmp(mode, "r") == 0;
   auto entry = std::make_unique<Running>();
-  Pipe pipe;
+  Posix::Pipe pipe;
   if (!pipe.Open()) return nullptr;
   Descriptor& own = reading ? pipe.readEnd : pipe.writeEnd;
   const Descriptor& other = reading ? pipe.writeEnd : pipe.readEnd;
@@ -211,7 +207,7 @@ FILE* OpenStream(const char* program, const char* mode, char* const argv[]) {
 // Forks twice, so that the child's parent is gone at once. The process in between reports the
 // child's pid, or the negative errno of the second fork.
 pid_t ForkDetached() {
-  Pipe report;
+  Posix::Pipe report;
   if (!report.Open()) return -1;
   const SignalBlock block;
   const pid_t between = fork();
@@ -219,12 +215,12 @@ pid_t ForkDetached() {
   if (between == 0) {
     const pid_t child = fork();
     if (child == 0) return 0;
-    Send(report.writeEnd.Get(), child > 0 ? child : -errno);
+    Posix::Send(report.writeEnd.Get(), child > 0 ? child : -errno);
     _exit(0);
   }
   report.writeEnd.Close();
   int result = -ECHILD;
-  Receive(report.readEnd.Get(), &result);
+  Posix::Receive(report.readEnd.Get(), &result);
   Reap(between);
   if (result > 0) return result;
   errno = -result;

@@ -269,10 +269,6 @@ bool TryRepeatedly(int limit, unsigned int minSleep, unsigned int maxSleep, cons
   return true;
 }
 
-int ToInt(double seconds) {
-  return static_cast<int>(std::clamp<double>(seconds, INT_MIN, INT_MAX));
-}
-
 }  // namespace
 
 Cache::Cache(const std::string& dir, const std::string& file, long timeoutSeconds,
@@ -430,7 +426,8 @@ Json::Value Cache::MakeDocument(const Json::Value& data, long long begin, long l
   document["begin_time_to_update"] = Json::Int64{begin};
   document["finish_time_to_update"] = Json::Int64{finish};
   document["updated_time"] = seconds;
-  document["max_updated_time"] = std::max(GetMaxUpdateTime(), ToInt(seconds));
+  const int wholeSeconds = static_cast<int>(std::clamp<double>(seconds, INT_MIN, INT_MAX));
+  document["max_updated_time"] = std::max(GetMaxUpdateTime(), wholeSeconds);
   return document;
 }
 
