@@ -32,6 +32,7 @@ import tempfile
 import threading
 import time
 
+sys.dont_write_bytecode = True  # nothing is left beside the scripts
 import faults
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
@@ -391,6 +392,7 @@ def keep(mutant, outcome):
 
 def run_all(mutants, arguments, take):
     """Measures the mutants and gives each with its outcome to `take`."""
+    WORK.mkdir(parents=True, exist_ok=True)
     commands = Commands()
     workers = [Worker(commands) for _ in range(arguments.jobs)]
     workers[0].compile_system_headers()
@@ -466,7 +468,6 @@ def main():
     parser.add_argument("--report", action="store_true", help="only show what was measured")
     arguments = parser.parse_args()
 
-    WORK.mkdir(parents=True, exist_ok=True)
     files = [path for path in library_files() if not arguments.files or path.stem in arguments.files]
     made_by_hand = [fault_of(*fault) for fault in faults.FAULTS]
     if arguments.faults:
