@@ -37,9 +37,9 @@ bool ReadStart(const char* path, size_t limit, std::string& text) try {
 }
 
 struct ProcStat {
-  char state = 0;
-  int threads = 0;
-  unsigned long long startTime = 0;  // clock ticks since boot
+  char state;
+  int threads;
+  unsigned long long startTime;  // clock ticks since boot
 };
 
 // Reads what proc(5) lists as fields 3, 20 and 22. The name, field 2, may hold any byte, brackets
@@ -64,7 +64,7 @@ bool Exists(int pid) { return kill(pid, 0) == 0 || errno == EPERM; }
 // Where the start time cannot be read (processes of others may be hidden), nothing speaks against
 // a process that exists.
 bool MayHaveStartedAt(int pid, unsigned long long startTime) {
-  ProcStat stat;
+  ProcStat stat = {};
   if (!ReadProcStat(pid, &stat)) return Exists(pid);
   return stat.startTime == startTime;
 }
@@ -131,7 +131,7 @@ int KLIBCReadPidFile(const char* path) {
 
 int KLIBCProcAlive(int pid) {
   if (pid <= 0) return 0;
-  ProcStat stat;
+  ProcStat stat = {};
   if (ReadProcStat(pid, &stat)) {
     // A process whose first thread has ended looks like a zombie while its other threads run.
     if (stat.state == 'X' || (stat.state == 'Z' && stat.threads <= 1)) return 0;
@@ -143,7 +143,7 @@ int KLIBCProcAlive(int pid) {
 // no reader meets a mixture of old and new. No temporary stands beside it, so none can stay behind;
 // a writer killed half-way leaves no file or one without its first byte, both of which name nobody.
 int KLIBCProcPidFileCreate(const char* path) {
-  ProcStat self;
+  ProcStat self = {};
   if (!ReadProcStat(getpid(), &self)) return -1;
   char text[64];
   snprintf(text, sizeof text, "%d\n%llu\n", static_cast<int>(getpid()), self.startTime);

@@ -56,6 +56,8 @@ TEST_F(InterceptedFileTest, AnInterruptedCloseIsNotMadeAgain) {
   file.Close();
   EXPECT_TRUE(interrupted.HasRun());
   EXPECT_FALSE(again.HasRun());
+  EXPECT_EQ(file.Get(), -1);
+  EXPECT_EQ(KeloDRCore::Posix::Descriptor().Get(), -1);
 }
 
 }  // namespace
