@@ -26,8 +26,9 @@ bool Accept(const struct stat& file, const std::string& path) {
 bool IsBelieved(const struct stat& file, const std::string& path) {
   if (!S_ISREG(file.st_mode)) return false;
   if (IsOwn(file)) return true;
+  const std::string parent = DirectoryOf(path);
   struct stat directory = {};
-  return StatAt(AT_FDCWD, DirectoryOf(path), 0, directory) && IsOfDirectory(file, directory);
+  return StatAt(AT_FDCWD, parent, 0, directory) && IsOfDirectory(file, directory);
 }
 
 bool IsOwnerBelieved(const struct stat& file, int directory) {

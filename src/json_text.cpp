@@ -139,10 +139,12 @@ struct Settings {
   const locale_t classic = NewClassicLocale();
 };
 
+const Settings* NewSettings() { return std::make_unique<Settings>().release(); }
+
 // Made once and never destroyed: other destructors may read and write documents when the process
 // ends.
 const Settings& GetSettings() {
-  static const Settings* const settings = std::make_unique<Settings>().release();
+  static const Settings* const settings = NewSettings();
   return *settings;
 }
 
