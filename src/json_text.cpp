@@ -21,13 +21,14 @@ namespace {
 constexpr int kLevelsOfText = 1000;
 constexpr int kLevelsOfFile = kLevelsOfText + 10;
 
-// The length of the comment with which `text` begins; 0 when there is none or it does not end.
+// The length of the comment with which `text` begins; 0 when there is none, npos for one that does
+// not end.
 size_t CommentLength(std::string_view text) {
   const std::string_view start = text.substr(0, 2);
   if (start == "//") return std::min(text.find_first_of("\r\n"), text.size());
   if (start != "/*") return 0;
   const size_t end = text.find("*/", 2);
-  return end == std::string_view::npos ? 0 : end + 2;
+  return end == std::string_view::npos ? end : end + 2;
 }
 
 bool IsBlank(std::string_view text) {
@@ -35,7 +36,7 @@ bool IsBlank(std::string_view text) {
     text.remove_prefix(std::min(text.find_first_not_of(" \t\r\n"), text.size()));
     if (text.empty()) return true;
     const size_t comment = CommentLength(text);
-    if (comment == 0) return false;
+    if (comment == 0 || comment == std::string_view::npos) return false;
     text.remove_prefix(comment);
   }
 }
@@ -95,7 +96,7 @@ std::string WithoutPoints(std::string_view text) {
     } else {
       result += piece;
     }
-    text.remove_prefix(length);
+    text.remove_prefix(piece.size());
   }
   return result;
 }
