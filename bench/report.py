@@ -1,7 +1,8 @@
 #!/usr/bin/env python3
 """Makes the table of ratios, and the curves, from the JSON files that scripts/bench.sh measured.
 
-usage: report.py RESULTS [DOCS]    with DOCS, writes DOCS/performance.md's table and DOCS/*.svg
+usage: report.py RESULTS [ROOT]    with ROOT, writes docs/performance.md's table and docs/*.svg
+                                   there, and the figures of README.md that are rows of the table
 """
 
 import collections
@@ -71,9 +72,8 @@ def bound_text(bound):
 
 
 def rows_of(operation, work, comparison):
-    for contestant in comparison.times:
-        if contestant == LIBRARY:
-            continue
+    others = [name for name in comparison.times if name != LIBRARY]
+    for contestant in sorted(others, key=lambda name: (name != BASELINE, name)):
         bound = comparison.bounds.get(contestant)
         low, middle, high = comparison.ratios(contestant)
         missed = bound is not None and middle > bound
@@ -84,12 +84,15 @@ def rows_of(operation, work, comparison):
         ]
 
 
+def all_rows(comparisons):
+    return [row for (operation, work), comparison in comparisons.items()
+            if not operation.startswith("growth")
+            for row in rows_of(operation, work, comparison)]
+
+
 def table(comparisons):
     head = ["operation", "work", "time", "beside", "ratio (quartiles)", "bound", ""]
-    rows = [head]
-    for (operation, work), comparison in comparisons.items():
-        if not operation.startswith("growth"):
-            rows.extend(rows_of(operation, work, comparison))
+    rows = [head] + all_rows(comparisons)
     widths = [max(len(row[i]) for row in rows) for i in range(len(head))]
     rows.insert(1, ["-" * width for width in widths])
     lines = []
@@ -127,7 +130,9 @@ def plot(path, title, x, y, curves, extra=""):
         f"$curve{i} << end\n" + "\n".join(f"{a} {b}" for a, b in points) + "\nend"
         for i, (_, points) in enumerate(curves)
     ]
-    lines = (f"$curve{i} with linespoints pt 7 ps 0.5 dt {1 + (BASELINE in name)} title '{name}'"
+    # The library and its baseline are neighbours, of one colour.
+    lines = (f"$curve{i} with linespoints pt 7 ps 0.5 lc {1 + i // 2} "
+             f"dt {1 + (BASELINE in name)} title '{name}'"
              for i, (name, _) in enumerate(curves))
     script.append("plot " + ", ".join(lines))
     subprocess.run(["gnuplot"], input="\n".join(script), text=True, check=True)
@@ -144,12 +149,15 @@ def draw(comparisons, docs):
     def whole(_, comparison, name):
         return comparison.median(name) / 1e3
 
-    def bytes_per_row(_, comparison, name):
-        return comparison.bytes_per_row[name]
+    def mebibytes(rows, comparison, name):
+        return comparison.bytes_per_row[name] * rows / 2**20
 
     plot(docs / "growth-rows.svg", "Inserts and selects", "rows", "µs a row",
-         both("growth insert", "insert, ", per_row) + both("growth select", "select, ", per_row),
-         "set yrange [0:*]; set format x '10^{%T}'")
+         both("growth insert", "InsertRecord, ", per_row) +
+         both("growth bulk", "InsertRecords, ", per_row) +
+         both("growth select", "SelectRecords, ", per_row) +
+         both("growth each", "SelectEach, ", per_row),
+         "set logscale y 10; set format x '10^{%T}'; set key below")
     plot(docs / "growth-value.svg", "One row with a large text: inserted and selected",
          "bytes of the text", "µs", both("growth value", "", whole),
          "set logscale y 10; set format x '10^{%T}'")
@@ -160,8 +168,10 @@ def draw(comparisons, docs):
          "µs a lock, whole machine",
          both("growth lock waiting", "waiting in the kernel, ", whole) +
          both("growth lock polling", "polling, ", whole), powers)
-    plot(docs / "growth-memory.svg", "Peak memory of SelectRecords", "rows", "bytes a row",
-         both("growth memory", "", bytes_per_row), "set yrange [0:*]; set format x '10^{%T}'")
+    plot(docs / "growth-memory.svg", "Peak memory of selects", "rows", "MiB",
+         both("growth memory", "SelectRecords, ", mebibytes) +
+         both("growth each memory", "SelectEach, ", mebibytes),
+         "set logscale y 10; set format x '10^{%T}'")
 
 
 def replace_section(text, name, section):
@@ -171,16 +181,30 @@ def replace_section(text, name, section):
     return head + begin + "\n" + section + "\n" + end + rest.split(end)[1]
 
 
+def replace_figures(text, rows):
+    """Puts the rows of the table in place of those in `text` of the same work, without quartiles."""
+    figures = {(row[0], row[1], row[3]): row[:4] + [row[4].split()[0]] for row in rows}
+    lines = text.split("\n")
+    for i, line in enumerate(lines):
+        cells = [cell.strip() for cell in line.strip("|").split("|")]
+        if len(cells) == 5 and (cells[0], cells[1], cells[3]) in figures:
+            figure = figures[cells[0], cells[1], cells[3]]
+            lines[i] = "| " + " | ".join(figure) + " |"
+    return "\n".join(lines)
+
+
 def main():
     comparisons, context = load(sys.argv[1])
     print(machine(context))
     print(table(comparisons))
     if len(sys.argv) > 2:
-        docs = pathlib.Path(sys.argv[2])
-        page = docs / "performance.md"
+        root = pathlib.Path(sys.argv[2])
+        page = root / "docs/performance.md"
         text = replace_section(page.read_text(), "table", table(comparisons))
         page.write_text(replace_section(text, "machine", machine(context)))
-        draw(comparisons, docs)
+        draw(comparisons, root / "docs")
+        readme = root / "README.md"
+        readme.write_text(replace_figures(readme.read_text(), all_rows(comparisons)))
 
 
 main()

@@ -1,8 +1,8 @@
 // Locks, and caches that are fresh.
 
 #include <sys/file.h>
-#include <unistd.h>
 
+#include <cstdio>
 #include <memory>
 
 #include "growth/operations.h"
@@ -23,9 +23,7 @@ class GrowthCache : public KeloDRCore::Cache {
   bool IsValidData(const Json::Value& data) const override { return data.isObject(); }
 };
 
-std::shared_ptr<FileLock> NewLock() {
-  return std::make_shared<FileLock>("kelodr_growth." + std::to_string(getpid()));
-}
+std::shared_ptr<FileLock> NewLock() { return std::make_shared<FileLock>(Path("lock")); }
 
 Work Lock(size_t count) {
   return [lock = NewLock(), count] {

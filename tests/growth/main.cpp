@@ -41,11 +41,11 @@ bool Grows(const Operation& operation, const std::string& counts) {
   const Cost small = CostOf(operation.prepared(operation.size), counts);
   const Cost large = CostOf(operation.prepared(kFactor * operation.size), counts);
   printf("%s, %zu -> %zu:", operation.name.c_str(), operation.size, kFactor * operation.size);
-  const bool isGood = IsAllowed("instructions", operation.instructions, one.instructions,
-                                small.instructions, large.instructions) &
-                      IsAllowed("heap", operation.heap, one.heap, small.heap, large.heap);
+  const bool isFast = IsAllowed("instructions", operation.instructions, one.instructions,
+                                small.instructions, large.instructions);
+  const bool isSmall = IsAllowed("heap", operation.heap, one.heap, small.heap, large.heap);
   printf("\n");
-  return isGood;
+  return isFast && isSmall;
 }
 
 std::vector<Operation> AllOperations() {
@@ -80,5 +80,6 @@ int main(int argc, char** argv) {
     std::filesystem::create_directory(scratch);
   }
   std::filesystem::remove_all(scratch);
+  std::filesystem::remove_all("/tmp/.kelodr_lock" + scratch);
   return areGood ? 0 : 1;
 }
