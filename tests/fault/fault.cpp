@@ -40,12 +40,18 @@ struct State {
 State* state = nullptr;
 thread_local int suspensions = 0;
 
+// Whether this process armed, or is a child of the one that did: a parent that waits for it does
+// not count.
+bool isArmedHere = false;
+
 State* NewState() {
   void* const memory =
       mmap(nullptr, sizeof(State), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
   if (memory == MAP_FAILED) abort();
   return new (memory) State{};
 }
+
+bool IsArmed() { return isArmedHere && state->armed; }
 
 constexpr int kSignalsInARow = 10;  // no failure
 
@@ -132,12 +138,14 @@ void Arm(const Plan& plan) {
   state->failed = {};
   state->waited = 0;
   state->armed = true;
+  isArmedHere = true;
 }
 
 int Failures() { return state->failures; }
 
 int Disarm() {
   state->armed = false;
+  isArmedHere = false;
   return Failures();
 }
 
@@ -151,9 +159,7 @@ bool Outcome::Failed(const std::string& call) const {
 }
 
 bool Hits(const char* call, std::initializer_list<int> errors) {
-  if (state == nullptr || !state->armed || suspensions > 0 || LogCapture::IsRecording()) {
-    return false;
-  }
+  if (!IsArmed() || suspensions > 0 || LogCapture::IsRecording()) return false;
   const Plan& plan = state->plan;
   int error = plan.error;
   if (error == kSignals) {
@@ -177,7 +183,7 @@ bool Outcome::FailedForGood(const std::string& call) const {
 }
 
 void Wait(long long microseconds) {
-  if (state == nullptr || !state->armed) return;
+  if (!IsArmed()) return;
   state->waited += microseconds;
   if (state->waited > kLongestWait * 1000000) Bite("more than five minutes of sleep");
 }
