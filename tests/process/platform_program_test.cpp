@@ -53,13 +53,6 @@ TEST_F(ExecTest, FailsWithErrnoForAProgramThatCannotBeStarted) {
   EXPECT_EQ(errno, EACCES);
 }
 
-// The program kills the process that would tell its status.
-TEST_F(ExecTest, FailsWithErrnoWhereNobodyCanTellTheStatus) {
-  errno = 0;
-  EXPECT_EQ(Shell("kill -KILL $PPID"), -1);
-  EXPECT_EQ(errno, ECHILD);
-}
-
 TEST_F(ExecTest, FailsWithErrnoWithoutFreeDescriptors) {
   EXPECT_EQ(RunInChild([] {
               LeaveNoDescriptors();
@@ -315,6 +308,16 @@ TEST_F(PopenTest, IsNullForAProgramThatCannotBeStarted) {
   WriteText(Path("text"), "exit 0\n");
   EXPECT_EQ(KLIBCPopen(Path("text").c_str(), "w", nullptr), nullptr);
   EXPECT_EQ(errno, EACCES);
+}
+
+// The program kills the process that would tell its status.
+TEST_F(PopenTest, FailsWithErrnoWhereNobodyCanTellTheStatus) {
+  FILE* const stream = KLIBCPopen("/bin/sh", "w", "-c", "read line; kill -KILL $PPID", nullptr);
+  ASSERT_NE(stream, nullptr);
+  fputs("now\n", stream);
+  errno = 0;
+  EXPECT_EQ(KLIBCPclose(stream), -1);
+  EXPECT_EQ(errno, ECHILD);
 }
 
 TEST_F(PopenTest, IsNullForAnotherMode) {
