@@ -210,6 +210,7 @@ TEST_F(CacheFaultTest, ARefreshInTheBackgroundLeavesTheOldOrTheNewDocument) {
     EXPECT_TRUE(!outcome.failed.empty() || Document() == "new");
     CheckState(outcome);
   };
+  interruptedStride = 151;  // most of the calls are those of an update that is waited for
   SweepCalls({prepare, run, check});
   SweepMemory({prepare, run, check});
   SweepTransfers({prepare, run, check});
