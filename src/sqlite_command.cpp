@@ -167,7 +167,8 @@ std::string SelectCommand::GetCommand() const {
 
 void SelectCommand::DumpParam(std::stringstream& stream) const {
   const std::string names = Container::ToString(fields, ", ");
-  const std::string_view shown = selectAll ? "all" : std::string_view(names);
+  std::string_view shown = names;
+  if (selectAll) shown = "all";
   stream << "condition:[" << condition << "]/fields:[" << shown << "]";
 }
 
@@ -234,8 +235,8 @@ std::string DeleteCommand::GetCommand() const {
 }
 
 void DeleteCommand::DumpParam(std::stringstream& stream) const {
-  const std::string_view shown =
-      condition.empty() && deleteAll ? "all" : std::string_view(condition);
+  std::string_view shown = condition;
+  if (condition.empty() && deleteAll) shown = "all";
   stream << "condition:[" << shown << "]";
 }
 
