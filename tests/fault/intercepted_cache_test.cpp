@@ -107,6 +107,17 @@ TEST_F(InterceptedCacheTest, TheClaimOfAnotherLiveProcessStays) {
   }
 }
 
+// The caller waits until its refresher has let go of its locks, but not for a dead one.
+TEST_F(InterceptedCacheTest, ARefresherThatDiesAtOnceHoldsNobodyUp) {
+  WriteText(Path("c.cached"), R"({"cached_data": "old"})");
+  KeloDRCore::FileLock open(Path("c.cached.lock"));
+  ASSERT_TRUE(open.openLockedFile());
+  const Interception death("dup3", 1, []() -> int { _exit(0); });
+  const TestCache lazy(dir, "c", 1000, false, 0);
+  EXPECT_TRUE(lazy.Update());
+  EXPECT_FALSE(death.HasRun()) << "in the caller";
+}
+
 TEST_F(InterceptedCacheTest, ADocumentThatIsReplacedWhileItIsReadIsReadAgain) {
   const std::string path = Path("c.cached");
   WriteText(path, R"({"cached_data": "old"})");
