@@ -8,7 +8,7 @@
 #   user        as an ordinary user, with a /tmp of its own where this system allows mounts
 #   container   as root with the rights that containers usually give: no mounts, no right to trace others
 # Both leave out the attacks on root, for which root mounts a /tmp of its own, the tests of the package, which write to
-# the build tree, and, to save time, pairs of kills and what valgrind repeats. They end with the names of the tests that
+# the build tree, and, to save time, pairs of kills and what valgrind runs. They end with the names of the tests that
 # were skipped and that were left out, and fail when more than 40 were skipped.
 set -euo pipefail
 source "$(dirname "$0")/common.sh"
