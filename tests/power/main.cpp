@@ -13,6 +13,7 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
 #include <string>
 
 #include "power/disk.h"
@@ -43,11 +44,9 @@ const std::string kUnsynced = std::string(kDiskDir) + "/unsynced";
 constexpr char kText[] = "nobody syncs this";
 
 std::string ReadUnsynced() {
-  char text[sizeof(kText)] = {};
-  FILE* const file = fopen(kUnsynced.c_str(), "r");
-  if (file == nullptr) return "";
-  fread(text, 1, sizeof(kText) - 1, file);
-  fclose(file);
+  std::string text;
+  std::ifstream file(kUnsynced);
+  std::getline(file, text);
   return text;
 }
 
