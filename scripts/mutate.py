@@ -47,6 +47,7 @@ FOLDERS = ["src", "posix", "platform", "include/kelodrcore"]
 # The names of further tests, for files of which no test, or not every one, has the name.
 MORE_NAMES = {
     "access": ["json_value", "json", "document", "document_file"],
+    "cache": ["log_crowd"],
     "descriptor": ["file", "file_lock", "json_value"],
     "directory_walk": ["file_lock", "lock", "cache_process"],
     "document_file": ["json_value", "json", "document", "file", "short_transfer"],

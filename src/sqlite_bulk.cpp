@@ -23,8 +23,8 @@ Names NamesOf(const SqliteValueList& record) {
 
 // The record outlives the statement's use of its texts.
 int Bind(sqlite3_stmt* stmt, int place, const Json::Value& payload) {
-  const char* begin = "";
-  const char* end = begin;
+  const char* begin = nullptr;
+  const char* end = nullptr;
   if (payload.getString(&begin, &end)) {
     return sqlite3_bind_text64(stmt, place, begin, static_cast<sqlite3_uint64>(end - begin),
                                SQLITE_STATIC, SQLITE_UTF8);

@@ -1,10 +1,12 @@
 // A claim whose pid file cannot be removed at once, and a document that is replaced while it is
 // read.
 
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
+#include <csignal>
 #include <filesystem>
 #include <memory>
 #include <vector>
@@ -116,6 +118,25 @@ TEST_F(InterceptedCacheTest, ARefresherThatDiesAtOnceHoldsNobodyUp) {
   const TestCache lazy(dir, "c", 1000, false, 0);
   EXPECT_TRUE(lazy.Update());
   EXPECT_FALSE(death.HasRun()) << "in the caller";
+}
+
+// Such a process has the pipe open, too, through which the refresher tells that it has let go.
+TEST_F(InterceptedCacheTest, AProcessForkedAtTheSameTimeHoldsNobodyUp) {
+  WriteText(Path("c.cached"), R"({"cached_data": "old"})");
+  pid_t other = -1;
+  const Interception meanwhile("fork", 1, [&] {
+    other = fork();
+    if (other == 0) {
+      sleep(10);
+      _exit(0);
+    }
+    return Fault::kGoOn;
+  });
+  EXPECT_TRUE(TestCache(dir, "c", 1000, false, 0).Update());
+  ASSERT_GT(other, 0);
+  EXPECT_EQ(waitpid(other, nullptr, WNOHANG), 0) << "was waited for";
+  kill(other, SIGKILL);
+  EXPECT_EQ(waitpid(other, nullptr, 0), other);
 }
 
 TEST_F(InterceptedCacheTest, ADocumentThatIsReplacedWhileItIsReadIsReadAgain) {

@@ -123,9 +123,9 @@ TEST_F(CacheProcessTest, AStrangersDirectoryInThePlaceOfThePidFileStopsNobody) {
   cache.FetchGives(1);
   EXPECT_TRUE(cache.Update());
   ExpectLog({Starts(), Finishes()});
-  for (const std::string& name : NamesIn(cacheDir)) {
-    if (name != "c.cached") std::filesystem::remove_all(cacheDir + "/" + name);
-  }
+  const std::vector<std::string> names = NamesIn(cacheDir);
+  ASSERT_THAT(names, testing::ElementsAre(testing::StartsWith(".planted-"), "c.cached"));
+  std::filesystem::remove_all(cacheDir + "/" + names.front());
 }
 
 TEST_F(CacheProcessTest, TheClaimIsReleasedEvenWithoutTheLock) {

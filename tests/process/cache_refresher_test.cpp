@@ -57,6 +57,19 @@ TEST_F(CacheProcessTest, ARefresherEndsWith0WhateverTheFetchDoes) {
                                   Starts(), Finishes()}));
 }
 
+// Only its first line is under a time limit.
+TEST_F(CacheProcessTest, ARefresherMayFetchForAnyLength) {
+  WriteCacheFile("\"old\"", kStale);
+  TestCache cache = MakeCache(false);
+  cache.fetch = [](Json::Value& out) {
+    out = alarm(0);
+    return true;
+  };
+  EXPECT_TRUE(cache.Update());
+  EXPECT_EQ(JoinAll(), 1);
+  EXPECT_EQ(cache.Read(), 0);
+}
+
 TEST_F(CacheProcessTest, ARefresherHoldsUpNobodyWhoReadsTheCallersOutput) {
   WriteCacheFile("\"old\"", kStale);
   const Event finish;

@@ -199,6 +199,16 @@ TEST_F(SqliteDBEachTest, WhatTheFunctionThrowsPassesAfterTheStatementIsReleased)
   EXPECT_EQ(records.size(), 3U);
 }
 
+TEST_F(SqliteDBEachTest, TheErrorIsADatabaseErrorUntilTheLastRow) {
+  std::vector<Json::Value> errors;
+  EXPECT_TRUE(db->SelectEach(SelectAll(kTable), [&](const SqliteValueList& /*row*/) {
+    errors.push_back(db->GetErr());
+    return true;
+  }));
+  EXPECT_THAT(errors, testing::Each(Error(404)));
+  EXPECT_EQ(db->GetErr(), Error(0));
+}
+
 TEST_F(SqliteDBEachTest, TheFunctionMayUseTheHandle) {
   const auto take = [&](const SqliteValueList& row) {
     int n = 0;
