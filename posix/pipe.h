@@ -38,8 +38,8 @@ struct Pipe {
 };
 
 // A number that one process reports to another; far below PIPE_BUF, so it goes as a whole.
-inline bool Send(int fd, int number) {
-  return Retry([&] { return write(fd, &number, sizeof number); }) == sizeof number;
+inline void Send(int fd, int number) {
+  Retry([&] { return write(fd, &number, sizeof number); });
 }
 
 inline bool Receive(int fd, int* number) {

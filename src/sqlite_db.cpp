@@ -463,7 +463,6 @@ bool SqliteDB::InsertAll(const BulkInsert& insert, const SqliteTableHandler& tab
   const std::string sql = insert.FirstCommand();
   if (RefuseNul(sql, function)) return false;
   KELODR_LOG(INFO, function, "%s Exec cmd: %s", logLabel.c_str(), sql.c_str());
-  SetErr(ERR::ERR_DATABASE_OPERATION);
   if (!CreateTable(table)) {
     KELODR_LOG(ERR, function, "Failed to create table [%s]", table.tableName.c_str());
     return false;

@@ -85,6 +85,16 @@ TEST_F(LockAttackTest, ADirectoryThatOthersMayWriteIsClosedToThem) {
   });
 }
 
+TEST_F(LockAttackTest, ADirectoryThatOthersCannotWriteKeepsItsMode) {
+  Attack([] {
+    MakeDir(kTop, 0711);
+    ExpectLocks("name");
+    struct stat status = {};
+    ASSERT_EQ(stat(kTop, &status), 0);
+    EXPECT_EQ(status.st_mode & 07777, 0711U);
+  });
+}
+
 TEST_F(LockAttackTest, AStrangersDirectoryBelowIsNotHisToChange) {
   Attack([] {
     AsUser([] {

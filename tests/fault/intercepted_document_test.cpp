@@ -11,6 +11,7 @@
 
 #include "fault/interception.h"
 #include "kelodrcore/json_value.h"
+#include "posix/file_io.h"
 #include "support/clean_test.h"
 
 namespace {
@@ -196,6 +197,20 @@ TEST_F(InterceptedDocumentTest, APlantedLinkMayHaveBecomeTheTemporaryOfAnotherWr
   ASSERT_EQ(symlink("nowhere", temporary.c_str()), 0);
   // Only a leftover is opened for reading alone, and closed again.
   ExpectWrittenAlthoughReplaced();
+}
+
+TEST_F(InterceptedDocumentTest, APlantedLinkMayHaveBecomeTheTemporaryOfALiveWriter) {
+  ASSERT_EQ(symlink("nowhere", temporary.c_str()), 0);
+  KeloDRCore::Posix::Descriptor live;
+  const Interception other("flock", 1, [&] {
+    EXPECT_EQ(unlink(temporary.c_str()), 0);
+    WriteText(temporary, "half");
+    live = KeloDRCore::Posix::Open(temporary, O_RDONLY);
+    EXPECT_EQ(flock(live.Get(), LOCK_EX), 0);
+    return kGoOn;
+  });
+  ExpectNotWritten(EBUSY);
+  EXPECT_EQ(ReadText(temporary), "half");
 }
 
 // Between its creation and its lock, when it looks like a dead writer's.

@@ -48,6 +48,12 @@ TEST_F(InterceptedFileTest, KeyValueTextIsOpenedCloseOnExec) {
   EXPECT_EQ(map["a"], 1);
 }
 
+TEST_F(InterceptedFileTest, AnInterruptedOpenIsMadeAgain) {
+  const Fault::Interception interrupted("fopen", 1, EINTR);
+  EXPECT_TRUE(File::Write(Path("file"), 7));
+  EXPECT_TRUE(interrupted.HasRun());
+}
+
 // Its number is free, and may be another thread's file by now.
 TEST_F(InterceptedFileTest, AnInterruptedCloseIsNotMadeAgain) {
   KeloDRCore::Posix::Descriptor file(open(dir.c_str(), O_RDONLY | O_CLOEXEC));

@@ -75,10 +75,26 @@ TEST_F(InterceptedLockTest, AnOrdinaryUserLosesNoFileOfHisOwn) {
               const uid_t user = geteuid() == 0 ? kStranger : geteuid();
               ASSERT_EQ(setresuid(user, user, user), 0);
               WriteText(step, "his own");
-              EXPECT_FALSE(OpenStepwise(dir, step, MakeNothing).IsOpen());
+              std::vector<std::string> made;
+              const auto note = [&](const std::string& path) {
+                made.push_back(path);
+                return false;
+              };
+              EXPECT_FALSE(OpenStepwise(dir, step + "/lower", note).IsOpen());
+              EXPECT_EQ(made, std::vector<std::string>{step});
               EXPECT_EQ(ReadText(step), "his own");
             }),
             0);
+}
+
+TEST_F(InterceptedLockTest, AStepThatNeverComesIntoBeingIsGivenUpAfterTenAttempts) {
+  int attempts = 0;
+  const auto claimToMake = [&](const std::string& /*path*/) {
+    ++attempts;
+    return true;
+  };
+  EXPECT_FALSE(OpenStepwise("/proc", "/proc/step", claimToMake).IsOpen());
+  EXPECT_EQ(attempts, 10);
 }
 
 }  // namespace

@@ -63,6 +63,15 @@ TEST_F(InterceptedProgramTest, RunsWhereThePipeIsInPlaceAlready) {
   });
 }
 
+TEST_F(InterceptedProgramTest, TellsWhyAStreamCannotBePutInPlace) {
+  for (const char* const call : {"dup2", "dup3"}) {
+    const Interception failure(call, 1, EBADF);
+    errno = 0;
+    EXPECT_EQ(Exec("/bin/true"), -1);
+    EXPECT_EQ(errno, EBADF) << call;
+  }
+}
+
 // A program that another thread starts just then inherits nothing.
 TEST_F(InterceptedProgramTest, ClosesAllThatIsOpenedOnExec) {
   const std::set<int> before = OpenDescriptors();
@@ -83,6 +92,24 @@ TEST_F(InterceptedProgramTest, ClosesAllThatIsOpenedOnExec) {
 }
 
 constexpr int kAborted = 3;
+
+using InterceptedForkTest = CleanTest;
+
+// The process in between, which is killed before it tells anything.
+TEST_F(InterceptedForkTest, FailsWhereNobodyTellsOfADetachedChild) {
+  const Interception death("fork", 2, []() -> int { _exit(0); });
+  errno = 0;
+  EXPECT_EQ(KLIBCProcForkEx(1), -1);
+  EXPECT_EQ(errno, ECHILD);
+}
+
+TEST_F(InterceptedForkTest, OpensNothingForAChildThatKeepsItsStreams) {
+  const Interception noDescriptor("openat", 1, EMFILE);
+  const pid_t pid = KLIBCProcForkEx(0);
+  if (pid == 0) _exit(0);
+  EXPECT_EQ(waitpid(pid, nullptr, 0), pid);
+  EXPECT_FALSE(noDescriptor.HasRun());
+}
 
 using InterceptedRandomTest = CleanTest;
 

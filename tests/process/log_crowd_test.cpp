@@ -56,13 +56,24 @@ class LogCrowdTest : public testing::Test {
     if (!CanLock()) GTEST_SKIP() << "the lock directory is another user's";
     ASSERT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 1), 0);
     openlog("kelodrcore-test", 0, LOG_LOCAL7);
+    SetAlarms(SIG_BLOCK, SIG_IGN);
   }
   void TearDown() override {
+    SetAlarms(SIG_UNBLOCK, SIG_DFL);
     closelog();
     prctl(PR_SET_CHILD_SUBREAPER, 0);
     std::error_code error;
     std::filesystem::remove_all("/tmp/.kelodr_lock" + dir, error);
     std::filesystem::remove_all(dir, error);
+  }
+
+  // What a caller may do with a signal that its refreshers depend on.
+  static void SetAlarms(int how, sighandler_t handler) {
+    sigset_t alarms;
+    sigemptyset(&alarms);
+    sigaddset(&alarms, SIGALRM);
+    pthread_sigmask(how, &alarms, nullptr);
+    signal(SIGALRM, handler);
   }
 
   TestCache MakeCache(int number, bool alwaysRequired) const {

@@ -41,7 +41,11 @@ TEST_F(StrTrimTest, TakesWhiteSpaceOffBothEndsByDefault) {
 
 TEST_F(StrTrimTest, LeavesOtherTextAlone) {
   EXPECT_EQ(Trimmed("a \n b", nullptr), "a \n b");
-  EXPECT_EQ(Trimmed("\xa0x\x01", nullptr), "\xa0x\x01");
+  for (int byte = 1; byte < 256; ++byte) {
+    const std::string text(3, static_cast<char>(byte));
+    const bool isWhite = byte == ' ' || (byte >= '\t' && byte <= '\r');
+    EXPECT_EQ(Trimmed(text, nullptr), isWhite ? "" : text) << byte;
+  }
   EXPECT_EQ(Trimmed("", nullptr), "");
 }
 
@@ -117,7 +121,7 @@ class PidFileTest : public CleanTest {
     EXPECT_EQ(RunInChild([&] {
                 signal(SIGXFSZ, SIG_IGN);
                 LowerLimit(RLIMIT_FSIZE, bytes);
-                EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
+                EXPECT_EQ(KLIBCProcPidFileCreate(path.c_str()), -1);
                 EXPECT_EQ(errno, EFBIG);
               }),
               0);
@@ -178,6 +182,11 @@ TEST_F(PidFileTest, ReadsZeroForAReusedPid) {
   const std::string pid = std::to_string(getpid());
   const std::string other = std::to_string(std::stoull(StartTime(getpid())) + 1);
   EXPECT_EQ(ReadOf(pid + "\n" + other + "\n"), 0);
+}
+
+TEST_F(PidFileTest, ReadsAFileOfLessThan128Bytes) {
+  EXPECT_EQ(ReadOf("1234" + std::string(123, ' ')), 1234);
+  EXPECT_EQ(ReadOf("1234" + std::string(124, ' ')), 0);
 }
 
 TEST_F(PidFileTest, ReadsZeroForASecondLineThatIsNoStartTime) {
@@ -266,13 +275,13 @@ TEST_F(PidFileTest, DoesNotWriteThroughALinkPlantedAgainAndAgain) {
 }
 
 TEST_F(PidFileTest, FailsWithErrnoInAMissingDirectory) {
-  EXPECT_NE(KLIBCProcPidFileCreate(Path("no/pid").c_str()), 0);
+  EXPECT_EQ(KLIBCProcPidFileCreate(Path("no/pid").c_str()), -1);
   EXPECT_EQ(errno, ENOENT);
 }
 
 TEST_F(PidFileTest, FailsWithErrnoOverADirectory) {
   ASSERT_EQ(mkdir(path.c_str(), 0755), 0);
-  EXPECT_NE(KLIBCProcPidFileCreate(path.c_str()), 0);
+  EXPECT_EQ(KLIBCProcPidFileCreate(path.c_str()), -1);
   EXPECT_EQ(errno, EISDIR);
   EXPECT_EQ(KLIBCFileCheckDir(path.c_str()), 1);
 }
@@ -350,7 +359,7 @@ TEST_F(ProcAliveTest, IsOneWhereTheProcessCannotBeLookedAt) {
         ASSERT_EQ(chroot(dir.c_str()), 0);
         EXPECT_EQ(KLIBCProcAlive(getppid()), 1);
         EXPECT_EQ(KLIBCReadPidFile("/pid"), getppid());
-        EXPECT_NE(KLIBCProcPidFileCreate("/mine"), 0);
+        EXPECT_EQ(KLIBCProcPidFileCreate("/mine"), -1);
       })) {
     GTEST_SKIP() << "needs root, or a user namespace";
   }
@@ -379,7 +388,7 @@ TEST_F(ProcStatTest, AnotherFormTellsNothing) {
           WriteText(Path("pid"), std::to_string(getpid()) + "\n1\n");
           EXPECT_EQ(KLIBCReadPidFile(Path("pid").c_str()), getpid());
           errno = 0;
-          EXPECT_NE(KLIBCProcPidFileCreate(Path("mine").c_str()), 0);
+          EXPECT_EQ(KLIBCProcPidFileCreate(Path("mine").c_str()), -1);
           EXPECT_EQ(errno, ENOENT);
         })) {
       GTEST_SKIP() << kNoMount;

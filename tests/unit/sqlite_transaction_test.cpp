@@ -109,6 +109,18 @@ TEST_F(SqliteTransactionTest, NothingHappensAfterTheEnd) {
   EXPECT_THAT(Kept(), ElementsAre("n:1"));
 }
 
+TEST_F(SqliteTransactionTest, ARolledBackOneLeavesTheNextOneAlone) {
+  {
+    SqliteTransaction transaction(*db);
+    transaction.Rollback();
+    ASSERT_TRUE(db->Exec("BEGIN"));
+    Insert(1);
+    EXPECT_FALSE(transaction.IsOpen());
+  }
+  ASSERT_TRUE(db->Exec("COMMIT"));
+  EXPECT_THAT(Kept(), ElementsAre("n:1"));
+}
+
 TEST_F(SqliteTransactionTest, OthersReadButDoNotWriteMeanwhile) {
   SqliteTransaction transaction(*db);
   EXPECT_THAT(Kept(), IsEmpty());
