@@ -128,6 +128,17 @@ TEST_F(InterceptedDocumentTest, LinksThatBecomeALoopAreRefused) {
   EXPECT_EQ(ReadText(Path("file")), "\"old\"");
 }
 
+TEST_F(InterceptedDocumentTest, ALinkThatCannotBeReadIsNotReplaced) {
+  ASSERT_EQ(symlink("target", path.c_str()), 0);
+  {
+    const Interception failure("readlinkat", 1, EIO);
+    ExpectNotWritten(EIO);
+  }
+  EXPECT_EQ(NamesIn(dir), Names{"document"});
+  EXPECT_TRUE(toFile("new", path));
+  EXPECT_EQ(ReadText(Path("target")), "\"new\"");
+}
+
 TEST_F(InterceptedDocumentTest, ADirectoryThatComesIntoBeingIsNotReplaced) {
   const std::string made = path;
   path += "/";

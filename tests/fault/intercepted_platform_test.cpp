@@ -91,7 +91,15 @@ TEST_F(InterceptedProgramTest, ClosesAllThatIsOpenedOnExec) {
   EXPECT_EQ(opened, 4) << "the pid file, /dev/null and a pipe";
 }
 
-constexpr int kAborted = 3;
+using InterceptedPidFileTest = CleanTest;
+
+TEST_F(InterceptedPidFileTest, LeavesNothingWhereItCannotBeWritten) {
+  const Interception failure("fchmod", 1, EIO);
+  errno = 0;
+  EXPECT_EQ(KLIBCProcPidFileCreate(Path("pid").c_str()), -1);
+  EXPECT_EQ(errno, EIO);
+  EXPECT_TRUE(NamesIn(dir).empty());
+}
 
 using InterceptedForkTest = CleanTest;
 
@@ -103,6 +111,13 @@ TEST_F(InterceptedForkTest, FailsWhereNobodyTellsOfADetachedChild) {
   EXPECT_EQ(errno, ECHILD);
 }
 
+TEST_F(InterceptedForkTest, FailsWithoutAPipe) {
+  const Interception noDescriptor("pipe2", 1, EMFILE);
+  errno = 0;
+  EXPECT_EQ(KLIBCProcForkEx(1), -1);
+  EXPECT_EQ(errno, EMFILE);
+}
+
 TEST_F(InterceptedForkTest, OpensNothingForAChildThatKeepsItsStreams) {
   const Interception noDescriptor("openat", 1, EMFILE);
   const pid_t pid = KLIBCProcForkEx(0);
@@ -110,6 +125,8 @@ TEST_F(InterceptedForkTest, OpensNothingForAChildThatKeepsItsStreams) {
   EXPECT_EQ(waitpid(pid, nullptr, 0), pid);
   EXPECT_FALSE(noDescriptor.HasRun());
 }
+
+constexpr int kAborted = 3;
 
 using InterceptedRandomTest = CleanTest;
 

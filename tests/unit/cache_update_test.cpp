@@ -323,6 +323,7 @@ TEST_F(CachePrivilegeTest, FilesAreWrittenAndRemovedAsRootWhateverTheEffectiveId
   EXPECT_EQ(
       RunInChild([this] {
         TestCache cache = MakeCache();
+        WriteText(pidFile, std::to_string(getpid()));  // left over, and removed first
         ASSERT_EQ(setegid(kNobody), 0);
         ASSERT_EQ(seteuid(kNobody), 0);
         cache.fetch = [this](Json::Value& out) {
@@ -346,8 +347,8 @@ TEST_F(CachePrivilegeTest, FilesAreWrittenAndRemovedAsRootWhateverTheEffectiveId
                     lines.end());
         const LogLine gid = Auth(LOG_AUTH | LOG_DEBUG, "cache.cpp WARNING: setresgid(-1, 0, -1)");
         const LogLine uid = Auth(LOG_AUTH | LOG_DEBUG, "cache.cpp WARNING: setresuid(-1, 0, -1)");
-        EXPECT_EQ(lines, (std::vector<LogLine>{gid, uid, uid, Starts(), gid, uid, uid, gid, uid,
-                                               uid, Finishes()}));
+        EXPECT_EQ(lines, (std::vector<LogLine>{gid, uid, uid, gid, uid, uid, Starts(), gid, uid,
+                                               uid, gid, uid, uid, Finishes()}));
       }),
       0);
 }

@@ -261,8 +261,9 @@ TEST_F(JsonValueTest, RefusesAnythingBehindTheDocument) {
   ExpectRefused(std::string("[\"a\0\"]", 6));
   ExpectRefused(std::string("[/*\0*/]", 7));
   for (int byte = 1; byte < 256; ++byte) {
-    if (strchr(" \t\r\n", byte) == nullptr)
-      ExpectRefused("{} " + std::string(1, static_cast<char>(byte)));
+    const std::string text(1, static_cast<char>(byte));
+    if (strchr(" \t\r\n", byte) == nullptr) ExpectRefused("{} " + text);
+    if (strchr("\r\n", byte) == nullptr) Parsed("{} //" + text + "x");
   }
   EXPECT_EQ(Parsed("{} \n // end\n /* end */ \t"), Json::Value(Json::objectValue));
 }
@@ -348,6 +349,7 @@ void ExpectPlainNumbers() {
   EXPECT_EQ(Parsed("-1.25E+2"), Json::Value(-125.0));
   EXPECT_EQ(Parsed("[1.e2,1.,-0.5e-1]"), Parsed("[1e2,1e0,-5e-2]"));
   EXPECT_EQ(Parsed("[\"1.5\\\"\", /* \"1.5 */ 1.5]")[0], Json::Value("1.5\""));
+  EXPECT_EQ(Parsed("[\"a\"//\"\n,1.5]")[1], Json::Value(1.5));
   for (const char* refused : {"1,5", "1.5e", "1.5e+", "-.", ".5", "1.5.5", "1.5-"}) {
     ExpectRefused(refused);
   }
