@@ -112,6 +112,15 @@ TEST_F(JsonFaultTest, FromFileGivesTheWholeDocumentOrLeavesTheValue) {
   SweepTransfers({prepare, run, check});
 }
 
+// JsonCpp reads numbers with a fraction from a stream, which takes such a failure for a wrong text.
+TEST_F(JsonFaultTest, ATextWithoutFractionsIsNotRefusedForWantOfMemory) {
+  Json::Value value;
+  const auto prepare = [] {};
+  const auto run = [&] { return JsonValue::fromString(value, R"({"name": ["text", 1]})"); };
+  const auto check = [](const Outcome& outcome) { EXPECT_NE(outcome.succeeded, outcome.threw); };
+  SweepMemory({prepare, run, check});
+}
+
 TEST_F(JsonFaultTest, ToFileMakesANewFileWholeOrNotAtAll) {
   SweepCalls(ToFile(""));
   SweepMemory(ToFile(""));

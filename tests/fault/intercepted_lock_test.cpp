@@ -45,6 +45,13 @@ TEST_F(InterceptedLockTest, ADirectoryThatItsOwnerMovesAwayIsNotTaken) {
   EXPECT_TRUE(KeloDRCore::Posix::IsSameFile(found, named));
 }
 
+TEST_F(InterceptedLockTest, ADirectoryThatCannotBeLookedAtIsNotTaken) {
+  ASSERT_EQ(mkdir(Path("step").c_str(), 0755), 0);
+  const Fault::Interception failure("fstat", 1, EIO);
+  EXPECT_FALSE(OpenStepwise(dir, Path("step"), MakeNothing).IsOpen());
+  EXPECT_TRUE(failure.HasRun());
+}
+
 TEST_F(InterceptedLockTest, AStepThatCannotBeMadeIsLeftToTheCaller) {
   const Fault::Interception refusal("mkdirat", 1, EACCES);
   std::vector<std::string> made;
