@@ -50,7 +50,7 @@ MORE_NAMES = {
     "cache": ["log_crowd"],
     "descriptor": ["file", "file_lock", "json_value"],
     "directory_walk": ["file_lock", "lock", "cache_process"],
-    "document_file": ["json_value", "json", "document", "file", "short_transfer"],
+    "document_file": ["json_value", "json", "document", "cache_update", "file", "short_transfer"],
     "file": ["key_value", "short_transfer"],
     "file_io": ["file", "json_value", "platform", "document", "cache_process"],
     "file_lock": ["lock", "cache_process", "cache_refresher"],
@@ -73,7 +73,7 @@ MORE_NAMES = {
     "sqlite_value": ["sqlite_db_row"],
     "trust": ["json_value", "cache", "document"],
     "validator": ["utils"],
-    "value_access": ["sqlite_value"],
+    "value_access": ["sqlite_value", "sqlite_db_row"],
 }
 # Sweeps of kills take minutes; the other tests of those programs do not.
 KILL_FILTER = "--gtest_filter=-*Killed*"

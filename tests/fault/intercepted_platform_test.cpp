@@ -67,9 +67,32 @@ TEST_F(InterceptedProgramTest, TellsWhyAStreamCannotBePutInPlace) {
   for (const char* const call : {"dup2", "dup3"}) {
     const Interception failure(call, 1, EBADF);
     errno = 0;
-    EXPECT_EQ(Exec("/bin/true"), -1);
+    EXPECT_EQ(KLIBCExec("/bin/touch", Path("run").c_str(), nullptr, nullptr, nullptr), -1);
     EXPECT_EQ(errno, EBADF) << call;
+    EXPECT_TRUE(NamesIn(dir).empty()) << "the program was run";
   }
+}
+
+// No handler of the caller's runs in the process that starts the program.
+TEST_F(InterceptedProgramTest, BlocksEverySignalMeanwhile) {
+  const Interception look("dup2", 1, [] {
+    sigset_t mask;
+    sigemptyset(&mask);
+    pthread_sigmask(SIG_BLOCK, nullptr, &mask);
+    for (const int number : {SIGHUP, SIGTERM, SIGUSR1, SIGCHLD, SIGRTMAX}) {
+      if (sigismember(&mask, number) != 1) return EINVAL;
+    }
+    return Fault::kGoOn;
+  });
+  EXPECT_EQ(Exec("/bin/true"), 0);
+}
+
+// The process that starts the program is killed before it tells anything.
+TEST_F(InterceptedProgramTest, FailsWhereNobodyTellsOfTheStart) {
+  const Interception death("dup2", 1, []() -> int { _exit(0); });
+  errno = 0;
+  EXPECT_EQ(Exec("/bin/true"), -1);
+  EXPECT_EQ(errno, ECHILD);
 }
 
 // A program that another thread starts just then inherits nothing.
@@ -111,15 +134,18 @@ TEST_F(InterceptedForkTest, FailsWhereNobodyTellsOfADetachedChild) {
   EXPECT_EQ(errno, ECHILD);
 }
 
-TEST_F(InterceptedForkTest, FailsWithoutAPipe) {
-  const Interception noDescriptor("pipe2", 1, EMFILE);
-  errno = 0;
-  EXPECT_EQ(KLIBCProcForkEx(1), -1);
-  EXPECT_EQ(errno, EMFILE);
+TEST_F(InterceptedForkTest, FailsWithoutDescriptors) {
+  const Interception noPipe("pipe2", 1, EMFILE);
+  const Interception noStream("open", 1, EMFILE);
+  for (const int flags : {1, 64}) {
+    errno = 0;
+    EXPECT_EQ(KLIBCProcForkEx(flags), -1) << flags;
+    EXPECT_EQ(errno, EMFILE);
+  }
 }
 
 TEST_F(InterceptedForkTest, OpensNothingForAChildThatKeepsItsStreams) {
-  const Interception noDescriptor("openat", 1, EMFILE);
+  const Interception noDescriptor("open", 1, EMFILE);
   const pid_t pid = KLIBCProcForkEx(0);
   if (pid == 0) _exit(0);
   EXPECT_EQ(waitpid(pid, nullptr, 0), pid);

@@ -309,8 +309,8 @@ TEST_F(CacheProcessTest, AFetchReadsTheOldDataOfItsOwnCache) {
 
 // One has another name, the other stands in another directory.
 TEST_F(CacheProcessTest, AFetchUpdatesAnotherCache) {
-  for (TestCache other : {TestCache(cacheDir, "other", 1000, true, 0),
-                          TestCache(Path("other"), "c", 1000, true, 0)}) {
+  for (TestCache other :
+       {TestCache(cacheDir, "d", 1000, true, 0), TestCache(Path("other"), "c", 1000, true, 0)}) {
     other.FetchGives("other");
     TestCache cache = MakeCache();
     cache.fetch = [&](Json::Value& out) {

@@ -429,6 +429,23 @@ TEST_F(PopenTest, EndsWithTheProgramsOutputNotWithTheProgram) {
   EXPECT_EQ(KLIBCPclose(stream), 0);
 }
 
+TEST_F(PopenTest, NobodyElseKeepsTheProgramsInputOpen) {
+  EXPECT_EQ(RunInChild([this] {
+              Handle(SIGPIPE, SIG_IGN, 0);
+              const std::string fifo = Path("fifo");
+              ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+              FILE* stream = KLIBCPopen("/bin/sh", "w", "-c", "exec <&-; read y < \"$0\"",
+                                        fifo.c_str(), nullptr);
+              ASSERT_NE(stream, nullptr);
+              while (fputc('x', stream) != EOF && fflush(stream) == 0) {
+              }
+              EXPECT_EQ(errno, EPIPE);
+              WriteText(fifo, "go\n");
+              EXPECT_EQ(KLIBCPclose(stream), 0);
+            }),
+            0);
+}
+
 TEST_F(PopenTest, EndsAProgramWhoseOutputNobodyReads) {
   EXPECT_EQ(RunInChild([] {
               Handle(SIGPIPE, SIG_IGN, 0);

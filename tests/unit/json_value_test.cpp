@@ -251,8 +251,8 @@ TEST_F(JsonValueTest, IsAsLenientAsJsonCppInsideTheDocument) {
 
 TEST_F(JsonValueTest, RefusesAnythingBehindTheDocument) {
   for (const char* text :
-       {"{} x", "{}{}", "[1]]", "1 2", "{},", "{} /", "{} /* x", "{} /* x /", "{} /*/", "\"a\"b",
-        "{}@", "{}\v", "{} \xEF\xBB\xBF", "1.5.", "{} // x\n@"}) {
+       {"{} x", "{}{}", "[1]]", "1 2", "{},", "{} /", "{} /* x", "{} /* x /", "{} /*/", "{} /**/x",
+        "\"a\"b", "{}@", "{}\v", "{} \xEF\xBB\xBF", "1.5.", "{} // x\n@"}) {
     ExpectRefused(text);
   }
   ExpectRefused(std::string("{}\0", 3));
@@ -349,6 +349,7 @@ void ExpectPlainNumbers() {
   EXPECT_EQ(Parsed("-1.25E+2"), Json::Value(-125.0));
   EXPECT_EQ(Parsed("[1.e2,1.,-0.5e-1]"), Parsed("[1e2,1e0,-5e-2]"));
   EXPECT_EQ(Parsed("[\"1.5\\\"\", /* \"1.5 */ 1.5]")[0], Json::Value("1.5\""));
+  EXPECT_EQ(Parsed("/**/1.5"), Json::Value(1.5));
   EXPECT_EQ(Parsed("[\"a\"//\"\n,1.5]")[1], Json::Value(1.5));
   for (const char* refused : {"1,5", "1.5e", "1.5e+", "-.", ".5", "1.5.5", "1.5-"}) {
     ExpectRefused(refused);
