@@ -1,6 +1,7 @@
 // A claim whose pid file cannot be removed at once, and a document that is replaced while it is
 // read.
 
+#include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -127,8 +128,8 @@ TEST_F(InterceptedCacheTest, AProcessForkedAtTheSameTimeHoldsNobodyUp) {
   const Interception meanwhile("fork", 1, [&] {
     other = fork();
     if (other == 0) {
-      sleep(10);
-      _exit(0);
+      prctl(PR_SET_PDEATHSIG, SIGKILL);
+      pause();
     }
     return Fault::kGoOn;
   });
