@@ -73,6 +73,17 @@ TEST_F(InterceptedProgramTest, TellsWhyAStreamCannotBePutInPlace) {
   }
 }
 
+TEST_F(InterceptedProgramTest, FailsWithoutAProcess) {
+  const Interception exec("fork", 1, EAGAIN);
+  errno = 0;
+  EXPECT_EQ(Exec("/bin/true"), -1);
+  EXPECT_EQ(errno, EAGAIN);
+  const Interception popen("fork", 1, EAGAIN);
+  errno = 0;
+  EXPECT_EQ(KLIBCPopen("/bin/true", "r", nullptr), nullptr);
+  EXPECT_EQ(errno, EAGAIN);
+}
+
 // No handler of the caller's runs in the process that starts the program.
 TEST_F(InterceptedProgramTest, BlocksEverySignalMeanwhile) {
   const Interception look("dup2", 1, [] {
