@@ -16,7 +16,7 @@ std::vector<unsigned int> draws;  // the next one comes last
 
 }  // namespace
 
-extern "C" ssize_t getrandom(void* buffer, size_t size, unsigned int /*flags*/) noexcept {
+extern "C" ssize_t getrandom(void* buffer, size_t size, unsigned int /*flags*/) {
   EXPECT_EQ(size, sizeof draws.back());
   memcpy(buffer, &draws.back(), sizeof draws.back());
   draws.pop_back();
