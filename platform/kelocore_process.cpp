@@ -12,6 +12,7 @@
 #include <cstring>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <utility>
 #include <vector>
 
@@ -139,8 +140,8 @@ bool Start(const char* program, char* const argv[], const Streams& streams, Prog
   }
   if (started->supervisor < 0) return false;
   report.writeEnd.Close();
-  int error = ECHILD;  // the supervisor was killed
-  if (Posix::Receive(report.readEnd.Get(), &error) && error == 0) {
+  const int error = Posix::Receive(report.readEnd.Get()).value_or(ECHILD);
+  if (error == 0) {
     started->report = std::move(report.readEnd);
     return true;
   }
@@ -151,10 +152,10 @@ bool Start(const char* program, char* const argv[], const Streams& streams, Prog
 
 // The wait status, or -1 with errno when nobody can tell it any more.
 int Finish(const Program& program) {
-  int status = -1;
-  if (!Posix::Receive(program.report.Get(), &status)) errno = ECHILD;
+  const std::optional<int> status = Posix::Receive(program.report.Get());
+  if (!status) errno = ECHILD;
   Reap(program.supervisor);
-  return status;
+  return status.value_or(-1);
 }
 
 // The open streams of KLIBCPopen.
@@ -219,8 +220,7 @@ pid_t ForkDetached() {
     _exit(0);
   }
   report.writeEnd.Close();
-  int result = -ECHILD;
-  Posix::Receive(report.readEnd.Get(), &result);
+  const int result = Posix::Receive(report.readEnd.Get()).value_or(-ECHILD);
   Reap(between);
   if (result > 0) return result;
   errno = -result;

@@ -6,6 +6,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <optional>
 #include <utility>
 
 #include "posix/descriptor.h"
@@ -42,8 +43,11 @@ inline void Send(int fd, int number) {
   Retry([&] { return write(fd, &number, sizeof number); });
 }
 
-inline bool Receive(int fd, int* number) {
-  return Retry([&] { return read(fd, number, sizeof *number); }) == sizeof *number;
+// Nothing when all who could send it are gone.
+inline std::optional<int> Receive(int fd) {
+  int number = 0;
+  const ssize_t size = Retry([&] { return read(fd, &number, sizeof number); });
+  return size == sizeof number ? std::optional(number) : std::nullopt;
 }
 
 }  // namespace KeloDRCore::Posix

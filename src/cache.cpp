@@ -250,9 +250,7 @@ void ShowThatLogWorks() {
   pthread_sigmask(SIG_UNBLOCK, &signals, &mask);
   alarm(kSeconds);
   setlogmask(setlogmask(0));
-  const time_t now = 0;
-  struct tm local = {};
-  localtime_r(&now, &local);
+  tzset();
   alarm(0);
   pthread_sigmask(SIG_SETMASK, &mask, nullptr);
   sigaction(SIGALRM, &handler, nullptr);

@@ -116,8 +116,7 @@ int ForkWithoutLocks(int flags) {
   if (pid > 0) {
     // Until the child has let go: a lock that the caller closes next is free at once.
     told.writeEnd.Close();
-    int done = 0;
-    Posix::Receive(told.readEnd.Get(), &done);
+    Posix::Receive(told.readEnd.Get());
   }
   if (pid != 0) return pid;
   for (const int fd : openFiles) {

@@ -12,6 +12,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstdarg>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -132,10 +133,13 @@ TEST_F(LogCrowdTest, NoRefresherHangsOrLeavesAClaimBehind) {
   for (int i = 0; i < kCaches; ++i) ASSERT_TRUE(MakeCache(i, false).UpdateWithData("old"));
   std::atomic<bool> done{false};
   std::vector<std::thread> threads;
-  threads.reserve(kThreads);
+  threads.reserve(kThreads + 1);
   for (int i = 0; i < kThreads; ++i) {
     threads.emplace_back([this, i, &done] { LogAndInsert(i, done); });
   }
+  threads.emplace_back([&done] {
+    while (!done) tzset();  // whose lock a line takes as well
+  });
   for (int i = 0; i < kRefreshes; ++i) {
     const TestCache cache = MakeCache(i % kCaches, false);
     EXPECT_TRUE(cache.Update());
