@@ -43,8 +43,8 @@ class Acl {
 };
 
 // The owner may do all, one user may read, the group and others nothing.
-std::string AclForOneReader() {
-  return Acl().Entry(1, 6).Entry(2, 4, kOther).Entry(4, 0).Entry(16, 4).Entry(32, 0).Text();
+std::string AclForOneReader(uid_t reader = kOther) {
+  return Acl().Entry(1, 6).Entry(2, 4, reader).Entry(4, 0).Entry(16, 4).Entry(32, 0).Text();
 }
 
 // "" for none.
@@ -160,9 +160,12 @@ TEST_F(JsonValueAccessTest, ALockOfTheDirectoryDelaysTheRemovalButDoesNotStopIt)
 TEST_F(JsonValueAccessTest, AnAclStays) {
   if (!SetAttribute(Path("a"), kAcl, AclForOneReader())) GTEST_SKIP() << "no ACLs here";
   const mode_t mode = ModeOf(Path("a"));
-  ExpectWritten();
-  EXPECT_EQ(AttributeOf(Path("a"), kAcl), AclForOneReader());
-  EXPECT_EQ(ModeOf(Path("a")), mode);
+  for (const uid_t inDirectory : {kOther, kOther + 1}) {
+    ASSERT_TRUE(SetAttribute(dir, kDefaultAcl, AclForOneReader(inDirectory)));
+    ExpectWritten();
+    EXPECT_EQ(AttributeOf(Path("a"), kAcl), AclForOneReader());
+    EXPECT_EQ(ModeOf(Path("a")), mode);
+  }
 }
 
 TEST_F(JsonValueAccessTest, AnAclOfTheDirectoryOpensNothingThatWasClosed) {
