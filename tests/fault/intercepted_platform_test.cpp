@@ -145,6 +145,15 @@ TEST_F(InterceptedForkTest, FailsWhereNobodyTellsOfADetachedChild) {
   EXPECT_EQ(errno, ECHILD);
 }
 
+TEST_F(InterceptedForkTest, FailsWithoutAProcess) {
+  for (const int flags : {0, 1, 64, 65}) {
+    const Interception noProcess("fork", 1, EAGAIN);
+    errno = 0;
+    EXPECT_EQ(KLIBCProcForkEx(flags), -1) << flags;
+    EXPECT_EQ(errno, EAGAIN);
+  }
+}
+
 TEST_F(InterceptedForkTest, FailsWithoutDescriptors) {
   const Interception noPipe("pipe2", 1, EMFILE);
   const Interception noStream("open", 1, EMFILE);
