@@ -59,8 +59,9 @@ long long VolumeCache::FileTime() const {
 Json::Value VolumeCache::ReadVolumes(Source& source) {
   isScanned = false;
   Json::Value volumes = Read();
-  // Whoever loses the race for the claim is given what there was; the winner's data come.
-  if (!isScanned && IsTimeout()) volumes = Read();
+  // Whoever loses the race for the claim is given what there was; the winner's data come, or have
+  // come since.
+  if (!isScanned && (IsTimeout() || !IsValidData(volumes))) volumes = Read();
   // A user who cannot take locks has no cache, but can still see the mounts.
   if (!IsValidData(volumes)) volumes = Scan();
   const long long fileTime = FileTime();
