@@ -30,14 +30,19 @@ fi
 mkdir -p "$system/the tree" "$system/the builds"
 cp /etc/resolv.conf "$system/etc/"
 
-# The mounts and the processes are gone when the script ends.
+# The mounts and the processes are gone when the script ends. The system becomes the root file system: below a mere
+# chroot the kernel refuses the namespaces that tests make.
 export system
 # shellcheck disable=SC2016  # expanded by the inner shell
 unshare --mount --pid --fork --kill-child bash -euc '
+  mount --bind "$system" "$system"
   mount --bind "$PWD" "$system/the tree"
   mount -o remount,bind,ro "$system/the tree"
   mount --rbind /dev "$system/dev"
   mount -t proc proc "$system/proc"
   mount -t tmpfs tmpfs "$system/tmp"
-  exec chroot "$system" env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root LC_ALL=C.UTF-8 \
+  cd "$system"
+  pivot_root . mnt
+  umount --lazy /mnt
+  exec env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root LC_ALL=C.UTF-8 \
     KELODR_BUILD_DIR="/the builds" "/the tree/$0" "$@"' "${command[@]}" </dev/null
