@@ -22,7 +22,7 @@ source "$(dirname "$0")/common.sh"
 packages_of() {
   case $1 in
     build) echo g++ cmake ninja-build libsqlite3-dev libjsoncpp-dev uuid-runtime ;;
-    test) echo libgtest-dev libgmock-dev locales pkgconf valgrind lighttpd curl python3 ;;
+    test) echo libgtest-dev libgmock-dev e2fsprogs locales pkgconf valgrind lighttpd curl python3 ;;
     examples) echo libcli11-dev ;;
     format) echo clang-format ;;
     package) echo abigail-tools dpkg-dev file lintian man-db ;;
